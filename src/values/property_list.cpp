@@ -1,0 +1,309 @@
+// Property-list documents to and from value trees: libplist between the check and the conversion.
+#include "values/property_list.h"
+
+#include <plist/plist.h>
+
+#include <algorithm>
+#include <bit>
+#include <cmath>
+#include <cstdint>
+#include <cstdlib>
+#include <limits>
+#include <memory>
+#include <optional>
+#include <utility>
+
+#include "values/byte_reader.h"
+#include "values/property_list_check.h"
+#include "values/property_list_scalars.h"
+#include "values/text.h"
+
+namespace quorlet {
+namespace {
+
+constexpr std::string_view kBinaryMagic = "bplist00";
+constexpr std::string_view kReplacement = "\xEF\xBF\xBD";  // U+FFFD
+// Property-list dates count from 2001-01-01T00:00:00Z.
+constexpr double kEpoch2001 = 978307200;
+constexpr double kFirstWrittenSecond = -62135596800;  // 0001-01-01T00:00:00Z
+constexpr double kLastWrittenSecond = 253402300799;   // 9999-12-31T23:59:59Z
+
+struct NodeFree {
+  void operator()(void* node) const { plist_free(node); }
+};
+using Node = std::unique_ptr<void, NodeFree>;
+
+struct MemoryFree {
+  void operator()(void* memory) const { std::free(memory); }
+};
+template <typename T>
+using Allocated = std::unique_ptr<T, MemoryFree>;
+
+Node ParseXml(std::string_view document) {
+  plist_t node = nullptr;
+  plist_from_xml(document.data(), static_cast<std::uint32_t>(document.size()), &node);
+  return Node(node);
+}
+
+// A node of a kind that libplist makes only by parsing.
+Node ParseScalar(std::string_view element, const std::string& text) {
+  const std::string name(element);
+  return ParseXml("<plist><" + name + ">" + text + "</" + name + "></plist>");
+}
+
+// --- Reading: the depth was checked before the nodes were made ----------------------------------
+
+PropertyValue IntegerFromNode(plist_t node) {
+  std::uint64_t bits = 0;
+  plist_get_uint_val(node, &bits);
+  if (std::in_range<std::int64_t>(bits)) return Int64(static_cast<std::int64_t>(bits));
+  // -1 and 2^64 - 1 look the same so far; only the signed one equals a node made from the bits.
+  const Node signedNode(plist_new_uint(bits));
+  if (plist_compare_node_value(node, signedNode.get()) != 0) {
+    return Int64(static_cast<std::int64_t>(bits));
+  }
+  return UInt64(bits);
+}
+
+// libplist hands dates out in 32 bits of seconds; its binary form of one keeps all of it.
+PropertyValue DateFromNode(plist_t node) {
+  char* memory = nullptr;
+  std::uint32_t size = 0;
+  plist_to_bin(node, &memory, &size);
+  const Allocated<char> binary(memory);
+  ByteReader reader(std::as_bytes(std::span(memory, memory == nullptr ? 0 : size)));
+  reader.skip(kBinaryMagic.size() + 1);
+  return Date{std::bit_cast<double>(reader.big(8)) + kEpoch2001};
+}
+
+PropertyValue DataFromNode(plist_t node) {
+  std::uint64_t size = 0;
+  const char* bytes = plist_get_data_ptr(node, &size);
+  const auto content = std::as_bytes(std::span(bytes, bytes == nullptr ? 0 : size));
+  return Data(content.begin(), content.end());
+}
+
+PropertyValue StringFromNode(plist_t node) {
+  std::uint64_t size = 0;
+  const char* text = plist_get_string_ptr(node, &size);
+  return RepairUtf8({text, text == nullptr ? 0 : static_cast<std::size_t>(size)});
+}
+
+std::optional<PropertyValue> FromNode(plist_t node);
+
+std::optional<PropertyValue> ArrayFromNode(plist_t node) {
+  plist_array_iter position = nullptr;
+  plist_array_new_iter(node, &position);
+  const Allocated<void> owner(position);
+  Array array;
+  while (true) {
+    plist_t item = nullptr;
+    plist_array_next_item(node, position, &item);
+    if (item == nullptr) return array;
+    auto value = FromNode(item);
+    if (!value) return std::nullopt;
+    array.push_back(*std::move(value));
+  }
+}
+
+std::optional<PropertyValue> DictionaryFromNode(plist_t node) {
+  plist_dict_iter position = nullptr;
+  plist_dict_new_iter(node, &position);
+  const Allocated<void> owner(position);
+  Dictionary dictionary;
+  while (true) {
+    char* key = nullptr;
+    plist_t item = nullptr;
+    plist_dict_next_item(node, position, &key, &item);
+    const Allocated<char> keyOwner(key);
+    if (item == nullptr) return dictionary;
+    auto value = FromNode(item);
+    if (!value || key == nullptr) return std::nullopt;
+    dictionary[RepairUtf8(key)] = *std::move(value);
+  }
+}
+
+std::optional<PropertyValue> FromNode(plist_t node) {
+  switch (plist_get_node_type(node)) {
+    case PLIST_BOOLEAN: {
+      std::uint8_t boolean = 0;
+      plist_get_bool_val(node, &boolean);
+      return boolean != 0;
+    }
+    case PLIST_UINT:
+      return IntegerFromNode(node);
+    case PLIST_REAL: {
+      double real = 0;
+      plist_get_real_val(node, &real);
+      return Double(real);
+    }
+    case PLIST_STRING:
+      return StringFromNode(node);
+    case PLIST_DATA:
+      return DataFromNode(node);
+    case PLIST_DATE:
+      return DateFromNode(node);
+    case PLIST_ARRAY:
+      return ArrayFromNode(node);
+    case PLIST_DICT:
+      return DictionaryFromNode(node);
+    case PLIST_KEY:
+    case PLIST_UID:
+    case PLIST_NONE:
+      break;
+  }
+  return std::nullopt;
+}
+
+// --- Writing ------------------------------------------------------------------------------------
+
+class TreeWriter {
+ public:
+  // Null when the tree is beyond the limits; error() says which.
+  Node toNode(const PropertyValue& value, std::size_t above) {
+    if (++values_ > kMaxPropertyListValues) return refuse(TooManyValues());
+    if (const bool* boolean = value.asBoolean()) return Node(plist_new_bool(*boolean ? 1 : 0));
+    if (const Number* number = value.asNumber()) return numberNode(*number);
+    if (const Date* date = value.asDate()) return dateNode(*date);
+    if (const std::string* text = value.asString()) {
+      return takeContent(text->size()) ? Node(plist_new_string(AsWritten(*text).c_str())) : nullptr;
+    }
+    if (const Data* data = value.asData()) {
+      return takeContent(data->size())
+                 ? Node(plist_new_data(reinterpret_cast<const char*>(data->data()), data->size()))
+                 : nullptr;
+    }
+    // A tree that holds itself ends here too.
+    if (above == kMaxPropertyListDepth) return refuse("the tree is " + TooDeeplyNested());
+    if (const Array* array = value.asArray()) return arrayNode(*array, above);
+    return dictionaryNode(*value.asDictionary(), above);
+  }
+
+  const std::string& error() const { return error_; }
+
+ private:
+  Node refuse(std::string error) {
+    error_ = std::move(error);
+    return nullptr;
+  }
+
+  bool takeContent(std::size_t size) {
+    if (size <= kMaxPropertyListContentBytes - content_) {
+      content_ += size;
+      return true;
+    }
+    error_ = "more than " + std::to_string(kMaxPropertyListContentBytes) + " bytes of content";
+    return false;
+  }
+
+  static Node numberNode(const Number& number) {
+    if (number.isReal()) return Node(plist_new_real(number.toDouble()));
+    const std::uint64_t bits = number.toUInt64();
+    // libplist takes the bits for those of a signed number.
+    if (!std::in_range<std::int64_t>(bits)) return ParseScalar("integer", std::to_string(bits));
+    return Node(plist_new_uint(static_cast<std::uint64_t>(number.toInt64())));
+  }
+
+  static Node dateNode(Date date) {
+    const double second = AsWritten(date).secondsSince1970;
+    const double since2001 = second - kEpoch2001;
+    if (std::abs(since2001) > std::numeric_limits<std::int32_t>::max()) {
+      return ParseScalar("date", Rfc3339({second}));
+    }
+    return Node(plist_new_date(static_cast<std::int32_t>(since2001), 0));
+  }
+
+  Node arrayNode(const Array& array, std::size_t above) {
+    Node node(plist_new_array());
+    for (const PropertyValue& element : array) {
+      Node child = toNode(element, above + 1);
+      if (child == nullptr) return nullptr;
+      plist_array_append_item(node.get(), child.release());
+    }
+    return node;
+  }
+
+  Node dictionaryNode(const Dictionary& dictionary, std::size_t above) {
+    Node node(plist_new_dict());
+    for (const auto& [key, value] : dictionary) {
+      if (!takeContent(key.size())) return nullptr;
+      Node child = toNode(value, above + 1);
+      if (child == nullptr) return nullptr;
+      // Of keys that repair makes the same, the last one's value stays.
+      plist_dict_set_item(node.get(), AsWritten(key).c_str(), child.release());
+    }
+    return node;
+  }
+
+  std::size_t values_ = 0;
+  std::size_t content_ = 0;
+  std::string error_;
+};
+
+std::string TooLarge() {
+  return "the document is larger than " + std::to_string(kMaxPropertyListBytes) + " bytes";
+}
+
+}  // namespace
+
+PropertyListResult ReadPropertyList(std::string_view bytes) {
+  if (bytes.empty()) return PropertyListError{"the document is empty"};
+  if (bytes.size() > kMaxPropertyListBytes) return PropertyListError{TooLarge()};
+  Node node;
+  if (bytes.starts_with(kBinaryMagic)) {
+    const auto wrong = CheckBinaryPropertyList(std::as_bytes(std::span(bytes)));
+    if (wrong) return PropertyListError{*wrong};
+    plist_t parsed = nullptr;
+    plist_from_bin(bytes.data(), static_cast<std::uint32_t>(bytes.size()), &parsed);
+    node.reset(parsed);
+  } else {
+    std::string plain;
+    if (const auto wrong = CheckXmlPropertyList(bytes, &plain)) return PropertyListError{*wrong};
+    node = ParseXml(plain);
+  }
+  auto value = node == nullptr ? std::nullopt : FromNode(node.get());
+  if (!value) return PropertyListError{"the document cannot be parsed"};
+  return *std::move(value);
+}
+
+PropertyListResult ReadPropertyList(std::span<const std::byte> bytes) {
+  return ReadPropertyList(
+      std::string_view(reinterpret_cast<const char*>(bytes.data()), bytes.size()));
+}
+
+std::string AsWritten(std::string_view text) {
+  const std::string repaired = RepairUtf8(text);
+  std::string_view rest = repaired;
+  std::string out;
+  while (true) {
+    const std::size_t good = XmlTextPrefix(rest);
+    out += rest.substr(0, good);
+    rest.remove_prefix(good);
+    if (rest.empty()) return out;
+    out += kReplacement;
+    // A control character, or U+FFFE or U+FFFF in three bytes.
+    rest.remove_prefix(static_cast<unsigned char>(rest[0]) < 0x20 ? 1 : 3);
+  }
+}
+
+Date AsWritten(Date date) {
+  if (std::isnan(date.secondsSince1970)) return {0};
+  return {std::clamp(std::floor(date.secondsSince1970), kFirstWrittenSecond, kLastWrittenSecond)};
+}
+
+std::variant<std::string, PropertyListError> WriteXmlPropertyList(const PropertyValue& root) {
+  TreeWriter writer;
+  const Node node = writer.toNode(root, 0);
+  if (node == nullptr) {
+    return PropertyListError{writer.error().empty() ? "out of memory" : writer.error()};
+  }
+  char* memory = nullptr;
+  std::uint32_t size = 0;
+  plist_to_xml(node.get(), &memory, &size);
+  const Allocated<char> document(memory);
+  if (memory == nullptr) return PropertyListError{"the document cannot be written"};
+  if (size > kMaxPropertyListBytes) return PropertyListError{TooLarge()};
+  return std::string(memory, size);
+}
+
+}  // namespace quorlet

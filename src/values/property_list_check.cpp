@@ -1,0 +1,354 @@
+// The check of XML documents, a scanner over
+//   [BOM] [<?xml …?>] [document type] <plist> value </plist>
+// with comments, processing instructions and blanks between elements.
+#include "values/property_list_check.h"
+
+#include <algorithm>
+#include <array>
+#include <cstdint>
+#include <vector>
+
+#include "values/property_list.h"
+#include "values/property_list_scalars.h"
+#include "values/text.h"
+
+namespace quorlet {
+namespace {
+
+bool IsLetter(char c) { return (c >= 'a' && c <= 'z') || (c >= 'A' && c <= 'Z'); }
+bool IsBlank(char c) { return kXmlBlanks.find(c) != std::string_view::npos; }
+bool IsNameCharacter(char c) {
+  return IsLetter(c) || (c >= '0' && c <= '9') ||
+         std::string_view("_-.:").find(c) != std::string_view::npos;
+}
+
+enum class Role : std::uint8_t { kRoot, kDictionary, kArray, kKey, kText, kFlag, kScalar };
+
+struct Element {
+  std::string_view name;
+  Role role;
+  std::optional<std::string> (*plain)(std::string_view) = nullptr;
+  std::string_view expected = {};
+};
+
+// clang-format off
+constexpr auto kElements = std::to_array<Element>({
+    {"plist",   Role::kRoot},
+    {"dict",    Role::kDictionary},
+    {"array",   Role::kArray},
+    {"key",     Role::kKey},
+    {"string",  Role::kText},
+    {"true",    Role::kFlag},
+    {"false",   Role::kFlag},
+    {"integer", Role::kScalar, PlainInteger, "a 64-bit integer"},
+    {"real",    Role::kScalar, PlainReal,    "a real number"},
+    {"date",    Role::kScalar, PlainDate,    "a date such as 2026-03-04T05:06:07Z"},
+    {"data",    Role::kScalar, PlainBase64,  "base64"},
+});
+// clang-format on
+
+std::string Bracketed(std::string_view name) { return "<" + std::string(name) + ">"; }
+
+// Every step gives false once something is wrong, and `error` says what.
+class XmlChecker {
+ public:
+  XmlChecker(std::string_view document, std::string& plain) : text_(document), plain_(plain) {}
+
+  std::optional<std::string> check() {
+    if (!checkCharacters() || !readDocument()) return error_;
+    return std::nullopt;
+  }
+
+ private:
+  struct Tag {
+    std::string_view name;
+    bool closes = false;
+    bool isEmpty = false;
+    bool hasAttributes = false;
+  };
+  struct Open {
+    const Element* element;
+    std::size_t values = 0;
+    bool keyPending = false;
+  };
+
+  bool fail(std::size_t at, std::string_view what) {
+    const auto line = 1 + std::ranges::count(text_.substr(0, at), '\n');
+    error_ = "line " + std::to_string(line) + ": " + std::string(what);
+    return false;
+  }
+  bool fail(std::string_view what) { return fail(at_, what); }
+
+  bool atEnd() const { return at_ == text_.size(); }
+  bool nextIs(std::string_view wanted) const { return text_.substr(at_).starts_with(wanted); }
+  void skipBlanks() { at_ = std::min(text_.find_first_not_of(kXmlBlanks, at_), text_.size()); }
+
+  // Moves past the next `end`, having skipped `skip` bytes, and gives what lies between.
+  bool takeUntil(std::size_t skip, std::string_view end, std::string_view construct,
+                 std::string_view* content = nullptr) {
+    const std::size_t first = at_ + skip;
+    const std::size_t found = text_.find(end, first);
+    if (found == std::string_view::npos) {
+      return fail("the document ends inside " + std::string(construct));
+    }
+    if (content != nullptr) *content = text_.substr(first, found - first);
+    at_ = found + end.size();
+    return true;
+  }
+
+  bool checkCharacters() {
+    const std::size_t valid = ValidUtf8Prefix(text_);
+    const std::size_t held = XmlTextPrefix(text_.substr(0, valid));
+    if (held < valid) return fail(held, "a character that XML cannot hold");
+    return valid == text_.size() || fail(valid, "not valid UTF-8");
+  }
+
+  // At the very start: "<?xml version="1.0" encoding="UTF-8"?>". The bytes are taken for UTF-8, so
+  // a document that calls itself anything else is refused.
+  bool readDeclaration() {
+    if (!nextIs("<?xml") || at_ + 5 == text_.size() || !IsBlank(text_[at_ + 5])) return true;
+    const std::size_t start = at_;
+    std::string_view content;
+    if (!takeUntil(5, "?>", "the XML declaration", &content)) return false;
+    const std::size_t encoding = content.find("encoding");
+    if (encoding == std::string_view::npos) return true;
+    const std::string name = Lowered(content.substr(encoding));
+    const bool known =
+        name.find("utf-8") != std::string::npos || name.find("us-ascii") != std::string::npos;
+    return known || fail(start, "the document is not in UTF-8");
+  }
+
+  // A document type names the format, which is known; definitions inside it are refused.
+  bool readDocumentType() {
+    char quote = 0;
+    for (std::size_t i = at_; i < text_.size(); ++i) {
+      const char c = text_[i];
+      if (quote != 0) {
+        if (c == quote) quote = 0;
+      } else if (c == '"' || c == '\'') {
+        quote = c;
+      } else if (c == '[') {
+        return fail(i, "definitions inside the document type");
+      } else if (c == '>') {
+        at_ = i + 1;
+        return true;
+      }
+    }
+    return fail("the document ends inside the document type");
+  }
+
+  bool skipBetweenElements() {
+    while (true) {
+      skipBlanks();
+      if (nextIs("<!--")) {
+        if (!takeUntil(4, "-->", "a comment")) return false;
+      } else if (nextIs("<?")) {
+        if (!takeUntil(2, "?>", "a processing instruction")) return false;
+      } else {
+        return true;
+      }
+    }
+  }
+
+  // Of attributes only the end is found: the format has none that matter.
+  bool readTag(Tag& tag) {
+    const std::size_t start = at_++;
+    tag.closes = nextIs("/");
+    if (tag.closes) ++at_;
+    const std::size_t name = at_;
+    while (!atEnd() && IsNameCharacter(text_[at_])) ++at_;
+    tag.name = text_.substr(name, at_ - name);
+    const std::size_t rest = at_;
+    char quote = 0;
+    for (; !atEnd(); ++at_) {
+      const char c = text_[at_];
+      if (quote != 0 ? c == quote : c == '"' || c == '\'') quote = quote != 0 ? '\0' : c;
+      if (c == '<' || (c == '>' && quote == 0)) break;
+    }
+    if (atEnd()) return fail(start, "the document ends inside a tag");
+    std::string_view attributes = text_.substr(rest, at_ - rest);
+    tag.isEmpty = attributes.ends_with('/');
+    if (tag.isEmpty) attributes.remove_suffix(1);
+    tag.hasAttributes = !Trimmed(attributes).empty();
+    const bool separated = !tag.hasAttributes || IsBlank(attributes[0]);
+    if (text_[at_] == '<' || tag.name.empty() || !separated || (tag.closes && tag.isEmpty)) {
+      return fail(start, "a malformed tag");
+    }
+    ++at_;
+    return true;
+  }
+
+  bool readReference(std::string& out) {
+    const std::size_t start = at_;
+    const std::size_t end = text_.find_first_of(";<&", start + 1);
+    if (end == std::string_view::npos || text_[end] != ';') return fail("an & that names nothing");
+    const auto character = XmlReference(text_.substr(start + 1, end - start - 1));
+    if (!character) {
+      return fail(QuotedExcerpt(text_.substr(start, end - start + 1)) + " names no character");
+    }
+    out += *character;
+    at_ = end + 1;
+    return true;
+  }
+
+  // The text up to and including the end tag of `element`.
+  bool readText(const Element& element, std::string& out) {
+    while (true) {
+      const std::size_t plain = std::min(text_.find_first_of("<&", at_), text_.size());
+      out += text_.substr(at_, plain - at_);
+      at_ = plain;
+      std::string_view section;
+      if (atEnd()) return fail("the document ends inside " + Bracketed(element.name));
+      if (nextIs("&")) {
+        if (!readReference(out)) return false;
+      } else if (nextIs("<![CDATA[")) {
+        if (!takeUntil(9, "]]>", "a CDATA section", &section)) return false;
+        out += section;
+      } else if (nextIs("<!--") || nextIs("<?")) {
+        if (!skipBetweenElements()) return false;
+      } else {
+        const std::size_t start = at_;
+        Tag tag;
+        if (!readTag(tag)) return false;
+        if (tag.closes && tag.name == element.name && !tag.hasAttributes) return true;
+        return fail(start, Bracketed((tag.closes ? "/" : "") + std::string(tag.name)) + " inside " +
+                               Bracketed(element.name));
+      }
+    }
+  }
+
+  // Whether a value or key of this kind may come next in `parent`.
+  bool checkPlace(const Open& parent, const Element& element, std::size_t at) {
+    const std::string name = Bracketed(element.name);
+    if (element.role == Role::kRoot) return fail(at, "<plist> inside <plist>");
+    const bool keyExpected = parent.element->role == Role::kDictionary && !parent.keyPending;
+    if (keyExpected != (element.role == Role::kKey)) {
+      return fail(at, name + " where " + (keyExpected ? "<key>" : "a value") + " belongs");
+    }
+    if (parent.element->role == Role::kRoot && parent.values > 0) {
+      return fail(at, name + ": a second value inside <plist>");
+    }
+    return true;
+  }
+
+  // An element that holds no other elements.
+  bool readLeaf(const Element& element, const Tag& tag, std::size_t at) {
+    std::string content;
+    if (!tag.isEmpty && !readText(element, content)) return false;
+    const auto refuse = [&](std::string_view expected) {
+      return fail(at, Bracketed(element.name) + " holds " + QuotedExcerpt(content) +
+                          ", which is not " + std::string(expected));
+    };
+    if (element.role == Role::kFlag) {
+      plain_ += "<" + std::string(element.name) + "/>";
+      return Trimmed(content).empty() || refuse("empty");
+    }
+    const bool isText = element.plain == nullptr;
+    const auto plain = isText ? SectionedXml(content) : element.plain(Trimmed(content));
+    if (!plain) return refuse(element.expected);
+    emit(element, *plain);
+    return true;
+  }
+
+  void emit(const Element& element, const std::string& content) {
+    plain_ += Bracketed(element.name);
+    plain_ += content;
+    plain_ += "</";
+    plain_ += element.name;
+    plain_ += '>';
+  }
+
+  bool openElement(const Tag& tag, std::size_t at) {
+    const auto* const element = std::ranges::find(kElements, tag.name, &Element::name);
+    if (element == kElements.end()) return fail(at, "unknown element " + QuotedExcerpt(tag.name));
+    if (tag.hasAttributes) return fail(at, Bracketed(tag.name) + " has attributes");
+    Open& parent = open_.back();
+    if (!checkPlace(parent, *element, at)) return false;
+    parent.keyPending = element->role == Role::kKey;
+    if (!parent.keyPending) {
+      ++parent.values;
+      if (++values_ > kMaxPropertyListValues) return fail(at, TooManyValues());
+    }
+    if (element->role != Role::kDictionary && element->role != Role::kArray) {
+      return readLeaf(*element, tag, at);
+    }
+    // <plist> is open beside the containers.
+    if (open_.size() > kMaxPropertyListDepth) return fail(at, TooDeeplyNested());
+    if (tag.isEmpty) {
+      emit(*element, "");
+    } else {
+      plain_ += Bracketed(element->name);
+      open_.push_back({element});
+    }
+    return true;
+  }
+
+  bool closeElement(const Tag& tag, std::size_t at) {
+    const Open& open = open_.back();
+    if (tag.name != open.element->name || tag.hasAttributes) {
+      return fail(at, "</" + std::string(tag.name) + "> inside " + Bracketed(open.element->name));
+    }
+    if (open.keyPending) return fail(at, "the last <key> of <dict> has no value");
+    if (open.element->role == Role::kRoot && open.values == 0) {
+      return fail(at, "<plist> holds no value");
+    }
+    plain_ += "</" + std::string(tag.name) + ">";
+    open_.pop_back();
+    return true;
+  }
+
+  bool readDocument() {
+    if (nextIs("\xEF\xBB\xBF")) at_ += 3;
+    if (!readDeclaration() || !skipBetweenElements()) return false;
+    if (nextIs("<!") && at_ + 2 < text_.size() && IsLetter(text_[at_ + 2])) {
+      if (!readDocumentType() || !skipBetweenElements()) return false;
+    }
+    const std::size_t start = at_;
+    Tag root;
+    if (!nextIs("<")) return fail("no <plist> element");
+    if (!readTag(root)) return false;
+    if (root.name != "plist" || root.closes) return fail(start, "no <plist> element");
+    if (root.isEmpty) return fail(start, "<plist> holds no value");
+    plain_ += "<plist>";
+    open_.push_back({kElements.begin()});
+    while (!open_.empty()) {
+      if (!readNextTag()) return false;
+    }
+    return skipBetweenElements() && (atEnd() || fail("text after </plist>"));
+  }
+
+  bool readNextTag() {
+    if (!skipBetweenElements()) return false;
+    const std::string_view inside = open_.back().element->name;
+    if (atEnd()) return fail("the document ends inside " + Bracketed(inside));
+    if (!nextIs("<")) return fail("text inside " + Bracketed(inside));
+    const std::size_t at = at_;
+    Tag tag;
+    if (!readTag(tag)) return false;
+    return tag.closes ? closeElement(tag, at) : openElement(tag, at);
+  }
+
+  std::string_view text_;
+  std::string& plain_;
+  std::size_t at_ = 0;
+  std::vector<Open> open_;
+  std::size_t values_ = 0;
+  std::string error_;
+};
+
+}  // namespace
+
+std::string TooDeeplyNested() {
+  return "nested more than " + std::to_string(kMaxPropertyListDepth) + " deep";
+}
+
+std::string TooManyValues() {
+  return "more than " + std::to_string(kMaxPropertyListValues) + " values";
+}
+
+std::optional<std::string> CheckXmlPropertyList(std::string_view document, std::string* plain) {
+  std::string unwanted;
+  return XmlChecker(document, plain == nullptr ? unwanted : *plain).check();
+}
+
+}  // namespace quorlet

@@ -1,0 +1,188 @@
+// Scalars and characters as XML property lists spell them.
+#include "values/property_list_scalars.h"
+
+#include <algorithm>
+#include <array>
+#include <charconv>
+#include <chrono>
+#include <cstdint>
+
+#include "values/text.h"
+
+namespace quorlet {
+namespace {
+
+bool IsBlank(char c) { return kXmlBlanks.find(c) != std::string_view::npos; }
+bool IsBetween(char c, char first, char last) { return c >= first && c <= last; }
+bool IsLetter(char c) { return IsBetween(c, 'a', 'z') || IsBetween(c, 'A', 'Z'); }
+bool IsDigit(char c) { return IsBetween(c, '0', '9'); }
+
+// A number of `least` to `most` digits at the front of `text`, which loses them.
+std::optional<unsigned> TakeDigits(std::string_view& text, std::size_t least, std::size_t most) {
+  unsigned number = 0;
+  std::size_t count = 0;
+  for (; count < most && count < text.size() && IsDigit(text[count]); ++count) {
+    number = number * 10 + static_cast<unsigned>(text[count] - '0');
+  }
+  text.remove_prefix(count);
+  return count < least ? std::nullopt : std::optional(number);
+}
+
+bool IsXmlCharacter(std::uint32_t c) {
+  return c == '\t' || c == '\n' || c == '\r' || (c >= 0x20 && c < 0xD800) ||
+         (c >= 0xE000 && c < 0xFFFE) || (c >= 0x10000 && c <= 0x10FFFF);
+}
+
+void AppendUtf8(std::string& out, std::uint32_t c) {
+  const auto put = [&out](std::uint32_t byte) { out += static_cast<char>(byte); };
+  if (c < 0x80) {
+    put(c);
+    return;
+  }
+  const unsigned more = c < 0x800 ? 1 : c < 0x10000 ? 2 : 3;
+  constexpr std::array<std::uint32_t, 4> kLeads = {0, 0xC0, 0xE0, 0xF0};
+  put(kLeads[more] | c >> (6 * more));
+  for (unsigned i = more; i-- > 0;) put(0x80 | (c >> (6 * i) & 0x3F));
+}
+
+}  // namespace
+
+std::string_view Trimmed(std::string_view text) {
+  const std::size_t first = text.find_first_not_of(kXmlBlanks);
+  if (first == std::string_view::npos) return {};
+  return text.substr(first, text.find_last_not_of(kXmlBlanks) - first + 1);
+}
+
+std::string Lowered(std::string_view text) {
+  std::string out(text);
+  for (char& c : out) c = IsBetween(c, 'A', 'Z') ? static_cast<char>(c - 'A' + 'a') : c;
+  return out;
+}
+
+std::optional<std::string> PlainInteger(std::string_view text) {
+  const bool negative = text.starts_with('-');
+  if (negative || text.starts_with('+')) text.remove_prefix(1);
+  const bool hexadecimal = text.starts_with("0x") || text.starts_with("0X");
+  if (hexadecimal) text.remove_prefix(2);
+  std::uint64_t magnitude = 0;
+  const char* const end = text.data() + text.size();
+  const auto [stopped, error] = std::from_chars(text.data(), end, magnitude, hexadecimal ? 16 : 10);
+  if (error != std::errc() || stopped != end) return std::nullopt;
+  if (negative && magnitude > std::uint64_t{1} << 63) return std::nullopt;
+  return (negative ? "-" : "") + std::to_string(magnitude);
+}
+
+std::optional<std::string> PlainReal(std::string_view text) {
+  const bool negative = text.starts_with('-');
+  const std::string sign = negative ? "-" : "";
+  if (negative || text.starts_with('+')) text.remove_prefix(1);
+  const std::string word = Lowered(text);
+  if (word == "nan") return "nan";
+  if (word == "inf" || word == "infinity") return negative ? "-infinity" : "+infinity";
+  if (text.empty() || !(IsDigit(text[0]) || text[0] == '.')) return std::nullopt;
+  double value = 0;
+  const char* const end = text.data() + text.size();
+  const auto [stopped, error] = std::from_chars(text.data(), end, value);
+  if (error != std::errc() || stopped != end) return std::nullopt;
+  std::array<char, 32> digits{};
+  const auto printed = std::to_chars(digits.begin(), digits.end(), value);
+  return sign + std::string(digits.begin(), printed.ptr);
+}
+
+std::optional<std::string> PlainDate(std::string_view text) {
+  const std::string_view whole = text;
+  std::array<unsigned, 6> fields{};
+  constexpr std::string_view kSeparators = "--T::Z";
+  for (std::size_t i = 0; i < fields.size(); ++i) {
+    const auto number = TakeDigits(text, i == 0 ? 1 : 2, i == 0 ? 4 : 2);
+    if (!number || !text.starts_with(kSeparators[i])) return std::nullopt;
+    fields[i] = *number;
+    text.remove_prefix(1);
+  }
+  const auto [year, month, day, hour, minute, second] = fields;
+  const std::chrono::year_month_day civil(std::chrono::year(static_cast<int>(year)),
+                                          std::chrono::month(month), std::chrono::day(day));
+  if (!text.empty() || year == 0 || !civil.ok()) return std::nullopt;
+  if (hour > 23 || minute > 59 || second > 59) return std::nullopt;
+  return std::string(whole);
+}
+
+std::optional<std::string> PlainBase64(std::string_view text) {
+  std::string plain;
+  for (const char c : text) {
+    if (!IsBlank(c)) plain += c;
+  }
+  std::string_view digits = plain;
+  if (digits.size() % 4 != 0) return std::nullopt;
+  for (int padding = 0; padding < 2 && digits.ends_with('='); ++padding) digits.remove_suffix(1);
+  const bool good = std::ranges::all_of(
+      digits, [](char c) { return IsLetter(c) || IsDigit(c) || c == '+' || c == '/'; });
+  return good ? std::optional(plain) : std::nullopt;
+}
+
+std::string SectionedXml(std::string_view text) {
+  constexpr std::string_view kBegin = "<![CDATA[";
+  constexpr std::string_view kEnd = "]]>";
+  if (text.find_first_of("&<") == std::string_view::npos) return std::string(text);
+  std::string out(kBegin);
+  std::string_view rest = text;
+  for (std::size_t end; (end = rest.find(kEnd)) != std::string_view::npos;) {
+    // The text's own "]]>" is cut in two, in two sections.
+    out += rest.substr(0, end + 2);
+    out += kEnd;
+    out += kBegin;
+    rest.remove_prefix(end + 2);
+  }
+  out += rest;
+  out += kEnd;
+  return out;
+}
+
+std::optional<std::string> XmlReference(std::string_view name) {
+  struct Entity {
+    std::string_view name;
+    char character;
+  };
+  constexpr auto kEntities = std::to_array<Entity>(
+      {{"amp", '&'}, {"lt", '<'}, {"gt", '>'}, {"quot", '"'}, {"apos", '\''}});
+  const auto* const entity = std::ranges::find(kEntities, name, &Entity::name);
+  if (entity != kEntities.end()) return std::string(1, entity->character);
+  if (!name.starts_with('#')) return std::nullopt;
+  name.remove_prefix(1);
+  const bool hexadecimal = name.starts_with('x');
+  if (hexadecimal) name.remove_prefix(1);
+  std::uint32_t code = 0;
+  const char* const end = name.data() + name.size();
+  const auto [stopped, error] = std::from_chars(name.data(), end, code, hexadecimal ? 16 : 10);
+  if (error != std::errc() || stopped != end || !IsXmlCharacter(code)) return std::nullopt;
+  std::string out;
+  AppendUtf8(out, code);
+  return out;
+}
+
+std::size_t XmlTextPrefix(std::string_view text) {
+  for (std::size_t i = 0; i < text.size(); ++i) {
+    const auto byte = static_cast<unsigned char>(text[i]);
+    if (byte < 0x20 && kXmlBlanks.find(text[i]) == std::string_view::npos) return i;
+    // U+FFFE and U+FFFF.
+    if (byte == 0xEF &&
+        (text.substr(i, 3) == "\xEF\xBF\xBE" || text.substr(i, 3) == "\xEF\xBF\xBF")) {
+      return i;
+    }
+  }
+  return text.size();
+}
+
+std::string QuotedExcerpt(std::string_view text) {
+  constexpr std::size_t kMost = 40;
+  std::string_view shown = text.substr(0, kMost);
+  // A character that was cut in two goes.
+  if (text.size() > kMost) shown = shown.substr(0, ValidUtf8Prefix(shown));
+  std::string out = "\"" + RepairUtf8(shown) + (shown.size() < text.size() ? "…\"" : "\"");
+  for (char& c : out) {
+    if (static_cast<unsigned char>(c) < 0x20 || c == 0x7F) c = ' ';
+  }
+  return out;
+}
+
+}  // namespace quorlet

@@ -1,0 +1,305 @@
+#include "values/property_list.h"
+
+#include <gtest/gtest.h>
+
+#include <algorithm>
+#include <cmath>
+#include <cstdint>
+#include <limits>
+#include <vector>
+
+namespace quorlet {
+namespace {
+
+constexpr double kInfinity = std::numeric_limits<double>::infinity();
+
+std::string Xml(std::string_view body) { return "<plist>" + std::string(body) + "</plist>"; }
+
+// A binary document of these objects; the first is the root, references have one byte.
+std::string Binary(const std::vector<std::string>& objects) {
+  std::string out = "bplist00";
+  std::string offsets;
+  for (const std::string& object : objects) {
+    offsets += {static_cast<char>(out.size() >> 8), static_cast<char>(out.size())};
+    out += object;
+  }
+  const std::size_t table = out.size();
+  std::string trailer(32, '\0');
+  trailer[6] = 2;
+  trailer[7] = 1;
+  trailer[15] = static_cast<char>(objects.size());
+  trailer[30] = static_cast<char>(table >> 8);
+  trailer[31] = static_cast<char>(table);
+  return out + offsets + trailer;
+}
+
+std::string Bytes(std::initializer_list<int> bytes) {
+  std::string out;
+  for (const int byte : bytes) out += static_cast<char>(byte);
+  return out;
+}
+
+std::string Nested(std::size_t depth) {
+  std::string open;
+  std::string close;
+  for (std::size_t i = 0; i < depth; ++i) {
+    open += "<array>";
+    close += "</array>";
+  }
+  return Xml(open + close);
+}
+
+// `levels` arrays, each of which holds the next one eight times; the last one holds `leaf`.
+std::string SharedArrays(int levels, const std::string& leaf) {
+  std::vector<std::string> objects;
+  for (int i = 1; i <= levels; ++i)
+    objects.push_back("\xA8" + std::string(8, static_cast<char>(i)));
+  objects.push_back(leaf);
+  return Binary(objects);
+}
+
+testing::AssertionResult Reads(const std::string& document, const PropertyValue& expected) {
+  const auto result = ReadPropertyList(document);
+  if (const auto* error = std::get_if<PropertyListError>(&result)) {
+    return testing::AssertionFailure() << document << "\n" << error->description;
+  }
+  const auto& value = std::get<PropertyValue>(result);
+  if (value == expected) return testing::AssertionSuccess();
+  return testing::AssertionFailure() << document << "\ngives " << value.description();
+}
+
+std::string ErrorOf(const std::string& document) {
+  const auto result = ReadPropertyList(document);
+  const auto* error = std::get_if<PropertyListError>(&result);
+  return error == nullptr ? "none" : error->description;
+}
+
+std::string Written(const PropertyValue& value) {
+  const auto result = WriteXmlPropertyList(value);
+  const auto* error = std::get_if<PropertyListError>(&result);
+  return error == nullptr ? std::get<std::string>(result) : "error: " + error->description;
+}
+
+TEST(XmlReader, ReadsGoodDocuments) {
+  const std::pair<std::string, PropertyValue> cases[] = {
+      {"\xEF\xBB\xBF<?xml version=\"1.0\" encoding='utf-8'?>\n<!-- <plist> -->\n"
+       "<plist version=\"1.0\" a='>'>\n<true/>\n</plist>\n<!-- end -->\n",
+       true},
+      {Xml("<false> </false>"), false},
+      {Xml("<dict/>"), Dictionary{}},
+      {Xml("<dict><key/><array></array><key>a&amp;<![CDATA[<&]]></key><string/></dict >"),
+       Dictionary{{"", Array{}}, {"a&<&", ""}}},
+      {Xml("<dict><key>k</key><true/><key>k</key><false/></dict>"), Dictionary{{"k", false}}},
+      {Xml("<string> a&lt;b&#65;&#x1F600;&quot;<!-- x --><?p?><![CDATA[</string>]]>\t </string>"),
+       " a<bA\U0001F600\"</string>\t "},
+      {Xml("<array><integer> 0x7fFF </integer><integer>-0x5</integer><integer>+007</integer>"
+           "<integer>&#53;<!-- -->6</integer></array>"),
+       Array{Int32(32767), Int32(-5), Int32(7), Int32(56)}},
+      {Xml("<array><real>-1.5e3</real><real>.5</real><real>+INF</real><real>-Infinity</real>"
+           "<real>0.1</real></array>"),
+       Array{Double(-1500), Double(0.5), Double(kInfinity), Double(-kInfinity), Double(0.1)}},
+      {Xml("<array><data>AQ\n I=</data><data/></array>"),
+       Array{Data{std::byte{1}, std::byte{2}}, Data{}}},
+      {Xml("<array><date>1-01-01T00:00:00Z</date><date> 2026-03-04T05:06:07Z </date></array>"),
+       Array{Date{-62135596800}, Date{1772600767}}},
+  };
+  for (const auto& [document, value] : cases) EXPECT_TRUE(Reads(document, value));
+  EXPECT_EQ(ErrorOf(Nested(kMaxPropertyListDepth)), "none");
+}
+
+TEST(XmlReader, RefusesBadDocumentsAndSaysWhy) {
+  const std::pair<std::string, std::string_view> cases[] = {
+      {"", "the document is empty"},
+      {" \n", "line 2: no <plist> element"},
+      {"<dict/>", "line 1: no <plist> element"},
+      {"<plist/>", "line 1: <plist> holds no value"},
+      {Xml(" "), "line 1: <plist> holds no value"},
+      {"<plist>\n<true/>", "line 2: the document ends inside <plist>"},
+      {"<plist><dict", "line 1: the document ends inside a tag"},
+      {Xml("<true/><true/>"), "line 1: <true>: a second value inside <plist>"},
+      {Xml("<true/>") + "x", "line 1: text after </plist>"},
+      {Xml("x<true/>"), "line 1: text inside <plist>"},
+      {Xml("<array>\n</dict></array>"), "line 2: </dict> inside <array>"},
+      {Xml("<bool/>"), "line 1: unknown element \"bool\""},
+      {Xml("<string a='b'/>"), "line 1: <string> has attributes"},
+      {Xml("<string>a<b/></string>"), "line 1: <b> inside <string>"},
+      {Xml("<true>x</true>"), "line 1: <true> holds \"x\", which is not empty"},
+      {Xml("<dict><true/></dict>"), "line 1: <true> where <key> belongs"},
+      {Xml("<dict><key>a</key><key>b</key></dict>"), "line 1: <key> where a value belongs"},
+      {Xml("<dict><key>a</key></dict>"), "line 1: the last <key> of <dict> has no value"},
+      {Xml("<key>a</key>"), "line 1: <key> where a value belongs"},
+      {Xml("<string>&nbsp;</string>"), "line 1: \"&nbsp;\" names no character"},
+      {Xml("<string>&#0;</string>"), "line 1: \"&#0;\" names no character"},
+      {Xml("<string>&#xD800;</string>"), "line 1: \"&#xD800;\" names no character"},
+      {Xml("<string>a & b</string>"), "line 1: an & that names nothing"},
+      {Xml("<string>\x01</string>"), "line 1: a character that XML cannot hold"},
+      {Xml("<string>\uFFFF</string>"), "line 1: a character that XML cannot hold"},
+      {Xml("<string>\n\xFF</string>"), "line 2: not valid UTF-8"},
+      {"<?xml version='1.0' encoding='latin1'?>" + Xml("<true/>"),
+       "line 1: the document is not in UTF-8"},
+      {Nested(kMaxPropertyListDepth + 1), "line 1: nested more than 128 deep"},
+      {Nested(200'000), "line 1: nested more than 128 deep"},
+      {std::string(kMaxPropertyListBytes + 1, ' '), "the document is larger than 16777216 bytes"},
+  };
+  for (const auto& [document, error] : cases) {
+    EXPECT_EQ(ErrorOf(document), error) << document.substr(0, 100);
+  }
+  const auto refuses = [](std::string element, std::string_view contents, std::string expected) {
+    while (!contents.empty()) {
+      const auto end = std::min(contents.find('|'), contents.size());
+      const std::string content(contents.substr(0, end));
+      EXPECT_EQ(ErrorOf(Xml("<" + element + ">" + content + "</" + element + ">")),
+                "line 1: <" + element + "> holds \"" + content + "\", which is not " + expected);
+      contents.remove_prefix(std::min(end + 1, contents.size()));
+    }
+  };
+  refuses("integer",
+          "|abc|1x|--1|+-1|0x|1.0|1 2|18446744073709551616|-9223372036854775809|"
+          "-0x8000000000000001",
+          "a 64-bit integer");
+  refuses("real", "|x|1,5|1e|- 1|--1|0x1p3|1e999|nanx", "a real number");
+  refuses("data", "A|AQI|A!==|A===|=AAA|AQ=I|====", "base64");
+  refuses("date",
+          "|x|2026-02-29T00:00:00Z|2026-13-01T00:00:00Z|2026-01-01T24:00:00Z|"
+          "2026-01-01T00:60:00Z|2026-01-01T00:00:60Z|2026-1-01T00:00:00Z|2026-01-01T00:00:00|"
+          "0-01-01T00:00:00Z|10000-01-01T00:00:00Z|-2026-01-01T00:00:00Z|2026-01-01 00:00:00Z",
+          "a date such as 2026-03-04T05:06:07Z");
+}
+
+// {"k": [...]} with every kind of object.
+const std::string kGoodBinary = Binary(
+    {Bytes({0xD1, 1, 2}), "Qk", Bytes({0xAA, 3, 4, 5, 6, 7, 8, 9, 10, 11, 4}), Bytes({0x10, 0xFF}),
+     Bytes({0x08}), Bytes({0x13, 255, 255, 255, 255, 255, 255, 255, 254}),
+     Bytes({0x14, 0, 0, 0, 0, 0, 0, 0, 0, 255, 255, 255, 255, 255, 255, 255, 255}),
+     Bytes({0x23, 0x3F, 0xF8, 0, 0, 0, 0, 0, 0}), Bytes({0x33, 0x3F, 0xE0, 0, 0, 0, 0, 0, 0}),
+     Bytes({0x42, 1, 2}), Bytes({0x63, 0x20, 0xAC, 0xD8, 0x3D, 0xDE, 0x00}),
+     Bytes({0x5F, 0x10, 1, 'x'})});
+
+TEST(BinaryReader, ReadsGoodDocuments) {
+  EXPECT_TRUE(
+      Reads(kGoodBinary,
+            Dictionary{{"k", Array{Int32(255), false, Int32(-2),
+                                   UInt64(std::numeric_limits<std::uint64_t>::max()), Double(1.5),
+                                   Date{978307200.5}, Data{std::byte{1}, std::byte{2}},
+                                   "\u20AC\U0001F600", "x", false}}}));
+  EXPECT_TRUE(Reads(Binary({Bytes({0x52, 'a', 0xE9})}), "a\uFFFD"));
+  EXPECT_TRUE(Reads(Binary({Bytes({0x22, 0x3F, 0x80, 0, 0})}), Double(1)));
+}
+
+TEST(BinaryReader, RefusesBadDocumentsAndSaysWhy) {
+  const auto withTrailer = [](std::size_t at, int byte) {
+    std::string document = Binary({Bytes({0x08})});
+    document[document.size() - 32 + at] = static_cast<char>(byte);
+    return document;
+  };
+  std::vector<std::string> chain;
+  for (int i = 1; i <= 128; ++i) chain.push_back(Bytes({0xA1, i}));
+  chain.push_back(Bytes({0xA0}));
+  // The root holds the chain's lower half first, so that it is known when the upper one meets it.
+  std::vector<std::string> known = chain;
+  known[0] = Bytes({0xA2, 100, 1});
+  const std::pair<std::string, std::string_view> cases[] = {
+      {"bplist00", "the document is too short"},
+      {withTrailer(6, 0), "the trailer holds impossible sizes"},
+      {withTrailer(7, 9), "the trailer holds impossible sizes"},
+      {withTrailer(8, 1), "more than 1000000 objects"},
+      {withTrailer(15, 2), "the offset table lies outside of the document"},
+      {withTrailer(15, 0), "the root object does not exist"},
+      {withTrailer(23, 1), "the root object does not exist"},
+      {withTrailer(24, 0xFF), "the offset table lies outside of the document"},
+      {withTrailer(31, 7), "the offset table lies outside of the document"},
+      {withTrailer(31, 8), "object 0 lies outside of the document"},
+      {Binary({Bytes({0xA1, 0})}), "object 0 contains itself"},
+      {Binary({Bytes({0xA1, 1}), Bytes({0xD1, 2, 0}), "Qk"}), "object 0 contains itself"},
+      {Binary({Bytes({0xA1, 9})}), "object 0 refers to an object that does not exist"},
+      {Binary({Bytes({0xD1, 1, 1}), Bytes({0x09})}), "object 0 has a key that is not a string"},
+      {Binary({Bytes({0x00})}), "object 0 is of an unknown type"},
+      {Binary({Bytes({0x15, 0, 0})}), "object 0 is of an unknown type"},
+      {Binary({Bytes({0x80, 1})}), "object 0 is a UID, which is not supported"},
+      {Binary({Bytes({0xC0})}), "object 0 is a set, which is not supported"},
+      {Binary({Bytes({0x14, 0, 0, 0, 0, 0, 0, 0, 1, 0, 0, 0, 0, 0, 0, 0, 0})}),
+       "object 0 is an integer beyond 64 bits"},
+      {Binary({Bytes({0x12, 0, 0, 0})}), "object 0 does not end inside the document"},
+      {Binary({Bytes({0x53, 'a', 'b'})}), "object 0 does not end inside the document"},
+      {Binary({Bytes({0x62, 0, 'a', 0})}), "object 0 does not end inside the document"},
+      {Binary({Bytes({0xD1, 0})}), "object 0 does not end inside the document"},
+      {Binary({Bytes({0x4F, 0x13, 255, 255, 255, 255, 255, 255, 255, 255})}),
+       "object 0 does not end inside the document"},
+      {Binary({Bytes({0xAF, 0x23, 0, 0})}), "object 0 has no count"},
+      {Binary({Bytes({0x52, 'a', 0})}), "object 0 is a string with a null character"},
+      {Binary({Bytes({0x61, 0, 0})}), "object 0 is a string with a null character"},
+      {Binary(chain), "object 128 is nested more than 128 deep"},
+      {Binary(known), "object 100 is nested more than 128 deep"},
+      {SharedArrays(40, Bytes({0x08})), "more than 1000000 values"},
+      {SharedArrays(6, Bytes({0x4F, 0x11, 4, 1}) + std::string(1025, 'x')),
+       "more than 67108864 bytes of content"},
+  };
+  for (const auto& [document, error] : cases) EXPECT_EQ(ErrorOf(document), error);
+}
+
+TEST(Reader, SurvivesEveryCutAndEveryChangedByte) {
+  const std::string xml =
+      "<?xml version=\"1.0\"?><plist><dict><key>a</key><string>x&amp;</string><key>b</key><array>"
+      "<integer>-5</integer><data>AQI=</data><date>2026-03-04T05:06:07Z</date></array></dict></"
+      "plist>";
+  ASSERT_EQ(ErrorOf(xml), "none");
+  for (const std::string& good : {xml, kGoodBinary}) {
+    for (std::size_t length = 0; length < good.size(); ++length) {
+      EXPECT_NE(ErrorOf(good.substr(0, length)), "none") << length;
+    }
+    for (std::size_t i = 0; i < good.size(); ++i) {
+      for (const int mask : {0x01, 0x10, 0x80, 0xFF}) {
+        std::string changed = good;
+        changed[i] = static_cast<char>(changed[i] ^ mask);
+        const auto result = ReadPropertyList(changed);
+        if (const auto* value = std::get_if<PropertyValue>(&result)) {
+          EXPECT_EQ(ErrorOf(Written(*value)), "none") << i;
+        }
+      }
+    }
+  }
+}
+
+TEST(Writer, ValuesSurviveARoundTrip) {
+  using Signed = std::numeric_limits<std::int64_t>;
+  const PropertyValue cases[] = {
+      Array{true, false, "", Array{}, Dictionary{}, Data{}, Data(100, std::byte{0xFB})},
+      Array{Int8(-1), Int16(-2), Int32(-3), Int64(Signed::max()), Int64(Signed::min())},
+      Array{UInt64(5), UInt64(std::uint64_t{1} << 63), UInt64(~std::uint64_t{0})},
+      Array{Double(0.1), Double(5e-324), Double(1.7976931348623157e308), Double(kInfinity),
+            Double(-kInfinity), Double(1e21), Single(0.1F), Double(-1.0 / 3)},
+      // 1900, 1932, 1969, 2001, 2026, 2069, 2100, year 1 and year 9999.
+      Array{Date{-2208988800}, Date{-1169176449}, Date{-1}, Date{978307200}, Date{1772600767},
+            Date{3125790847}, Date{3125790848}, Date{4102444800}, Date{-62135596800},
+            Date{253402300799}},
+      Dictionary{{"", "<&>\"' ]]> \t\n\r \U0001F600 "}, {"a&b<c>", Dictionary{{" k ", "  "}}}},
+  };
+  for (const PropertyValue& value : cases) EXPECT_TRUE(Reads(Written(value), value));
+  const auto nan = ReadPropertyList(Written(Double(NAN)));
+  EXPECT_TRUE(std::isnan(std::get<PropertyValue>(nan).asNumber()->toDouble()));
+}
+
+TEST(Writer, WritesOnlyWhatXmlHolds) {
+  const std::string all("a\0\x01\x1F\x7F\xFF\xEF\xBF\xBEz", 10);
+  const std::string_view repaired = "a\uFFFD\uFFFD\uFFFD\x7F\uFFFD\uFFFDz";
+  EXPECT_TRUE(Reads(Written(Dictionary{{all, all}}), Dictionary{{repaired, repaired}}));
+  EXPECT_TRUE(
+      Reads(Written(Array{Date{1.75}, Date{-0.5}, Date{NAN}, Date{kInfinity}, Date{-1e300}}),
+            Array{Date{1}, Date{-1}, Date{0}, Date{253402300799}, Date{-62135596800}}));
+}
+
+TEST(Writer, RefusesWhatIsTooDeepOrTooLarge) {
+  PropertyValue deep = Array{};
+  for (std::size_t i = 1; i < kMaxPropertyListDepth; ++i) deep = Array{deep};
+  EXPECT_TRUE(Reads(Written(deep), deep));
+  EXPECT_EQ(Written(Array{deep}), "error: the tree is nested more than 128 deep");
+
+  PropertyValue wide = Array{"x"};
+  for (int i = 0; i < 30; ++i) wide = Array{wide, wide};
+  EXPECT_EQ(Written(wide), "error: more than 1000000 values");
+  EXPECT_EQ(Written(std::string(kMaxPropertyListBytes, 'x')),
+            "error: the document is larger than 16777216 bytes");
+}
+
+}  // namespace
+}  // namespace quorlet
