@@ -9,9 +9,11 @@
 #include <cstdint>
 #include <cstdlib>
 #include <limits>
+#include <map>
 #include <memory>
 #include <optional>
 #include <utility>
+#include <vector>
 
 #include "values/byte_reader.h"
 #include "values/property_list_check.h"
@@ -47,8 +49,7 @@ Node ParseXml(std::string_view document) {
 
 // A node of a kind that libplist makes only by parsing.
 Node ParseScalar(std::string_view element, const std::string& text) {
-  const std::string name(element);
-  return ParseXml("<plist><" + name + ">" + text + "</" + name + "></plist>");
+  return ParseXml(FormatText("<plist><%s>%s</%s></plist>", element, text, element));
 }
 
 // --- Reading: the depth was checked before the nodes were made ----------------------------------
@@ -83,77 +84,113 @@ PropertyValue DataFromNode(plist_t node) {
   return Data(content.begin(), content.end());
 }
 
-PropertyValue StringFromNode(plist_t node) {
+std::string TextOf(plist_t node) {
   std::uint64_t size = 0;
   const char* text = plist_get_string_ptr(node, &size);
   return RepairUtf8({text, text == nullptr ? 0 : static_cast<std::size_t>(size)});
 }
 
-std::optional<PropertyValue> FromNode(plist_t node);
-
-std::optional<PropertyValue> ArrayFromNode(plist_t node) {
+std::vector<plist_t> ElementsOf(plist_t array) {
+  std::vector<plist_t> elements;
   plist_array_iter position = nullptr;
-  plist_array_new_iter(node, &position);
+  plist_array_new_iter(array, &position);
   const Allocated<void> owner(position);
-  Array array;
   while (true) {
     plist_t item = nullptr;
-    plist_array_next_item(node, position, &item);
-    if (item == nullptr) return array;
-    auto value = FromNode(item);
-    if (!value) return std::nullopt;
-    array.push_back(*std::move(value));
+    plist_array_next_item(array, position, &item);
+    if (item == nullptr) return elements;
+    elements.push_back(item);
   }
 }
 
-std::optional<PropertyValue> DictionaryFromNode(plist_t node) {
-  plist_dict_iter position = nullptr;
-  plist_dict_new_iter(node, &position);
-  const Allocated<void> owner(position);
-  Dictionary dictionary;
-  while (true) {
-    char* key = nullptr;
-    plist_t item = nullptr;
-    plist_dict_next_item(node, position, &key, &item);
-    const Allocated<char> keyOwner(key);
-    if (item == nullptr) return dictionary;
-    auto value = FromNode(item);
-    if (!value || key == nullptr) return std::nullopt;
-    dictionary[RepairUtf8(key)] = *std::move(value);
-  }
-}
+class TreeReader {
+ public:
+  // `isPlain`: the nodes come from the plain form of an XML document, without dictionaries.
+  explicit TreeReader(bool isPlain) : isPlain_(isPlain) {}
 
-std::optional<PropertyValue> FromNode(plist_t node) {
-  switch (plist_get_node_type(node)) {
-    case PLIST_BOOLEAN: {
-      std::uint8_t boolean = 0;
-      plist_get_bool_val(node, &boolean);
-      return boolean != 0;
+  // nullopt for a node that is not what the check let pass.
+  std::optional<PropertyValue> value(plist_t node) const {
+    switch (plist_get_node_type(node)) {
+      case PLIST_BOOLEAN:
+        return isTrue(node);
+      case PLIST_UINT:
+        return IntegerFromNode(node);
+      case PLIST_REAL: {
+        double real = 0;
+        plist_get_real_val(node, &real);
+        return Double(real);
+      }
+      case PLIST_STRING:
+        return TextOf(node);
+      case PLIST_DATA:
+        return DataFromNode(node);
+      case PLIST_DATE:
+        return DateFromNode(node);
+      case PLIST_ARRAY:
+        return container(ElementsOf(node));
+      case PLIST_DICT:
+        return dictionary(node);
+      case PLIST_KEY:
+      case PLIST_UID:
+      case PLIST_NONE:
+        break;
     }
-    case PLIST_UINT:
-      return IntegerFromNode(node);
-    case PLIST_REAL: {
-      double real = 0;
-      plist_get_real_val(node, &real);
-      return Double(real);
-    }
-    case PLIST_STRING:
-      return StringFromNode(node);
-    case PLIST_DATA:
-      return DataFromNode(node);
-    case PLIST_DATE:
-      return DateFromNode(node);
-    case PLIST_ARRAY:
-      return ArrayFromNode(node);
-    case PLIST_DICT:
-      return DictionaryFromNode(node);
-    case PLIST_KEY:
-    case PLIST_UID:
-    case PLIST_NONE:
-      break;
+    return std::nullopt;
   }
-  return std::nullopt;
-}
+
+ private:
+  static bool isTrue(plist_t node) {
+    std::uint8_t boolean = 0;
+    plist_get_bool_val(node, &boolean);
+    return boolean != 0;
+  }
+
+  std::optional<PropertyValue> container(std::span<const plist_t> elements) const {
+    if (!isPlain_) return array(elements);
+    if (elements.empty()) return std::nullopt;
+    return isTrue(elements[0]) ? pairs(elements.subspan(1)) : array(elements.subspan(1));
+  }
+
+  std::optional<PropertyValue> array(std::span<const plist_t> elements) const {
+    Array array;
+    for (const plist_t item : elements) {
+      auto element = value(item);
+      if (!element) return std::nullopt;
+      array.push_back(*std::move(element));
+    }
+    return array;
+  }
+
+  // Keys and values in turn, from a plain form.
+  std::optional<PropertyValue> pairs(std::span<const plist_t> elements) const {
+    Dictionary dictionary;
+    for (; elements.size() >= 2; elements = elements.subspan(2)) {
+      auto element = value(elements[1]);
+      if (!element) return std::nullopt;
+      dictionary[TextOf(elements[0])] = *std::move(element);
+    }
+    return dictionary;
+  }
+
+  std::optional<PropertyValue> dictionary(plist_t node) const {
+    plist_dict_iter position = nullptr;
+    plist_dict_new_iter(node, &position);
+    const Allocated<void> owner(position);
+    Dictionary dictionary;
+    while (true) {
+      char* key = nullptr;
+      plist_t item = nullptr;
+      plist_dict_next_item(node, position, &key, &item);
+      const Allocated<char> keyOwner(key);
+      if (item == nullptr) return dictionary;
+      auto element = value(item);
+      if (!element || key == nullptr) return std::nullopt;
+      dictionary[RepairUtf8(key)] = *std::move(element);
+    }
+  }
+
+  const bool isPlain_;
+};
 
 // --- Writing ------------------------------------------------------------------------------------
 
@@ -174,7 +211,8 @@ class TreeWriter {
                  : nullptr;
     }
     // A tree that holds itself ends here too.
-    if (above == kMaxPropertyListDepth) return refuse("the tree is " + TooDeeplyNested());
+    if (above == kMaxPropertyListDepth)
+      return refuse(FormatText("the tree is %s", TooDeeplyNested()));
     if (const Array* array = value.asArray()) return arrayNode(*array, above);
     return dictionaryNode(*value.asDictionary(), above);
   }
@@ -192,7 +230,7 @@ class TreeWriter {
       content_ += size;
       return true;
     }
-    error_ = "more than " + std::to_string(kMaxPropertyListContentBytes) + " bytes of content";
+    error_ = TooMuchContent();
     return false;
   }
 
@@ -224,13 +262,21 @@ class TreeWriter {
   }
 
   Node dictionaryNode(const Dictionary& dictionary, std::size_t above) {
-    Node node(plist_new_dict());
+    // Of keys that repair makes the same, the last one's value stays.
+    std::map<std::string, const PropertyValue*> entries;
     for (const auto& [key, value] : dictionary) {
       if (!takeContent(key.size())) return nullptr;
-      Node child = toNode(value, above + 1);
+      entries.insert_or_assign(AsWritten(key), &value);
+    }
+    Node node(plist_new_dict());
+    for (const auto& [key, value] : entries) {
+      Node child = toNode(*value, above + 1);
       if (child == nullptr) return nullptr;
-      // Of keys that repair makes the same, the last one's value stays.
-      plist_dict_set_item(node.get(), AsWritten(key).c_str(), child.release());
+      // libplist hashes a key so that anyone can make many collide, which takes quadratic time. An
+      // entry goes in under a number that no repaired key can be, and is then given its name.
+      const plist_t entry = child.release();
+      plist_dict_set_item(node.get(), FormatText("\x01%llu", values_).c_str(), entry);
+      plist_set_key_val(plist_dict_item_get_key(entry), key.c_str());
     }
     return node;
   }
@@ -241,7 +287,7 @@ class TreeWriter {
 };
 
 std::string TooLarge() {
-  return "the document is larger than " + std::to_string(kMaxPropertyListBytes) + " bytes";
+  return FormatText("the document is larger than %llu bytes", kMaxPropertyListBytes);
 }
 
 }  // namespace
@@ -249,8 +295,9 @@ std::string TooLarge() {
 PropertyListResult ReadPropertyList(std::string_view bytes) {
   if (bytes.empty()) return PropertyListError{"the document is empty"};
   if (bytes.size() > kMaxPropertyListBytes) return PropertyListError{TooLarge()};
+  const bool isBinary = bytes.starts_with(kBinaryMagic);
   Node node;
-  if (bytes.starts_with(kBinaryMagic)) {
+  if (isBinary) {
     const auto wrong = CheckBinaryPropertyList(std::as_bytes(std::span(bytes)));
     if (wrong) return PropertyListError{*wrong};
     plist_t parsed = nullptr;
@@ -261,7 +308,7 @@ PropertyListResult ReadPropertyList(std::string_view bytes) {
     if (const auto wrong = CheckXmlPropertyList(bytes, &plain)) return PropertyListError{*wrong};
     node = ParseXml(plain);
   }
-  auto value = node == nullptr ? std::nullopt : FromNode(node.get());
+  auto value = node == nullptr ? std::nullopt : TreeReader(!isBinary).value(node.get());
   if (!value) return PropertyListError{"the document cannot be parsed"};
   return *std::move(value);
 }

@@ -12,6 +12,7 @@
 #include "values/byte_reader.h"
 #include "values/property_list.h"
 #include "values/property_list_check.h"
+#include "values/text.h"
 
 namespace quorlet {
 namespace {
@@ -46,7 +47,7 @@ class BinaryChecker {
     return false;
   }
   bool fail(std::size_t object, std::string_view what) {
-    return fail("object " + std::to_string(object) + " " + std::string(what));
+    return fail(FormatText("object %llu %s", object, what));
   }
 
   bool readTrailer() {
@@ -64,7 +65,7 @@ class BinaryChecker {
       return fail("the trailer holds impossible sizes");
     }
     if (objects > kMaxPropertyListValues) {
-      return fail("more than " + std::to_string(kMaxPropertyListValues) + " objects");
+      return fail(FormatText("more than %llu objects", kMaxPropertyListValues));
     }
     if (table < kHeaderSize || table > end || objects * offsetWidth_ > end - table) {
       return fail("the offset table lies outside of the document");
@@ -99,7 +100,8 @@ class BinaryChecker {
       memo.state = State::kDone;
     }
     // One that was read before may be reached deeper down here.
-    return above + memo.height <= kMaxPropertyListDepth || fail(object, "is " + TooDeeplyNested());
+    return above + memo.height <= kMaxPropertyListDepth ||
+           fail(object, FormatText("is %s", TooDeeplyNested()));
   }
 
   bool readObject(std::size_t object, Memo& memo, std::size_t above) {
@@ -172,7 +174,7 @@ class BinaryChecker {
     const auto content = reader.take(static_cast<std::size_t>(count) * unit);
     memo.content = content.size();
     seenContent_ += content.size();
-    if (seenContent_ > kMaxPropertyListContentBytes) return failTooLarge();
+    if (seenContent_ > kMaxPropertyListContentBytes) return fail(TooMuchContent());
     for (std::size_t i = 0; memo.isString && i < content.size(); i += unit) {
       const auto character = content.subspan(i, unit);
       if (std::ranges::all_of(character, [](std::byte b) { return b == std::byte{0}; })) {
@@ -180,10 +182,6 @@ class BinaryChecker {
       }
     }
     return true;
-  }
-
-  bool failTooLarge() {
-    return fail("more than " + std::to_string(kMaxPropertyListContentBytes) + " bytes of content");
   }
 
   bool readContainer(std::size_t object, Memo& memo, ByteReader& reader, unsigned marker,
@@ -195,7 +193,7 @@ class BinaryChecker {
     seenValues_ += count;
     if (seenValues_ > kMaxPropertyListValues) return fail(TooManyValues());
     memo.height = 1;
-    if (above == kMaxPropertyListDepth) return fail(object, "is " + TooDeeplyNested());
+    if (above == kMaxPropertyListDepth) return fail(object, FormatText("is %s", TooDeeplyNested()));
     for (std::uint64_t i = 0; i < count * keys; ++i) {
       if (!readElement(object, memo, reader, above, true)) return false;
     }
@@ -220,7 +218,7 @@ class BinaryChecker {
     memo.content += element.content;
     if (!isKey) memo.values += element.values;
     if (memo.values > kMaxPropertyListValues) return fail(TooManyValues());
-    return memo.content <= kMaxPropertyListContentBytes || failTooLarge();
+    return memo.content <= kMaxPropertyListContentBytes || fail(TooMuchContent());
   }
 
   std::span<const std::byte> document_;

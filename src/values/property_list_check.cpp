@@ -47,8 +47,6 @@ constexpr auto kElements = std::to_array<Element>({
 });
 // clang-format on
 
-std::string Bracketed(std::string_view name) { return "<" + std::string(name) + ">"; }
-
 // Every step gives false once something is wrong, and `error` says what.
 class XmlChecker {
  public:
@@ -74,7 +72,7 @@ class XmlChecker {
 
   bool fail(std::size_t at, std::string_view what) {
     const auto line = 1 + std::ranges::count(text_.substr(0, at), '\n');
-    error_ = "line " + std::to_string(line) + ": " + std::string(what);
+    error_ = FormatText("line %llu: %s", line, what);
     return false;
   }
   bool fail(std::string_view what) { return fail(at_, what); }
@@ -89,7 +87,7 @@ class XmlChecker {
     const std::size_t first = at_ + skip;
     const std::size_t found = text_.find(end, first);
     if (found == std::string_view::npos) {
-      return fail("the document ends inside " + std::string(construct));
+      return fail(FormatText("the document ends inside %s", construct));
     }
     if (content != nullptr) *content = text_.substr(first, found - first);
     at_ = found + end.size();
@@ -184,7 +182,8 @@ class XmlChecker {
     if (end == std::string_view::npos || text_[end] != ';') return fail("an & that names nothing");
     const auto character = XmlReference(text_.substr(start + 1, end - start - 1));
     if (!character) {
-      return fail(QuotedExcerpt(text_.substr(start, end - start + 1)) + " names no character");
+      return fail(
+          FormatText("%s names no character", QuotedExcerpt(text_.substr(start, end - start + 1))));
     }
     out += *character;
     at_ = end + 1;
@@ -198,7 +197,7 @@ class XmlChecker {
       out += text_.substr(at_, plain - at_);
       at_ = plain;
       std::string_view section;
-      if (atEnd()) return fail("the document ends inside " + Bracketed(element.name));
+      if (atEnd()) return fail(FormatText("the document ends inside <%s>", element.name));
       if (nextIs("&")) {
         if (!readReference(out)) return false;
       } else if (nextIs("<![CDATA[")) {
@@ -211,22 +210,22 @@ class XmlChecker {
         Tag tag;
         if (!readTag(tag)) return false;
         if (tag.closes && tag.name == element.name && !tag.hasAttributes) return true;
-        return fail(start, Bracketed((tag.closes ? "/" : "") + std::string(tag.name)) + " inside " +
-                               Bracketed(element.name));
+        return fail(
+            start, FormatText("<%s%s> inside <%s>", tag.closes ? "/" : "", tag.name, element.name));
       }
     }
   }
 
   // Whether a value or key of this kind may come next in `parent`.
   bool checkPlace(const Open& parent, const Element& element, std::size_t at) {
-    const std::string name = Bracketed(element.name);
     if (element.role == Role::kRoot) return fail(at, "<plist> inside <plist>");
     const bool keyExpected = parent.element->role == Role::kDictionary && !parent.keyPending;
     if (keyExpected != (element.role == Role::kKey)) {
-      return fail(at, name + " where " + (keyExpected ? "<key>" : "a value") + " belongs");
+      return fail(
+          at, FormatText("<%s> where %s belongs", element.name, keyExpected ? "<key>" : "a value"));
     }
     if (parent.element->role == Role::kRoot && parent.values > 0) {
-      return fail(at, name + ": a second value inside <plist>");
+      return fail(at, FormatText("<%s>: a second value inside <plist>", element.name));
     }
     return true;
   }
@@ -236,32 +235,35 @@ class XmlChecker {
     std::string content;
     if (!tag.isEmpty && !readText(element, content)) return false;
     const auto refuse = [&](std::string_view expected) {
-      return fail(at, Bracketed(element.name) + " holds " + QuotedExcerpt(content) +
-                          ", which is not " + std::string(expected));
+      return fail(at, FormatText("<%s> holds %s, which is not %s", element.name,
+                                 QuotedExcerpt(content), expected));
     };
     if (element.role == Role::kFlag) {
-      plain_ += "<" + std::string(element.name) + "/>";
+      plain_ += FormatText("<%s/>", element.name);
       return Trimmed(content).empty() || refuse("empty");
     }
     const bool isText = element.plain == nullptr;
     const auto plain = isText ? SectionedXml(content) : element.plain(Trimmed(content));
     if (!plain) return refuse(element.expected);
-    emit(element, *plain);
+    emit(element.role == Role::kKey ? "string" : element.name, *plain);
     return true;
   }
 
-  void emit(const Element& element, const std::string& content) {
-    plain_ += Bracketed(element.name);
+  void emit(std::string_view name, const std::string& content) {
+    plain_ += '<';
+    plain_ += name;
+    plain_ += '>';
     plain_ += content;
     plain_ += "</";
-    plain_ += element.name;
+    plain_ += name;
     plain_ += '>';
   }
 
   bool openElement(const Tag& tag, std::size_t at) {
     const auto* const element = std::ranges::find(kElements, tag.name, &Element::name);
-    if (element == kElements.end()) return fail(at, "unknown element " + QuotedExcerpt(tag.name));
-    if (tag.hasAttributes) return fail(at, Bracketed(tag.name) + " has attributes");
+    if (element == kElements.end())
+      return fail(at, FormatText("unknown element %s", QuotedExcerpt(tag.name)));
+    if (tag.hasAttributes) return fail(at, FormatText("<%s> has attributes", tag.name));
     Open& parent = open_.back();
     if (!checkPlace(parent, *element, at)) return false;
     parent.keyPending = element->role == Role::kKey;
@@ -274,10 +276,10 @@ class XmlChecker {
     }
     // <plist> is open beside the containers.
     if (open_.size() > kMaxPropertyListDepth) return fail(at, TooDeeplyNested());
+    plain_ += element->role == Role::kDictionary ? "<array><true/>" : "<array><false/>";
     if (tag.isEmpty) {
-      emit(*element, "");
+      plain_ += "</array>";
     } else {
-      plain_ += Bracketed(element->name);
       open_.push_back({element});
     }
     return true;
@@ -286,13 +288,13 @@ class XmlChecker {
   bool closeElement(const Tag& tag, std::size_t at) {
     const Open& open = open_.back();
     if (tag.name != open.element->name || tag.hasAttributes) {
-      return fail(at, "</" + std::string(tag.name) + "> inside " + Bracketed(open.element->name));
+      return fail(at, FormatText("</%s> inside <%s>", tag.name, open.element->name));
     }
     if (open.keyPending) return fail(at, "the last <key> of <dict> has no value");
     if (open.element->role == Role::kRoot && open.values == 0) {
       return fail(at, "<plist> holds no value");
     }
-    plain_ += "</" + std::string(tag.name) + ">";
+    plain_ += open.element->role == Role::kRoot ? "</plist>" : "</array>";
     open_.pop_back();
     return true;
   }
@@ -320,8 +322,8 @@ class XmlChecker {
   bool readNextTag() {
     if (!skipBetweenElements()) return false;
     const std::string_view inside = open_.back().element->name;
-    if (atEnd()) return fail("the document ends inside " + Bracketed(inside));
-    if (!nextIs("<")) return fail("text inside " + Bracketed(inside));
+    if (atEnd()) return fail(FormatText("the document ends inside <%s>", inside));
+    if (!nextIs("<")) return fail(FormatText("text inside <%s>", inside));
     const std::size_t at = at_;
     Tag tag;
     if (!readTag(tag)) return false;
@@ -339,11 +341,13 @@ class XmlChecker {
 }  // namespace
 
 std::string TooDeeplyNested() {
-  return "nested more than " + std::to_string(kMaxPropertyListDepth) + " deep";
+  return FormatText("nested more than %llu deep", kMaxPropertyListDepth);
 }
 
-std::string TooManyValues() {
-  return "more than " + std::to_string(kMaxPropertyListValues) + " values";
+std::string TooManyValues() { return FormatText("more than %llu values", kMaxPropertyListValues); }
+
+std::string TooMuchContent() {
+  return FormatText("more than %llu bytes of content", kMaxPropertyListContentBytes);
 }
 
 std::optional<std::string> CheckXmlPropertyList(std::string_view document, std::string* plain) {

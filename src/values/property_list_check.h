@@ -12,9 +12,12 @@
 namespace quorlet {
 
 // nullopt when `document` is a good XML property list, otherwise why it is not: "line 3: <integer>
-// holds "abc", which is not a 64-bit integer". With `plain`, that becomes the same document in its
-// plainest form (no prolog, comments, entities or blanks between elements, every number in one
-// spelling), in which no two parsers can see different things; it is unspecified on failure.
+// holds "abc", which is not a 64-bit integer". With `plain`, that becomes the same content in a
+// form that leaves a parser nothing to interpret (it is unspecified on failure):
+// - no prolog, comments, entities or blanks between elements, and one spelling for every number;
+// - an array starts with <false/>; a dictionary is an array that starts with <true/> and goes on
+//   with its keys, as strings, each before its value. (libplist's dictionaries find a key by a hash
+//   that anyone can make collide: a document of a few MB would take it hours.)
 std::optional<std::string> CheckXmlPropertyList(std::string_view document,
                                                 std::string* plain = nullptr);
 
@@ -26,6 +29,7 @@ std::optional<std::string> CheckBinaryPropertyList(std::span<const std::byte> do
 // What every reader and writer says of a tree beyond the limits.
 std::string TooDeeplyNested();
 std::string TooManyValues();
+std::string TooMuchContent();
 
 }  // namespace quorlet
 

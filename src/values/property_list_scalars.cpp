@@ -69,7 +69,7 @@ std::optional<std::string> PlainInteger(std::string_view text) {
   const auto [stopped, error] = std::from_chars(text.data(), end, magnitude, hexadecimal ? 16 : 10);
   if (error != std::errc() || stopped != end) return std::nullopt;
   if (negative && magnitude > std::uint64_t{1} << 63) return std::nullopt;
-  return (negative ? "-" : "") + std::to_string(magnitude);
+  return FormatText("%s%llu", negative ? "-" : "", magnitude);
 }
 
 std::optional<std::string> PlainReal(std::string_view text) {
@@ -178,7 +178,8 @@ std::string QuotedExcerpt(std::string_view text) {
   std::string_view shown = text.substr(0, kMost);
   // A character that was cut in two goes.
   if (text.size() > kMost) shown = shown.substr(0, ValidUtf8Prefix(shown));
-  std::string out = "\"" + RepairUtf8(shown) + (shown.size() < text.size() ? "…\"" : "\"");
+  std::string out =
+      FormatText("\"%s%s\"", RepairUtf8(shown), shown.size() < text.size() ? "…" : "");
   for (char& c : out) {
     if (static_cast<unsigned char>(c) < 0x20 || c == 0x7F) c = ' ';
   }

@@ -55,7 +55,7 @@ std::string Describe(const Number& number) {
 }
 
 std::string Describe(const Data& data) {
-  std::string out = "{length = " + std::to_string(data.size()) + ", bytes = 0x";
+  std::string out = FormatText("{length = %llu, bytes = 0x", data.size());
   const std::size_t shown = std::min(data.size(), kMaxDescribedBytes);
   for (std::size_t i = 0; i < shown; ++i) AppendHex(out, data[i]);
   if (shown < data.size()) out += "...";

@@ -5,6 +5,7 @@
 #include <algorithm>
 #include <cmath>
 #include <cstdint>
+#include <ctime>
 #include <limits>
 #include <vector>
 
@@ -272,7 +273,8 @@ TEST(Writer, ValuesSurviveARoundTrip) {
       Array{Date{-2208988800}, Date{-1169176449}, Date{-1}, Date{978307200}, Date{1772600767},
             Date{3125790847}, Date{3125790848}, Date{4102444800}, Date{-62135596800},
             Date{253402300799}},
-      Dictionary{{"", "<&>\"' ]]> \t\n\r \U0001F600 "}, {"a&b<c>", Dictionary{{" k ", "  "}}}},
+      Dictionary{{"CF$UID", Int32(5)}},
+      Dictionary{{"", "<&]]>\"']]> \t\n\r \U0001F600 "}, {"a&b<c>", Dictionary{{" k ", "  "}}}},
   };
   for (const PropertyValue& value : cases) EXPECT_TRUE(Reads(Written(value), value));
   const auto nan = ReadPropertyList(Written(Double(NAN)));
@@ -286,6 +288,24 @@ TEST(Writer, WritesOnlyWhatXmlHolds) {
   EXPECT_TRUE(
       Reads(Written(Array{Date{1.75}, Date{-0.5}, Date{NAN}, Date{kInfinity}, Date{-1e300}}),
             Array{Date{1}, Date{-1}, Date{0}, Date{253402300799}, Date{-62135596800}}));
+}
+
+TEST(ReaderAndWriter, TakeLittleTimeForHostileKeysAndTexts) {
+  // "Ez" and "FY" are alike to the hash of libplist's dictionaries.
+  Dictionary tree;
+  for (unsigned i = 0; i < 30'000; ++i) {
+    std::string key;
+    for (unsigned bit = 0; bit < 15; ++bit) key += (i >> bit & 1) == 0 ? "Ez" : "FY";
+    tree[key] = true;
+  }
+  // Its entities are slow as well.
+  constexpr std::size_t kEntities = 500'000;
+  std::string entities;
+  for (std::size_t i = 0; i < kEntities; ++i) entities += "&amp;";
+  const std::clock_t start = std::clock();
+  EXPECT_TRUE(Reads(Written(tree), tree));
+  EXPECT_TRUE(Reads(Xml("<string>" + entities + "</string>"), std::string(kEntities, '&')));
+  EXPECT_LT((std::clock() - start) / CLOCKS_PER_SEC, 10) << "seconds of processor time";
 }
 
 TEST(Writer, RefusesWhatIsTooDeepOrTooLarge) {
