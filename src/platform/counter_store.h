@@ -1,0 +1,148 @@
+// The aggregate-counter store: one value for each scalar key and day, and for each distribution key
+// and day the sequence of values recorded.
+//
+// Day numbers count days since 1970-01-01 UTC. Keys are byte strings.
+#ifndef QUORLET_PLATFORM_COUNTER_STORE_H_
+#define QUORLET_PLATFORM_COUNTER_STORE_H_
+
+#include <cstdint>
+#include <functional>
+#include <memory>
+#include <span>
+#include <string>
+#include <string_view>
+#include <vector>
+
+#include "values/property_value.h"
+
+namespace quorlet {
+
+// One recorded value of a distribution.
+struct DistributionSample {
+  double value = 0;
+  std::int32_t secondsInDay = 0;
+  bool operator==(const DistributionSample&) const = default;
+};
+
+// Walks the values of one distribution row in the order in which they were recorded. Valid during
+// the row handler's call only.
+class TLHistoryDistributionEnumerator {
+ public:
+  virtual ~TLHistoryDistributionEnumerator() = default;
+
+  // Writes the next value and the second of the day at which it was recorded, or returns false
+  // when there are no more.
+  bool getNextValueSecondsInDayOffset(double& value, std::int32_t& secondsInDay) {
+    if (position_ == block_.size()) {
+      block_ = nextBlock();
+      position_ = 0;
+      if (block_.empty()) return false;
+    }
+    value = block_[position_].value;
+    secondsInDay = block_[position_].secondsInDay;
+    ++position_;
+    return true;
+  }
+
+ protected:
+  // The next samples, empty at the end; the enumerator owns them until the next call.
+  virtual std::span<const DistributionSample> nextBlock() = 0;
+
+ private:
+  std::span<const DistributionSample> block_;
+  std::size_t position_ = 0;
+};
+
+// The recorded past. Both enumerations call `rowHandler` for each row whose key starts with
+// `keyPrefix` (bytewise) and whose day d satisfies minDay < d <= maxDay, ordered by key (bytewise),
+// then day, before they return; the handler sets `stop` to end the enumeration. A store that turns
+// out to be damaged ends the enumeration early.
+class TLHistory {
+ public:
+  using ScalarHandler =
+      std::function<void(std::string_view key, std::int32_t day, std::int64_t value, bool& stop)>;
+  using DistributionHandler = std::function<void(
+      std::string_view key, std::int32_t day, TLHistoryDistributionEnumerator& values, bool& stop)>;
+
+  virtual ~TLHistory() = default;
+
+  virtual void scalarsForKeyPrefixMinDaysSince1970MaxDaysSince1970RowHandler(
+      std::string_view keyPrefix, std::int32_t minDay, std::int32_t maxDay,
+      const ScalarHandler& rowHandler) = 0;
+
+  virtual void distributionsForKeyPrefixMinDaysSince1970MaxDaysSince1970RowHandler(
+      std::string_view keyPrefix, std::int32_t minDay, std::int32_t maxDay,
+      const DistributionHandler& rowHandler) = 0;
+};
+
+// One change of today's value of a scalar key.
+struct ScalarChange {
+  enum class Kind { kSet, kAdd };
+  Kind kind;
+  std::string key;
+  std::int64_t value;
+};
+
+class CounterStore {
+ public:
+  virtual ~CounterStore() = default;
+
+  // Today's day number.
+  virtual std::int32_t TLDaysSince1970() = 0;
+
+  // The instant at which `day` starts.
+  virtual Date dateForDaysSince1970(std::int32_t day) = 0;
+
+  // Makes everything recorded so far durable and drops rows older than 30 days.
+  virtual void TLClientCheckpoint() = 0;
+
+  // Sets, or adds to (saturating), today's value of the key. A failure leaves one error line.
+  virtual void TLClientSetValueForScalarKey(std::string_view key, std::int64_t value) = 0;
+  virtual void TLClientAddValueForScalarKey(std::string_view key, std::int64_t value) = 0;
+
+  // Makes all changes in order and at once: in one short transaction, where the store has them. A
+  // failure leaves one error line, and none of them is made.
+  virtual void writeScalars(std::span<const ScalarChange> changes) {
+    for (const ScalarChange& change : changes) {
+      if (change.kind == ScalarChange::Kind::kSet) {
+        TLClientSetValueForScalarKey(change.key, change.value);
+      } else {
+        TLClientAddValueForScalarKey(change.key, change.value);
+      }
+    }
+  }
+
+  // A reader on the store's default location, or nullptr when it cannot be opened.
+  virtual std::unique_ptr<TLHistory> initWithDefaultPath() = 0;
+};
+
+// Collects changes and hands them to the store together, so that writers with many values hold its
+// lock once and briefly. For one thread.
+class CounterBatch {
+ public:
+  explicit CounterBatch(CounterStore& store) : store_(store) {}
+  CounterBatch(const CounterBatch&) = delete;
+  CounterBatch& operator=(const CounterBatch&) = delete;
+  // What has not been committed is dropped.
+  ~CounterBatch() = default;
+
+  void TLClientSetValueForScalarKey(std::string_view key, std::int64_t value) {
+    changes_.push_back({ScalarChange::Kind::kSet, std::string(key), value});
+  }
+  void TLClientAddValueForScalarKey(std::string_view key, std::int64_t value) {
+    changes_.push_back({ScalarChange::Kind::kAdd, std::string(key), value});
+  }
+  // Writes what was collected; the batch is empty afterwards.
+  void commit() {
+    if (!changes_.empty()) store_.writeScalars(changes_);
+    changes_.clear();
+  }
+
+ private:
+  CounterStore& store_;
+  std::vector<ScalarChange> changes_;
+};
+
+}  // namespace quorlet
+
+#endif  // QUORLET_PLATFORM_COUNTER_STORE_H_

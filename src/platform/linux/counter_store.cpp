@@ -1,0 +1,52 @@
+#include "platform/linux/counter_store.h"
+
+#include <algorithm>
+#include <cmath>
+
+namespace quorlet {
+namespace {
+
+constexpr double kSecondsPerDay = 86400;
+constexpr std::int32_t kDaysKept = 30;
+// Whatever the clock says, days can be counted on from today.
+constexpr double kFarthestDay = 1 << 30;
+
+// Failures are the ledger's to log.
+class LinuxCounterStore : public CounterStore {
+ public:
+  LinuxCounterStore(TallyLedger& ledger, Clock& clock) : ledger_(ledger), clock_(clock) {}
+
+  std::int32_t TLDaysSince1970() override {
+    const double day = std::floor(clock_.now().secondsSince1970 / kSecondsPerDay);
+    return static_cast<std::int32_t>(std::clamp(day, -kFarthestDay, kFarthestDay));
+  }
+
+  Date dateForDaysSince1970(std::int32_t day) override { return {day * kSecondsPerDay}; }
+
+  // Every write is committed before it returns, so only the old rows are left to do.
+  void TLClientCheckpoint() override {
+    static_cast<void>(ledger_.dropDaysBefore(TLDaysSince1970() - kDaysKept));
+  }
+
+  void TLClientSetValueForScalarKey(std::string_view key, std::int64_t value) override {
+    static_cast<void>(ledger_.setScalar(key, TLDaysSince1970(), value));
+  }
+
+  void TLClientAddValueForScalarKey(std::string_view key, std::int64_t value) override {
+    static_cast<void>(ledger_.addToScalar(key, TLDaysSince1970(), value));
+  }
+
+  std::unique_ptr<TLHistory> initWithDefaultPath() override { return ledger_.openHistory(); }
+
+ private:
+  TallyLedger& ledger_;
+  Clock& clock_;
+};
+
+}  // namespace
+
+std::unique_ptr<CounterStore> MakeLinuxCounterStore(TallyLedger& ledger, Clock& clock) {
+  return std::make_unique<LinuxCounterStore>(ledger, clock);
+}
+
+}  // namespace quorlet

@@ -1,0 +1,18 @@
+// The counter store on a TallyLedger.
+#ifndef QUORLET_PLATFORM_LINUX_COUNTER_STORE_H_
+#define QUORLET_PLATFORM_LINUX_COUNTER_STORE_H_
+
+#include <memory>
+
+#include "platform/clock.h"
+#include "platform/counter_store.h"
+#include "platform/linux/tally_ledger.h"
+
+namespace quorlet {
+
+// `ledger` and `clock` must outlive the store.
+std::unique_ptr<CounterStore> MakeLinuxCounterStore(TallyLedger& ledger, Clock& clock);
+
+}  // namespace quorlet
+
+#endif  // QUORLET_PLATFORM_LINUX_COUNTER_STORE_H_

@@ -1,0 +1,220 @@
+// Logs for submission: files in /var/mobile/Library/Logs/Diagwell.
+//
+// pending/<log name>-<UTC yyyymmddThhmmssZ>-<n>.log is one line of JSON (type, name, created,
+// os_version and, when given, metadata), then the body to the end of the file. Submitting moves the
+// files to outbox/. Names in both are given, counted and removed with ".lock" held; hidden names
+// are nobody's logs.
+#include "platform/diagnostics.h"
+
+#include <sys/stat.h>
+#include <unistd.h>
+
+#include <algorithm>
+#include <cerrno>
+#include <cstdio>
+#include <tuple>
+#include <vector>
+
+#include "platform/linux/descriptor.h"
+#include "platform/linux/property_json.h"
+#include "platform/linux/services.h"
+
+namespace quorlet {
+namespace {
+
+constexpr char kDirectory[] = "/var/mobile/Library/Logs/Diagwell";
+constexpr std::uint64_t kQuotaBytes = 64UL << 20;  // of both directories together
+
+// A log on disk.
+struct StoredLog {
+  std::int64_t seconds = 0;  // last modified
+  std::int64_t nanoseconds = 0;
+  std::string name;
+  std::string path;
+  std::uint64_t size = 0;
+  auto age() const { return std::tie(seconds, nanoseconds, name); }
+};
+
+std::vector<StoredLog> LogsIn(const std::string& directory) {
+  std::vector<StoredLog> logs;
+  for (const std::string& name : ListDirectory(directory)) {
+    const std::string path = JoinPath(directory, name);
+    struct stat status = {};
+    if (name.starts_with('.') || lstat(path.c_str(), &status) != 0) continue;
+    if (S_ISDIR(status.st_mode)) continue;
+    logs.push_back({status.st_mtim.tv_sec, status.st_mtim.tv_nsec, name, path,
+                    static_cast<std::uint64_t>(std::max<off_t>(status.st_size, 0))});
+  }
+  return logs;
+}
+
+// "20260304T050607Z"
+std::string FileNameTime(Date date) {
+  std::string text = Rfc3339(date);
+  std::erase_if(text, [](char c) { return c == '-' || c == ':'; });
+  return text;
+}
+
+bool Exists(const std::string& path) {
+  struct stat status = {};
+  return lstat(path.c_str(), &status) == 0;
+}
+
+// The body's way into the file; remembers why it failed and refuses what no quota could hold.
+class FileOutput : public LogOutput {
+ public:
+  explicit FileOutput(AtomicFile& file) : file_(file) {}
+
+  bool write(std::string_view bytes) override {
+    if (error_ == 0) error_ = bytes.size() > kQuotaBytes - size_ ? EFBIG : file_.write(bytes);
+    if (error_ != 0) return false;
+    size_ += bytes.size();
+    return true;
+  }
+  int error() const { return error_; }
+  std::uint64_t size() const { return size_; }
+
+ private:
+  AtomicFile& file_;
+  std::uint64_t size_ = 0;
+  int error_ = 0;
+};
+
+class LinuxDiagnostics : public Diagnostics {
+ public:
+  LinuxDiagnostics(const Root& root, Access access, Clock& clock, Preferences& preferences,
+                   OSVersion& osVersion, SystemLog& log)
+      : directory_(root.path(kDirectory)),
+        pending_(directory_ + "/pending"),
+        outbox_(directory_ + "/outbox"),
+        access_(access),
+        clock_(clock),
+        preferences_(preferences),
+        osVersion_(osVersion),
+        log_(log) {}
+
+  bool DiagnosticLogSubmissionEnabled() override {
+    bool found = false;
+    return preferences_.DGWPreferencesGetBoolValue("SubmissionEnabled", "nuvex.diagwell", found);
+  }
+
+  std::string DGWOSVersion() override { return OSVersionText(osVersion_); }
+
+  std::optional<PropertyValue> DGWGetDATaskingValue(std::string_view name) override {
+    return preferences_.DGWPreferencesGetValue(name, "nuvex.da");
+  }
+
+  bool DGWWriteLogForSubmission(std::string_view typeCode, std::string_view name,
+                                const std::optional<Dictionary>& metadata,
+                                const LogWriter& writer) override {
+    std::string reason;
+    if (!IsSafeName(name)) {
+      reason = "the name is refused";
+    } else if (access_ == Access::kReadOnly) {
+      reason = "no file may be changed";
+    } else {
+      reason = writeLog(typeCode, name, metadata, writer);
+    }
+    if (!reason.empty()) log_.error("Cannot write the log %@: %@", name, reason);
+    return reason.empty();
+  }
+
+  void SubmitDiagnosticLogs() override {
+    if (access_ == Access::kReadOnly || LogsIn(pending_).empty()) return;
+    const FileLock lock(lockPath());
+    const int error = lock.error() != 0 ? lock.error() : MakeDirectories(outbox_);
+    if (error != 0) {
+      log_.error("Cannot submit the logs in %@: %@", pending_, ErrnoText(error));
+      return;
+    }
+    for (const StoredLog& log : LogsIn(pending_)) {
+      const std::string target = outbox_ + "/" + log.name;
+      // Names are new in both directories; a file of that name is not ours to replace.
+      const int moved = Exists(target)                                  ? EEXIST
+                        : rename(log.path.c_str(), target.c_str()) == 0 ? 0
+                                                                        : errno;
+      if (moved != 0) log_.error("Cannot submit the log %@: %@", log.name, ErrnoText(moved));
+    }
+    // The names arrive before they leave, whatever reaches the disk first.
+    if (SyncDirectory(outbox_) != 0 || SyncDirectory(pending_) != 0) {
+      log_.error("Cannot make the submitted logs in %@ durable", outbox_);
+    }
+  }
+
+ private:
+  std::string lockPath() const { return directory_ + "/.lock"; }
+
+  // Writes the log; returns why that failed, or nothing.
+  std::string writeLog(std::string_view typeCode, std::string_view name,
+                       const std::optional<Dictionary>& metadata, const LogWriter& writer) {
+    const Date created = clock_.now();
+    nlohmann::ordered_json header = {{"type", typeCode},
+                                     {"name", name},
+                                     {"created", Rfc3339(created)},
+                                     {"os_version", DGWOSVersion()}};
+    if (metadata) header["metadata"] = PropertyJson(*metadata);
+
+    AtomicFile file(pending_, name);
+    if (const int error = file.open()) return ErrnoText(error);
+    FileOutput output(file);
+    const bool written = output.write(JsonLine(header) + "\n") && writer(output);
+    if (output.error() != 0) return ErrnoText(output.error());
+    if (!written) return "its writer failed";
+
+    const FileLock lock(lockPath());
+    if (lock.error() != 0) return ErrnoText(lock.error());
+    if (!makeRoom(output.size())) return "there is no room for it";
+    const std::string fileName = newName(std::string(name) + "-" + FileNameTime(created) + "-");
+    if (const int error = file.publish(fileName)) {
+      unlink((pending_ + "/" + fileName).c_str());  // it may be there, but not durable
+      return ErrnoText(error);
+    }
+    return "";
+  }
+
+  // A name that is new in pending/ and in outbox/.
+  std::string newName(const std::string& stem) const {
+    for (std::uint64_t number = 1;; ++number) {
+      std::string name = stem + std::to_string(number) + ".log";
+      if (!Exists(pending_ + "/" + name) && !Exists(outbox_ + "/" + name)) return name;
+    }
+  }
+
+  // Removes the oldest logs until one of `size` bytes fits; false when it does not even then.
+  bool makeRoom(std::uint64_t size) {
+    std::vector<StoredLog> logs = LogsIn(pending_);
+    std::ranges::move(LogsIn(outbox_), std::back_inserter(logs));
+    std::ranges::sort(logs, {}, &StoredLog::age);
+    std::uint64_t total = size;
+    for (const StoredLog& log : logs) total += log.size;
+    for (const StoredLog& log : logs) {
+      if (total <= kQuotaBytes) break;
+      if (unlink(log.path.c_str()) != 0) {
+        log_.error("Cannot remove the old log %@: %@", log.path, ErrnoText(errno));
+        continue;
+      }
+      log_.info("Removed the old log %@ to make room", log.path);
+      total -= log.size;
+    }
+    return total <= kQuotaBytes;
+  }
+
+  const std::string directory_;
+  const std::string pending_;
+  const std::string outbox_;
+  const Access access_;
+  Clock& clock_;
+  Preferences& preferences_;
+  OSVersion& osVersion_;
+  SystemLog& log_;
+};
+
+}  // namespace
+
+std::unique_ptr<Diagnostics> MakeLinuxDiagnostics(const Root& root, Access access, Clock& clock,
+                                                  Preferences& preferences, OSVersion& osVersion,
+                                                  SystemLog& log) {
+  return std::make_unique<LinuxDiagnostics>(root, access, clock, preferences, osVersion, log);
+}
+
+}  // namespace quorlet

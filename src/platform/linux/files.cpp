@@ -1,0 +1,227 @@
+#include "platform/linux/files.h"
+
+#include <dirent.h>
+#include <stdlib.h>
+#include <sys/file.h>
+
+#include <algorithm>
+#include <memory>
+#include <system_error>
+#include <utility>
+
+#include "platform/linux/descriptor.h"
+
+namespace quorlet {
+namespace {
+
+constexpr mode_t kDirectoryMode = 0750;
+constexpr mode_t kFileMode = 0640;
+constexpr std::size_t kReadStep = 65536;
+
+std::string ParentDirectory(const std::string& path) {
+  const std::size_t nameEnd = path.find_last_not_of('/');
+  if (nameEnd == std::string::npos) return "/";
+  const std::size_t slash = path.rfind('/', nameEnd);
+  if (slash == std::string::npos) return ".";
+  const std::size_t parentEnd = path.find_last_not_of('/', slash);
+  return parentEnd == std::string::npos ? "/" : path.substr(0, parentEnd + 1);
+}
+
+std::string FileName(const std::string& path) { return path.substr(path.rfind('/') + 1); }
+
+bool IsDirectory(const std::string& path) {
+  struct stat status = {};
+  return stat(path.c_str(), &status) == 0 && S_ISDIR(status.st_mode);
+}
+
+// Whether `path` still names the open file.
+bool StillNames(const std::string& path, const struct stat& open) {
+  struct stat named = {};
+  return lstat(path.c_str(), &named) == 0 && named.st_dev == open.st_dev &&
+         named.st_ino == open.st_ino;
+}
+
+int OpenLocked(const std::string& path, Descriptor& opened, struct stat& status) {
+  if (const int error = OpenRegularFile(path, O_RDWR | O_CREAT | O_NOFOLLOW, opened, status)) {
+    return error;
+  }
+  return Uninterrupted([&] { return flock(opened.get(), LOCK_EX); }) == 0 ? 0 : errno;
+}
+
+}  // namespace
+
+int OpenRegularFile(const std::string& path, int flags, Descriptor& opened, struct stat& status) {
+  // O_NONBLOCK means nothing to a regular file; it keeps a FIFO from stopping the program.
+  const int allFlags = flags | O_CLOEXEC | O_NONBLOCK | O_NOCTTY;
+  Descriptor descriptor(Uninterrupted([&] { return open(path.c_str(), allFlags, kFileMode); }));
+  if (!descriptor.isOpen() || fstat(descriptor.get(), &status) != 0) return errno;
+  if (!S_ISREG(status.st_mode)) return S_ISDIR(status.st_mode) ? EISDIR : EINVAL;
+  opened = std::move(descriptor);
+  return 0;
+}
+
+int WriteFully(int descriptor, std::string_view bytes) {
+  while (!bytes.empty()) {
+    const ssize_t written =
+        Uninterrupted([&] { return write(descriptor, bytes.data(), bytes.size()); });
+    if (written < 0) return errno;
+    if (written == 0) return EIO;
+    bytes.remove_prefix(static_cast<std::size_t>(written));
+  }
+  return 0;
+}
+
+int SyncDirectory(const std::string& directory) {
+  const Descriptor descriptor(
+      Uninterrupted([&] { return open(directory.c_str(), O_RDONLY | O_DIRECTORY | O_CLOEXEC); }));
+  if (!descriptor.isOpen()) return errno;
+  if (fsync(descriptor.get()) == 0) return 0;
+  return errno == EINVAL ? 0 : errno;  // a file system that has nothing to sync
+}
+
+Root::Root(std::string_view directory) {
+  const std::size_t end = directory.find_last_not_of('/');
+  if (end != std::string_view::npos) prefix_ = directory.substr(0, end + 1);
+}
+
+Root Root::FromEnvironment() {
+  const char* directory = secure_getenv("QUORLET_ROOT");
+  return Root(directory != nullptr ? directory : "");
+}
+
+std::string Root::kernelPath(std::string_view absolutePath) const {
+  const std::string_view tree = absolutePath.substr(0, absolutePath.find('/', 1));
+  return IsDirectory(path(tree)) ? path(absolutePath) : std::string(absolutePath);
+}
+
+bool IsSafeName(std::string_view name) {
+  return !name.empty() && name.size() <= 200 && name.front() != '.' &&
+         std::ranges::none_of(name, [](char c) {
+           return c == '/' || static_cast<unsigned char>(c) < 0x20 || c == 0x7f;
+         });
+}
+
+int MakeDirectories(const std::string& directory) {
+  const char* path = directory.c_str();
+  if (mkdir(path, kDirectoryMode) != 0) {
+    if (errno == EEXIST) return IsDirectory(directory) ? 0 : ENOTDIR;
+    if (errno != ENOENT) return errno;
+    const std::string parent = ParentDirectory(directory);
+    if (parent.size() >= directory.size()) return ENOENT;
+    if (const int error = MakeDirectories(parent)) return error;
+    // Another process may have been faster.
+    if (mkdir(path, kDirectoryMode) != 0 && errno != EEXIST) return errno;
+  }
+  // What is made durable inside must not be lost with its directory; where the parent cannot even
+  // be read there is nothing to be done about it.
+  (void)SyncDirectory(ParentDirectory(directory));
+  return 0;
+}
+
+std::variant<std::string, int> ReadWholeFile(const std::string& path, std::size_t limit) {
+  limit = std::min(limit, std::string().max_size() / 2);  // so that nothing below wraps
+  Descriptor file;
+  struct stat status = {};
+  if (const int error = OpenRegularFile(path, O_RDONLY, file, status)) return error;
+  const auto announced = static_cast<std::size_t>(std::max<off_t>(status.st_size, 0));
+  if (announced > limit) return EFBIG;
+  // Files in /proc announce no size, and any file may have grown: read on to the end. One byte
+  // more than expected tells the end without another buffer.
+  std::string bytes;
+  std::size_t length = 0;
+  std::size_t step = announced == 0 ? kReadStep : announced + 1;
+  while (true) {
+    if (length > limit) return EFBIG;
+    bytes.resize(length + std::min(step, limit + 1 - length));
+    const ssize_t count = Uninterrupted(
+        [&] { return read(file.get(), bytes.data() + length, bytes.size() - length); });
+    if (count < 0) return errno;
+    if (count == 0) break;
+    length += static_cast<std::size_t>(count);
+    step = kReadStep;
+  }
+  bytes.resize(length);
+  return bytes;
+}
+
+AtomicFile::AtomicFile(std::string directory, std::string_view temporaryStem)
+    : directory_(std::move(directory)) {
+  if (IsSafeName(temporaryStem)) {
+    temporaryPath_ = directory_ + "/." + std::string(temporaryStem) + ".tmp";
+  }
+}
+
+AtomicFile::~AtomicFile() {
+  if (descriptor_ < 0) return;
+  unlink(temporaryPath_.c_str());  // while the lock is held: nobody else's file has this name
+  close(descriptor_);
+}
+
+int AtomicFile::open() {
+  if (temporaryPath_.empty() || descriptor_ >= 0) return EINVAL;
+  if (const int error = MakeDirectories(directory_)) return error;
+  while (true) {
+    Descriptor file;
+    struct stat status = {};
+    if (const int error = OpenLocked(temporaryPath_, file, status)) return error;
+    // Whoever held the lock before may have published or removed this very file.
+    if (!StillNames(temporaryPath_, status)) continue;
+    descriptor_ = file.release();
+    return Uninterrupted([&] { return ftruncate(descriptor_, 0); }) == 0 ? 0 : errno;
+  }
+}
+
+int AtomicFile::write(std::string_view bytes) {
+  return descriptor_ < 0 ? EBADF : WriteFully(descriptor_, bytes);
+}
+
+int AtomicFile::publish(const std::string& name) {
+  if (descriptor_ < 0) return EBADF;
+  if (Uninterrupted([&] { return fsync(descriptor_); }) != 0) return errno;
+  if (rename(temporaryPath_.c_str(), (directory_ + "/" + name).c_str()) != 0) return errno;
+  close(std::exchange(descriptor_, -1));
+  return SyncDirectory(directory_);
+}
+
+int WriteWholeFile(const std::string& path, std::string_view bytes) {
+  const std::string name = FileName(path);
+  AtomicFile file(ParentDirectory(path), name);
+  if (const int error = file.open()) return error;
+  if (const int error = file.write(bytes)) return error;
+  return file.publish(name);
+}
+
+FileLock::FileLock(const std::string& path) {
+  error_ = MakeDirectories(ParentDirectory(path));
+  if (error_ != 0) return;
+  Descriptor file;
+  struct stat status = {};
+  error_ = OpenLocked(path, file, status);
+  if (error_ == 0) descriptor_ = file.release();
+}
+
+FileLock::~FileLock() {
+  if (descriptor_ >= 0) close(descriptor_);
+}
+
+std::string JoinPath(const std::string& directory, std::string_view name) {
+  std::string path;
+  path.reserve(directory.size() + 1 + name.size());
+  return path.append(directory).append("/").append(name);
+}
+
+std::vector<std::string> ListDirectory(const std::string& directory) {
+  std::vector<std::string> names;
+  const std::unique_ptr<DIR, int (*)(DIR*)> stream(opendir(directory.c_str()), &closedir);
+  if (stream == nullptr) return names;
+  while (const dirent* entry = readdir(stream.get())) {
+    const std::string_view name = entry->d_name;
+    if (name != "." && name != "..") names.emplace_back(name);
+  }
+  std::ranges::sort(names);
+  return names;
+}
+
+std::string ErrnoText(int error) { return std::generic_category().message(error); }
+
+}  // namespace quorlet

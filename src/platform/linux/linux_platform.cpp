@@ -1,0 +1,90 @@
+#include "platform/linux/linux_platform.h"
+
+#include <stdlib.h>
+
+#include <utility>
+
+#include "platform/linux/counter_store.h"
+#include "platform/linux/named_service.h"
+#include "platform/linux/network_usage.h"
+#include "platform/linux/semaphores.h"
+#include "platform/linux/services.h"
+
+namespace quorlet {
+
+// Every service comes after those that it borrows, so destruction in reverse order is safe.
+struct LinuxPlatform::Services {
+  Services(Root givenRoot, Access access, std::unique_ptr<SystemLog> givenLog)
+      : root(std::move(givenRoot)),
+        log(givenLog ? std::move(givenLog) : MakeLinuxSystemLog(root, access, *clock)),
+        preferences(MakeLinuxPreferences(root, access, *log)),
+        deviceInfo(MakeLinuxDeviceInfo(root, *log)),
+        environment(MakeLinuxEnvironment(root, *deviceInfo, *log)),
+        queries(*deviceInfo, *environment, *log),
+        ledger(MakeTallyLedger(root, access, queries, *preferences, *log)),
+        counterStore(MakeLinuxCounterStore(*ledger, *clock)),
+        osVersion(MakeLinuxOSVersion(root, *log)),
+        diagnostics(MakeLinuxDiagnostics(root, access, *clock, *preferences, *osVersion, *log)),
+        crashSupport(MakeLinuxCrashSupport(root, access, *clock, *log)),
+        supportLibrary(MakeLinuxSupportLibrary()),
+        kernelParameters(MakeLinuxKernelParameters(root, access, *log)),
+        applications(MakeLinuxApplications(root)),
+        locale(MakeLinuxLocale(root, [](const char* name) { return getenv(name); })),
+        passLock(MakeLinuxPassLock(root, access, *log)),
+        namedService(MakeLinuxNamedService(root, *log)),
+        notifications(MakeLinuxNotifications(root, *log)),
+        networkUsage(MakeLinuxNetworkUsage(root, *log)) {}
+
+  const Root root;
+  const std::unique_ptr<Clock> clock = MakeLinuxClock();
+  const std::unique_ptr<SystemLog> log;
+  const std::unique_ptr<Preferences> preferences;
+  const std::unique_ptr<DeviceInfo> deviceInfo;
+  const std::unique_ptr<Environment> environment;
+  EnvironmentQueries queries;
+  const std::unique_ptr<TallyLedger> ledger;
+  const std::unique_ptr<CounterStore> counterStore;
+  const std::unique_ptr<OSVersion> osVersion;
+  const std::unique_ptr<Diagnostics> diagnostics;
+  const std::unique_ptr<CrashSupport> crashSupport;
+  const std::unique_ptr<SupportLibrary> supportLibrary;
+  const std::unique_ptr<KernelParameters> kernelParameters;
+  const std::unique_ptr<Applications> applications;
+  const std::unique_ptr<LocaleService> locale;
+  const std::unique_ptr<PassLock> passLock;
+  const std::unique_ptr<NamedService> namedService;
+  const std::unique_ptr<Notifications> notifications;
+  const std::unique_ptr<Semaphores> semaphores = MakeLinuxSemaphores();
+  // Last, so that it goes first: it waits for a reply that is being processed, which uses the rest.
+  const std::unique_ptr<NetworkUsage> networkUsage;
+  Platform bundle{.log = *log,
+                  .clock = *clock,
+                  .preferences = *preferences,
+                  .counterStore = *counterStore,
+                  .diagnostics = *diagnostics,
+                  .crashSupport = *crashSupport,
+                  .supportLibrary = *supportLibrary,
+                  .deviceInfo = *deviceInfo,
+                  .osVersion = *osVersion,
+                  .kernelParameters = *kernelParameters,
+                  .environment = *environment,
+                  .queries = queries,
+                  .applications = *applications,
+                  .locale = *locale,
+                  .passLock = *passLock,
+                  .namedService = *namedService,
+                  .notifications = *notifications,
+                  .networkUsage = *networkUsage,
+                  .semaphores = *semaphores};
+};
+
+LinuxPlatform::LinuxPlatform(Root root, Access access, std::unique_ptr<SystemLog> log)
+    : services_(std::make_unique<Services>(std::move(root), access, std::move(log))) {}
+
+LinuxPlatform::~LinuxPlatform() = default;
+
+Platform& LinuxPlatform::services() { return services_->bundle; }
+TallyLedger& LinuxPlatform::ledger() { return *services_->ledger; }
+const Root& LinuxPlatform::root() const { return services_->root; }
+
+}  // namespace quorlet

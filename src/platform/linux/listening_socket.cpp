@@ -1,0 +1,106 @@
+#include "platform/linux/listening_socket.h"
+
+#include <stdlib.h>
+#include <sys/stat.h>
+
+#include <charconv>
+#include <cstring>
+#include <string_view>
+
+#include "platform/linux/files.h"
+#include "platform/linux/unix_socket.h"
+
+namespace quorlet {
+namespace {
+
+constexpr int kFirstPassedDescriptor = 3;
+constexpr int kBacklog = 128;
+
+// The decimal number in an environment variable, or -1.
+long EnvironmentNumber(const char* name) {
+  const char* text = getenv(name);
+  if (text == nullptr) return -1;
+  long number = -1;
+  const char* end = text + std::strlen(text);
+  const auto [at, error] = std::from_chars(text, end, number);
+  return error == std::errc() && at == end ? number : -1;
+}
+
+int SocketOption(int descriptor, int option) {
+  int value = -1;
+  socklen_t size = sizeof value;
+  return getsockopt(descriptor, SOL_SOCKET, option, &value, &size) == 0 ? value : -1;
+}
+
+bool SetFlags(int descriptor) {
+  const int flags = fcntl(descriptor, F_GETFL);
+  return flags >= 0 && fcntl(descriptor, F_SETFL, flags | O_NONBLOCK) == 0 &&
+         fcntl(descriptor, F_SETFD, FD_CLOEXEC) == 0;
+}
+
+// Makes way for a new socket: removes a stale one. Returns why there is no way, or nothing.
+std::string ClearPath(const std::string& path, const UnixSocketAddress& address) {
+  struct stat status {};
+  if (lstat(path.c_str(), &status) != 0) return errno == ENOENT ? "" : ErrnoText(errno);
+  if (!S_ISSOCK(status.st_mode)) return "something else has its place";
+  const Descriptor probe(socket(AF_UNIX, SOCK_STREAM | SOCK_CLOEXEC | SOCK_NONBLOCK, 0));
+  if (!probe.isOpen()) return ErrnoText(errno);
+  const int error = address.connect(probe.get());
+  // A full backlog (EAGAIN) is a live listener too.
+  if (error == 0 || error == EAGAIN) return "another process is listening";
+  if (error != ECONNREFUSED) return ErrnoText(error);
+  return unlink(path.c_str()) == 0 || errno == ENOENT ? "" : ErrnoText(errno);
+}
+
+}  // namespace
+
+ListeningSocket::~ListeningSocket() {
+  if (path_.empty() || !descriptor_.isOpen()) return;
+  struct stat status {};
+  if (lstat(path_.c_str(), &status) != 0) return;
+  if (status.st_dev == device_ && status.st_ino == inode_) unlink(path_.c_str());
+}
+
+std::optional<std::variant<ListeningSocket, std::string>> ListeningSocket::Passed() {
+  const long count = EnvironmentNumber("LISTEN_FDS");
+  const bool forUs = EnvironmentNumber("LISTEN_PID") == getpid() && count > 0;
+  for (const char* name : {"LISTEN_PID", "LISTEN_FDS", "LISTEN_FDNAMES"}) unsetenv(name);
+  if (!forUs) return std::nullopt;
+  Descriptor first(kFirstPassedDescriptor);
+  if (SocketOption(first.get(), SO_DOMAIN) != AF_UNIX ||
+      SocketOption(first.get(), SO_TYPE) != SOCK_STREAM ||
+      SocketOption(first.get(), SO_ACCEPTCONN) != 1 || !SetFlags(first.get())) {
+    return std::string("the descriptor passed is not a listening stream socket");
+  }
+  return ListeningSocket(std::move(first));
+}
+
+std::variant<ListeningSocket, std::string> ListeningSocket::Make(const std::string& directory,
+                                                                 const std::string& name) {
+  // Held until the new socket listens: before that it looks stale to another starting process.
+  const FileLock lock(directory + "/." + name + ".lock");
+  if (lock.error() != 0) return ErrnoText(lock.error());
+  const std::string path = directory + "/" + name;
+  const UnixSocketAddress address(directory, name);
+  if (address.error() != 0) return ErrnoText(address.error());
+  if (std::string reason = ClearPath(path, address); !reason.empty()) return reason;
+
+  Descriptor made = MakeUnixSocket();
+  struct stat status {};
+  // The mode is set before the socket has a name, so that nobody else ever finds it open.
+  if (!made.isOpen() || fchmod(made.get(), 0600) != 0) return ErrnoText(errno);
+  if (const int error = address.bind(made.get())) return ErrnoText(error);
+  if (chmod(path.c_str(), 0600) != 0 || lstat(path.c_str(), &status) != 0 ||
+      listen(made.get(), kBacklog) != 0 || !SetFlags(made.get())) {
+    const int error = errno;
+    unlink(path.c_str());
+    return ErrnoText(error);
+  }
+  ListeningSocket result(std::move(made));
+  result.path_ = path;
+  result.device_ = status.st_dev;
+  result.inode_ = status.st_ino;
+  return result;
+}
+
+}  // namespace quorlet

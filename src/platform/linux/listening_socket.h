@@ -1,0 +1,44 @@
+// Getting the socket that a service listens on.
+#ifndef QUORLET_PLATFORM_LINUX_LISTENING_SOCKET_H_
+#define QUORLET_PLATFORM_LINUX_LISTENING_SOCKET_H_
+
+#include <sys/types.h>
+
+#include <optional>
+#include <string>
+#include <variant>
+
+#include "platform/linux/descriptor.h"
+
+namespace quorlet {
+
+// A listening, non-blocking stream socket. One that this process made is removed from its directory
+// at the end, unless somebody has replaced it.
+class ListeningSocket {
+ public:
+  ListeningSocket(ListeningSocket&&) = default;
+  ListeningSocket& operator=(ListeningSocket&&) = default;
+  ~ListeningSocket();
+
+  // The socket that the service manager passed (LISTEN_PID, LISTEN_FDS); nothing when it passed
+  // none to this process, a reason when what it passed cannot be used. Asking uses it up.
+  static std::optional<std::variant<ListeningSocket, std::string>> Passed();
+
+  // A socket `name` in `directory` (which is created), or the reason why there is none.
+  static std::variant<ListeningSocket, std::string> Make(const std::string& directory,
+                                                         const std::string& name);
+
+  int get() const { return descriptor_.get(); }
+
+ private:
+  explicit ListeningSocket(Descriptor descriptor) : descriptor_(std::move(descriptor)) {}
+
+  Descriptor descriptor_;
+  std::string path_;  // empty for a passed socket
+  dev_t device_ = 0;
+  ino_t inode_ = 0;
+};
+
+}  // namespace quorlet
+
+#endif  // QUORLET_PLATFORM_LINUX_LISTENING_SOCKET_H_

@@ -1,0 +1,260 @@
+// Preferences in property-list files, one for each domain.
+//
+// A domain's file is read when it is first asked for and again whenever it has changed; the changes
+// of this process that are not yet durable lie over it. Synchronizing takes the domain's lock file,
+// reads the file as it is then, and writes it whole with only this process's changes merged in.
+#include "platform/preferences.h"
+
+#include <sys/stat.h>
+
+#include <algorithm>
+#include <cerrno>
+#include <cstdio>
+#include <map>
+#include <mutex>
+#include <string>
+#include <utility>
+#include <variant>
+
+#include "platform/linux/services.h"
+#include "values/property_list.h"
+
+namespace quorlet {
+namespace {
+
+constexpr char kDirectory[] = "/var/mobile/Library/Preferences";
+
+// What tells one content of a file from another; `error` is set when there is none to be seen.
+struct FileVersion {
+  dev_t device = 0;
+  ino_t inode = 0;
+  off_t size = 0;
+  std::int64_t modified = 0;  // nanoseconds
+  std::int64_t changed = 0;
+  int error = 0;
+  bool operator==(const FileVersion&) const = default;
+};
+
+std::int64_t Nanoseconds(const timespec& time) {
+  return static_cast<std::int64_t>(time.tv_sec) * 1'000'000'000 + time.tv_nsec;
+}
+
+FileVersion VersionOf(const std::string& path) {
+  struct stat status = {};
+  FileVersion version;
+  if (stat(path.c_str(), &status) != 0) {
+    version.error = errno;
+    return version;
+  }
+  version.device = status.st_dev;
+  version.inode = status.st_ino;
+  version.size = status.st_size;
+  version.modified = Nanoseconds(status.st_mtim);
+  version.changed = Nanoseconds(status.st_ctim);
+  return version;
+}
+
+// A domain's dictionary from its file, or why there is none.
+std::variant<Dictionary, std::string> ReadDomainFile(const std::string& path) {
+  const auto bytes = ReadWholeFile(path, kMaxPropertyListBytes);
+  if (const int* error = std::get_if<int>(&bytes)) return ErrnoText(*error);
+  auto document = ReadPropertyList(std::string_view(std::get<std::string>(bytes)));
+  if (const auto* error = std::get_if<PropertyListError>(&document)) return error->description;
+  const Dictionary* dictionary = std::get<PropertyValue>(document).asDictionary();
+  if (dictionary == nullptr) return std::string("it holds no dictionary");
+  return *dictionary;
+}
+
+// The document, or why it cannot be written. One that could not be read again is not written.
+std::variant<std::string, PropertyListError> Document(const PropertyValue& value) {
+  auto document = WriteXmlPropertyList(value);
+  const std::string* text = std::get_if<std::string>(&document);
+  if (text == nullptr || text->size() <= kMaxPropertyListBytes) return document;
+  return PropertyListError{"the document would be too large"};
+}
+
+// Whether both look the same in a file; 5 and 5.0 do not, although they are equal.
+bool IsWrittenAlike(const PropertyValue& one, const PropertyValue& other) {
+  const auto oneDocument = Document(one);
+  const auto otherDocument = Document(other);
+  const auto* oneText = std::get_if<std::string>(&oneDocument);
+  const auto* otherText = std::get_if<std::string>(&otherDocument);
+  return oneText != nullptr && otherText != nullptr && *oneText == *otherText;
+}
+
+// `key` as it will read after it was written to a file, so that a change is found under the same
+// key before and after.
+std::string StorableKey(std::string_view key) {
+  const auto isPlain = [](char c) { return c >= 0x20 && c < 0x7f; };
+  if (!key.empty() && std::ranges::all_of(key, isPlain)) return std::string(key);
+  const auto document = WriteXmlPropertyList(Dictionary{{key, true}});
+  const auto* text = std::get_if<std::string>(&document);
+  if (text == nullptr) return std::string(key);
+  const auto reread = ReadPropertyList(std::string_view(*text));
+  const auto* value = std::get_if<PropertyValue>(&reread);
+  const Dictionary* dictionary = value != nullptr ? value->asDictionary() : nullptr;
+  if (dictionary == nullptr || dictionary->empty()) return std::string(key);
+  return dictionary->begin()->first;
+}
+
+class LinuxPreferences : public Preferences {
+ public:
+  LinuxPreferences(const Root& root, Access access, SystemLog& log)
+      : directory_(root.path(kDirectory)), access_(access), log_(log) {}
+
+  ~LinuxPreferences() override {
+    for (auto& [name, domain] : domains_) synchronize(name, domain);
+  }
+
+  std::optional<PropertyValue> DGWPreferencesGetValue(std::string_view key,
+                                                      std::string_view domain) override {
+    const std::lock_guard lock(mutex_);
+    Domain* found = findDomain(domain);
+    if (found == nullptr) return std::nullopt;
+    const std::string stored = StorableKey(key);
+    if (const auto change = found->pending.find(stored); change != found->pending.end()) {
+      return change->second ? std::optional(change->second->deepCopy()) : std::nullopt;
+    }
+    refresh(domain, *found);
+    const PropertyValue* value = found->stored.find(stored);
+    return value != nullptr ? std::optional(value->deepCopy()) : std::nullopt;
+  }
+
+  void DGWPreferencesSetValue(std::string_view key, std::optional<PropertyValue> value,
+                              std::string_view domain) override {
+    const std::lock_guard lock(mutex_);
+    Domain* found = findDomain(domain);
+    if (found == nullptr) return;
+    if (value) value = value->deepCopy();
+    found->pending.insert_or_assign(StorableKey(key), std::move(value));
+  }
+
+  void DGWPreferencesSynchronize(std::string_view domain) override {
+    const std::lock_guard lock(mutex_);
+    if (Domain* found = findDomain(domain)) synchronize(domain, *found);
+  }
+
+ private:
+  using Changes = std::map<std::string, std::optional<PropertyValue>, std::less<>>;
+
+  struct Domain {
+    std::optional<FileVersion> version;  // of `stored`; none before the first reading
+    Dictionary stored;
+    bool damaged = false;  // there is a file, but `stored` is not from it
+    Changes pending;       // no value: the key is to be removed
+  };
+
+  // The domain's state, or nullptr and an error line for a name that is refused.
+  Domain* findDomain(std::string_view name) {
+    if (const auto found = domains_.find(name); found != domains_.end()) return &found->second;
+    if (!IsSafeName(name)) {
+      log_.error("Refused the preference domain name \"%@\"", name);
+      return nullptr;
+    }
+    return &domains_[std::string(name)];
+  }
+
+  std::string path(std::string_view domain) const {
+    return directory_ + "/" + std::string(domain) + ".plist";
+  }
+
+  // Reads the domain's file when it is not the one that was read last.
+  void refresh(std::string_view name, Domain& domain) {
+    // Taken before the file is read: a change in between only leads to one more reading.
+    const FileVersion version = VersionOf(path(name));
+    if (domain.version == version) return;
+    domain.version = version;
+    domain.stored = Dictionary();
+    domain.damaged = false;
+    if (version.error == ENOENT) return;
+    auto read = ReadDomainFile(path(name));
+    if (const auto* dictionary = std::get_if<Dictionary>(&read)) {
+      domain.stored = *dictionary;
+      return;
+    }
+    domain.damaged = true;
+    log_.error("Cannot read the preferences %@, taking them as empty: %@", path(name),
+               std::get<std::string>(read));
+  }
+
+  void synchronize(std::string_view name, Domain& domain) {
+    if (access_ == Access::kReadOnly) return;
+    if (isSettled(name, domain)) return;  // nothing to write: no lock file either
+    const FileLock lock(directory_ + "/." + std::string(name) + ".lock");
+    if (lock.error() != 0) {
+      log_.error("Cannot lock the preferences %@: %@", path(name), ErrnoText(lock.error()));
+      return;
+    }
+    if (!isSettled(name, domain)) writeMerged(name, domain);
+  }
+
+  // Drops the pending changes when the file already holds them all.
+  bool isSettled(std::string_view name, Domain& domain) {
+    if (domain.pending.empty()) return true;
+    refresh(name, domain);
+    const bool settled = std::ranges::all_of(domain.pending, [&](const auto& change) {
+      const PropertyValue* stored = domain.stored.find(change.first);
+      if (stored == nullptr || !change.second) return stored == nullptr && !change.second;
+      return IsWrittenAlike(*stored, *change.second);
+    });
+    if (settled) domain.pending.clear();
+    return settled;
+  }
+
+  // Replaces the file by what it holds with the pending changes merged in. With the lock held.
+  void writeMerged(std::string_view name, Domain& domain) {
+    Dictionary merged = domain.stored.shallowCopy();
+    Changes refused;
+    for (const auto& [key, value] : domain.pending) {
+      if (!value) {
+        merged.remove(key);
+        continue;
+      }
+      // One value that no file can hold must not keep the others out of it.
+      const auto alone = Document(Dictionary{{key, *value}});
+      if (const auto* error = std::get_if<PropertyListError>(&alone)) {
+        log_.error("Cannot write the preference %@ of %@: %@", key, name, error->description);
+        refused.emplace(key, value);
+        continue;
+      }
+      merged[key] = *value;
+    }
+    if (refused.size() == domain.pending.size()) return;
+    const auto document = Document(merged);
+    if (const auto* error = std::get_if<PropertyListError>(&document)) {
+      log_.error("Cannot write the preferences %@: %@", path(name), error->description);
+      return;
+    }
+    if (const int error = replaceFile(name, domain.damaged, std::get<std::string>(document))) {
+      log_.error("Cannot write the preferences %@: %@", path(name), ErrnoText(error));
+      return;
+    }
+    domain.pending = std::move(refused);
+    domain.version.reset();  // values read back as the file holds them
+  }
+
+  int replaceFile(std::string_view name, bool keepDamaged, const std::string& document) {
+    AtomicFile file(directory_, name);
+    if (const int error = file.open()) return error;
+    if (const int error = file.write(document)) return error;
+    // Only now, so that a full disk leaves the damaged file where it is.
+    if (keepDamaged && rename(path(name).c_str(), (path(name) + ".damaged").c_str()) != 0) {
+      return errno;
+    }
+    return file.publish(std::string(name) + ".plist");
+  }
+
+  const std::string directory_;
+  const Access access_;
+  SystemLog& log_;
+  std::mutex mutex_;
+  std::map<std::string, Domain, std::less<>> domains_;
+};
+
+}  // namespace
+
+std::unique_ptr<Preferences> MakeLinuxPreferences(const Root& root, Access access, SystemLog& log) {
+  return std::make_unique<LinuxPreferences>(root, access, log);
+}
+
+}  // namespace quorlet

@@ -1,0 +1,30 @@
+// A copy of a database and its rollback journal in a directory outside of the store, for a reader
+// that must not finish what a killed writer left half done.
+#ifndef QUORLET_PLATFORM_LINUX_TALLY_PRIVATE_COPY_H_
+#define QUORLET_PLATFORM_LINUX_TALLY_PRIVATE_COPY_H_
+
+#include <string>
+
+namespace quorlet {
+
+class TallyPrivateCopy {
+ public:
+  // Copies `databasePath` and "<databasePath>-journal" to a new directory in $TMPDIR or /tmp.
+  explicit TallyPrivateCopy(const std::string& databasePath);
+  TallyPrivateCopy(const TallyPrivateCopy&) = delete;
+  TallyPrivateCopy& operator=(const TallyPrivateCopy&) = delete;
+  // Removes the directory; what is open stays readable.
+  ~TallyPrivateCopy();
+
+  // The copied database's path, empty when it could not be made, or when other processes kept
+  // changing the original meanwhile.
+  const std::string& path() const { return path_; }
+
+ private:
+  std::string directory_;
+  std::string path_;
+};
+
+}  // namespace quorlet
+
+#endif  // QUORLET_PLATFORM_LINUX_TALLY_PRIVATE_COPY_H_

@@ -1,0 +1,42 @@
+// Preferences: values under a key in a domain, which outlive the process.
+#ifndef QUORLET_PLATFORM_PREFERENCES_H_
+#define QUORLET_PLATFORM_PREFERENCES_H_
+
+#include <cstdint>
+#include <optional>
+#include <string_view>
+
+#include "values/property_value.h"
+
+namespace quorlet {
+
+// A domain name that the platform refuses (see the implementation) reads as empty, and writing to
+// it does nothing; both leave one error line in the system log.
+class Preferences {
+ public:
+  virtual ~Preferences() = default;
+
+  // The stored value, or nothing. Containers may be shared with the store: copy before changing.
+  virtual std::optional<PropertyValue> DGWPreferencesGetValue(std::string_view key,
+                                                              std::string_view domain) = 0;
+
+  // Stores `value`, or removes the key when there is none. Every later read in this process sees
+  // it at once; it becomes durable when the domain is synchronized, at the latest when the process
+  // ends normally.
+  virtual void DGWPreferencesSetValue(std::string_view key, std::optional<PropertyValue> value,
+                                      std::string_view domain) = 0;
+
+  // Makes every pending change of the domain durable. A failure leaves one error line and keeps
+  // the changes pending.
+  virtual void DGWPreferencesSynchronize(std::string_view domain) = 0;
+
+  // The value when it is a boolean, otherwise false; `found` says whether it is one.
+  bool DGWPreferencesGetBoolValue(std::string_view key, std::string_view domain, bool& found);
+
+  // The value when it is a number (truncated, saturated), otherwise 0.
+  std::int64_t DGWPreferencesGetIntegerValue(std::string_view key, std::string_view domain);
+};
+
+}  // namespace quorlet
+
+#endif  // QUORLET_PLATFORM_PREFERENCES_H_

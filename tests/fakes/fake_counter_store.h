@@ -1,0 +1,116 @@
+// The counter store in memory: plain sorted state.
+#ifndef QUORLET_TESTS_FAKES_FAKE_COUNTER_STORE_H_
+#define QUORLET_TESTS_FAKES_FAKE_COUNTER_STORE_H_
+
+#include <cmath>
+#include <limits>
+#include <map>
+#include <string>
+#include <utility>
+#include <vector>
+
+#include "platform/clock.h"
+#include "platform/counter_store.h"
+
+namespace quorlet {
+
+class FakeCounterStore : public CounterStore {
+ public:
+  using RowKey = std::pair<std::string, std::int32_t>;  // key and day, in the order of enumeration
+  using Samples = std::vector<DistributionSample>;
+
+  explicit FakeCounterStore(Clock& clock) : clock_(clock) {}
+
+  void hasScalar(std::string_view key, std::int32_t day, std::int64_t value) {
+    scalars[{std::string(key), day}] = value;
+  }
+  // Appends `values`, recorded at midnight.
+  void hasDistribution(std::string_view key, std::int32_t day, const std::vector<double>& values) {
+    Samples& samples = distributions[{std::string(key), day}];
+    for (const double value : values) samples.push_back({value, 0});
+  }
+
+  std::int32_t TLDaysSince1970() override {
+    return static_cast<std::int32_t>(std::floor(clock_.now().secondsSince1970 / 86400));
+  }
+  Date dateForDaysSince1970(std::int32_t day) override { return {day * 86400.0}; }
+  void TLClientCheckpoint() override {
+    ++checkpoints;
+    const auto isOld = [today = TLDaysSince1970()](const auto& row) {
+      return row.first.second < today - 30;
+    };
+    std::erase_if(scalars, isOld);
+    std::erase_if(distributions, isOld);
+  }
+  void TLClientSetValueForScalarKey(std::string_view key, std::int64_t value) override {
+    scalars[{std::string(key), TLDaysSince1970()}] = value;
+  }
+  void TLClientAddValueForScalarKey(std::string_view key, std::int64_t value) override {
+    std::int64_t& sum = scalars[{std::string(key), TLDaysSince1970()}];
+    if (__builtin_add_overflow(sum, value, &sum)) {
+      sum = value < 0 ? std::numeric_limits<std::int64_t>::min()
+                      : std::numeric_limits<std::int64_t>::max();
+    }
+  }
+  std::unique_ptr<TLHistory> initWithDefaultPath() override {
+    ++historiesOpened;
+    return isMissing ? nullptr : std::make_unique<History>(*this);
+  }
+
+  std::map<RowKey, std::int64_t> scalars;
+  std::map<RowKey, Samples> distributions;
+  bool isMissing = false;  // no reader can be opened
+  int checkpoints = 0;
+  int historiesOpened = 0;
+
+ private:
+  class Enumerator : public TLHistoryDistributionEnumerator {
+   public:
+    explicit Enumerator(const Samples& samples) : samples_(samples) {}
+
+   protected:
+    std::span<const DistributionSample> nextBlock() override { return std::exchange(samples_, {}); }
+
+   private:
+    std::span<const DistributionSample> samples_;
+  };
+
+  class History : public TLHistory {
+   public:
+    explicit History(FakeCounterStore& store) : store_(store) {}
+    void scalarsForKeyPrefixMinDaysSince1970MaxDaysSince1970RowHandler(
+        std::string_view keyPrefix, std::int32_t minDay, std::int32_t maxDay,
+        const ScalarHandler& rowHandler) override {
+      bool stop = false;
+      for (const auto& [row, value] : store_.scalars) {
+        if (!matches(row, keyPrefix, minDay, maxDay)) continue;
+        rowHandler(row.first, row.second, value, stop);
+        if (stop) return;
+      }
+    }
+    void distributionsForKeyPrefixMinDaysSince1970MaxDaysSince1970RowHandler(
+        std::string_view keyPrefix, std::int32_t minDay, std::int32_t maxDay,
+        const DistributionHandler& rowHandler) override {
+      bool stop = false;
+      for (const auto& [row, samples] : store_.distributions) {
+        if (!matches(row, keyPrefix, minDay, maxDay)) continue;
+        Enumerator values(samples);
+        rowHandler(row.first, row.second, values, stop);
+        if (stop) return;
+      }
+    }
+
+   private:
+    static bool matches(const RowKey& row, std::string_view prefix, std::int32_t minDay,
+                        std::int32_t maxDay) {
+      return row.first.starts_with(prefix) && minDay < row.second && row.second <= maxDay;
+    }
+    FakeCounterStore& store_;
+  };
+
+  Clock& clock_;
+};
+
+}  // namespace quorlet
+
+#endif  // QUORLET_TESTS_FAKES_FAKE_COUNTER_STORE_H_

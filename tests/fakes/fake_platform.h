@@ -1,0 +1,360 @@
+// One platform in memory: every service holds plain state that a test sets up and looks at.
+#ifndef QUORLET_TESTS_FAKES_FAKE_PLATFORM_H_
+#define QUORLET_TESTS_FAKES_FAKE_PLATFORM_H_
+
+#include <algorithm>
+#include <atomic>
+#include <cerrno>
+#include <cstring>
+#include <deque>
+#include <map>
+#include <set>
+#include <string>
+#include <thread>
+#include <utility>
+#include <vector>
+
+#include "fakes/fake_clock.h"
+#include "fakes/fake_counter_store.h"
+#include "fakes/fake_preferences.h"
+#include "fakes/fake_system_log.h"
+#include "platform/platform.h"
+
+namespace quorlet {
+
+struct SubmittedLog {
+  std::string typeCode;
+  std::string name;
+  std::optional<Dictionary> metadata;
+  std::string body;
+};
+
+class FakeDiagnostics : public Diagnostics {
+ public:
+  bool DiagnosticLogSubmissionEnabled() override { return submissionEnabled; }
+  std::string DGWOSVersion() override { return osVersion; }
+  std::optional<PropertyValue> DGWGetDATaskingValue(std::string_view name) override {
+    const PropertyValue* value = tasking.find(name);
+    return value != nullptr ? std::optional(*value) : std::nullopt;
+  }
+  bool DGWWriteLogForSubmission(std::string_view typeCode, std::string_view name,
+                                const std::optional<Dictionary>& metadata,
+                                const LogWriter& writer) override {
+    struct Output : LogOutput {
+      bool write(std::string_view bytes) override {
+        text += bytes;
+        return true;
+      }
+      std::string text;
+    } output;
+    if (diskIsFull || !writer(output)) return false;
+    logs.push_back({std::string(typeCode), std::string(name), metadata, output.text});
+    return true;
+  }
+  void SubmitDiagnosticLogs() override { ++submissions; }
+
+  bool submissionEnabled = true;
+  bool diskIsFull = false;
+  std::string osVersion = "TestOS 1 (A1)";
+  Dictionary tasking;
+  std::vector<SubmittedLog> logs;
+  int submissions = 0;
+};
+
+class FakeCrashSupport : public CrashSupport {
+ public:
+  void FSLogStructuredData(std::int32_t type, const Dictionary& entry) override {
+    entries.emplace_back(type, entry.deepCopy());
+  }
+  void FSDumpAllOldStructuredDataLogs() override { ++dumps; }
+  void rollCarewellLogs() override { ++rolls; }
+  std::vector<std::pair<std::int32_t, Dictionary>> entries;
+  int dumps = 0;
+  int rolls = 0;
+};
+
+class FakeSupportLibrary : public SupportLibrary {
+ public:
+  bool load() override {
+    ++loads;
+    return present;
+  }
+  Function findFunction(const char* name) override {
+    if (missing.contains(name)) return nullptr;
+    const std::string_view text = name;
+    if (text == "DGWPreferencesGetIntegerValue") return reinterpret_cast<Function>(&ReadInteger);
+    if (text == "DGWPreferencesSetValue") return reinterpret_cast<Function>(&WriteInteger);
+    return nullptr;
+  }
+  bool present = true;
+  std::set<std::string, std::less<>> missing;
+  int loads = 0;
+
+ private:
+  static std::int64_t ReadInteger(Preferences& preferences, const char* key, const char* domain) {
+    return preferences.DGWPreferencesGetIntegerValue(key, domain);
+  }
+  static void WriteInteger(Preferences& preferences, const char* key, std::int64_t value,
+                           const char* domain) {
+    preferences.DGWPreferencesSetValue(key, Int64(value), domain);
+  }
+};
+
+class FakeDeviceInfo : public DeviceInfo {
+ public:
+  std::optional<PropertyValue> DQCopyAnswer(std::string_view question) override {
+    const PropertyValue* answer = answers.find(question);
+    return answer != nullptr ? std::optional(answer->deepCopy()) : std::nullopt;
+  }
+  Dictionary answers;
+};
+
+class FakeOSVersion : public OSVersion {
+ public:
+  std::optional<Dictionary> CopySystemVersionDictionary() override {
+    if (!build) return std::nullopt;
+    return Dictionary{{"ProductBuildVersion", *build}};
+  }
+  std::optional<std::string> build = "A1";
+};
+
+class FakeKernelParameters : public KernelParameters {
+ public:
+  int sysctlbyname(std::string_view name, std::span<std::byte> buffer,
+                   std::size_t& length) override {
+    asked.emplace_back(name);
+    const auto queue = queues.find(name);
+    if (queue != queues.end() && !queue->second.empty()) {
+      const int error = copyOut(queue->second.front(), buffer, length);
+      if (error == 0) queue->second.pop_front();
+      return error;
+    }
+    const auto found = values.find(name);
+    return found != values.end() ? copyOut(found->second, buffer, length) : missing;
+  }
+  std::map<std::string, std::string, std::less<>> values;
+  std::map<std::string, std::deque<std::string>, std::less<>> queues;  // a read takes the first
+  int missing = ENOENT;  // what a read of anything else fails with
+  std::vector<std::string> asked;
+
+ private:
+  static int copyOut(const std::string& bytes, std::span<std::byte> buffer, std::size_t& length) {
+    if (bytes.size() > buffer.size()) return ENOMEM;
+    if (!bytes.empty()) std::memcpy(buffer.data(), bytes.data(), bytes.size());
+    length = bytes.size();
+    return 0;
+  }
+};
+
+class FakeEnvironment : public Environment {
+ public:
+  std::optional<FileStatus> stat(std::string_view path) override {
+    const auto size = sizes.find(path);
+    if (size != sizes.end()) return FileStatus{size->second};
+    const auto file = files.find(path);
+    if (file != files.end()) return FileStatus{file->second.size()};
+    return std::nullopt;
+  }
+  std::optional<std::string> readFile(std::string_view path, std::size_t limit) override {
+    const auto file = files.find(path);
+    if (file == files.end() || file->second.size() > limit) return std::nullopt;
+    return file->second;
+  }
+  std::optional<std::string> SystemGroupContainerPath(std::string_view identifier,
+                                                      std::uint64_t& error) override {
+    if (containerError == 0) return "/containers/" + std::string(identifier);
+    error = containerError;
+    return std::nullopt;
+  }
+  bool CheckMultiUserMode(std::int32_t& mode) override {
+    if (!userMode) return false;
+    mode = *userMode;
+    return true;
+  }
+  std::uint64_t TickClockNow() override { return ticks; }
+  int TickTimebase(std::uint32_t& numerator, std::uint32_t& denominator) override {
+    numerator = timebaseNumerator;
+    denominator = timebaseDenominator;
+    return timebaseStatus;
+  }
+
+  std::map<std::string, std::string, std::less<>> files;
+  std::map<std::string, std::uint64_t, std::less<>> sizes;  // of files without content
+  std::uint64_t containerError = 0;
+  std::optional<std::int32_t> userMode;
+  std::uint64_t ticks = 0;
+  std::uint32_t timebaseNumerator = 1;
+  std::uint32_t timebaseDenominator = 1;
+  int timebaseStatus = 0;
+};
+
+class FakeApplications : public Applications {
+ public:
+  void EnumerateApplicationBundles(
+      const std::function<void(ApplicationBundleType)>& visit) override {
+    ++enumerations;
+    for (const ApplicationBundleType type : bundles) visit(type);
+  }
+  std::vector<ApplicationBundleType> bundles;
+  int enumerations = 0;
+};
+
+class FakeLocale : public LocaleService {
+ public:
+  std::vector<std::string> PreferredLanguages() override { return preferred; }
+  std::vector<std::string> SystemLanguages() override { return system; }
+  std::vector<std::string> PreferredLocalizations(const std::vector<std::string>& available,
+                                                  const std::vector<std::string>& wanted) override {
+    std::vector<std::string> shown;
+    std::ranges::copy_if(wanted, std::back_inserter(shown), [&](const std::string& language) {
+      return std::ranges::find(available, language) != available.end();
+    });
+    return shown;
+  }
+  std::optional<std::string> CurrentRegionCode() override { return region; }
+  std::vector<std::string> preferred;
+  std::vector<std::string> system;
+  std::optional<std::string> region;
+};
+
+class FakePassLock : public PassLock {
+ public:
+  void lock() override { held = true; }
+  void unlock() override { held = false; }
+  bool held = false;
+};
+
+// Delivers scripted messages, one a slice, each on a connection of its own.
+class FakeNamedService : public NamedService {
+ public:
+  bool ListenNamedService(std::string_view name, ListenerHandler handler) override {
+    if (!canListen) return false;
+    listeningAs = name;
+    listener_ = std::move(handler);
+    return true;
+  }
+  void AcceptPeerConnection(Peer&, MessageHandler handler) override {
+    messages_ = std::move(handler);
+  }
+  MainLoopResult RunMainLoop(double seconds, bool) override {
+    sliceSeconds.push_back(seconds);
+    if (!listener_ || arriving.empty()) return MainLoopResult::kTimedOut;
+    listener_({});
+    Peer peer;
+    listener_({&peer});
+    const PropertyValue message = arriving.front();
+    arriving.erase(arriving.begin());
+    messages_(message);
+    return MainLoopResult::kHandledEvent;
+  }
+
+  bool canListen = true;
+  std::string listeningAs;
+  std::vector<PropertyValue> arriving;
+  std::vector<double> sliceSeconds;
+
+ private:
+  ListenerHandler listener_;
+  MessageHandler messages_;
+};
+
+class FakeNotifications : public Notifications {
+ public:
+  void PostNotification(std::string_view name) override { posted.emplace_back(name); }
+  std::vector<std::string> posted;
+};
+
+// Replies on a thread of its own, before the query returns unless the reply is held back.
+class FakeNetworkUsage : public NetworkUsage {
+ public:
+  void QueryProcessDataUsage(const std::vector<std::string>& nameFilter, UsageNameKind,
+                             Reply reply) override {
+    filters.push_back(nameFilter);
+    held_ = std::move(reply);
+    if (!holdsBack) deliver();
+  }
+  // Delivers the reply that was held back.
+  void deliver() {
+    std::thread([this] { held_(records); }).join();
+    held_ = nullptr;
+  }
+
+  bool holdsBack = false;
+  Array records;
+  std::vector<std::vector<std::string>> filters;
+
+ private:
+  Reply held_;
+};
+
+// Waiting ends at once, and takes no time.
+class FakeSemaphores : public Semaphores {
+ public:
+  std::shared_ptr<Semaphore> create() override { return std::make_shared<Counted>(waits); }
+  std::vector<std::chrono::nanoseconds> waits;  // the limits asked for
+
+ private:
+  struct Counted : Semaphore {
+    explicit Counted(std::vector<std::chrono::nanoseconds>& asked) : limits(asked) {}
+    void signal() override { ++count; }
+    bool wait(std::chrono::nanoseconds limit) override {
+      limits.push_back(limit);
+      if (count == 0) return false;
+      --count;
+      return true;
+    }
+    std::vector<std::chrono::nanoseconds>& limits;
+    std::atomic<int> count = 0;
+  };
+};
+
+// The services, bundled. The clock starts at noon of day 20000.
+struct FakePlatform {
+  FakeSystemLog log;
+  FakeClock clock;
+  FakePreferences preferences;
+  FakeCounterStore counterStore{clock};
+  FakeDiagnostics diagnostics;
+  FakeCrashSupport crashSupport;
+  FakeSupportLibrary supportLibrary;
+  FakeDeviceInfo deviceInfo;
+  FakeOSVersion osVersion;
+  FakeKernelParameters kernelParameters;
+  FakeEnvironment environment;
+  EnvironmentQueries queries{deviceInfo, environment, log};
+  FakeApplications applications;
+  FakeLocale locale;
+  FakePassLock passLock;
+  FakeNamedService namedService;
+  FakeNotifications notifications;
+  FakeNetworkUsage networkUsage;
+  FakeSemaphores semaphores;
+  Platform services = bundle(crashSupport);
+
+  // The same services, but for the crash support.
+  Platform bundle(CrashSupport& otherCrashSupport) {
+    return {log,
+            clock,
+            preferences,
+            counterStore,
+            diagnostics,
+            otherCrashSupport,
+            supportLibrary,
+            deviceInfo,
+            osVersion,
+            kernelParameters,
+            environment,
+            queries,
+            applications,
+            locale,
+            passLock,
+            namedService,
+            notifications,
+            networkUsage,
+            semaphores};
+  }
+};
+
+}  // namespace quorlet
+
+#endif  // QUORLET_TESTS_FAKES_FAKE_PLATFORM_H_

@@ -1,0 +1,97 @@
+// Preferences in memory.
+#ifndef QUORLET_TESTS_FAKES_FAKE_PREFERENCES_H_
+#define QUORLET_TESTS_FAKES_FAKE_PREFERENCES_H_
+
+#include <map>
+#include <memory>
+#include <optional>
+#include <string>
+#include <utility>
+#include <vector>
+
+#include "platform/preferences.h"
+#include "platform/system_log.h"
+
+namespace quorlet {
+
+class FakePreferences : public Preferences {
+ public:
+  using Domain = std::map<std::string, PropertyValue, std::less<>>;
+  // What is durable, by domain; it outlives the process.
+  using Disk = std::map<std::string, Domain, std::less<>>;
+
+  // A process on a disk of its own; refused domain names leave their error line in `log`.
+  explicit FakePreferences(SystemLog* log = nullptr) : log_(log) {}
+  // One of several processes on a disk.
+  FakePreferences(std::shared_ptr<Disk> disk, SystemLog* log) : disk_(std::move(disk)), log_(log) {}
+  ~FakePreferences() override {
+    for (const auto& [domain, changes] : pending_) flush(domain);
+  }
+
+  std::optional<PropertyValue> DGWPreferencesGetValue(std::string_view key,
+                                                      std::string_view domain) override {
+    if (isRefused(domain)) return std::nullopt;
+    const auto& changes = pending_[std::string(domain)];
+    const auto change = changes.find(key);
+    auto value = change != changes.end() ? change->second : durable(key, domain);
+    return value ? std::optional(value->deepCopy()) : std::nullopt;
+  }
+
+  void DGWPreferencesSetValue(std::string_view key, std::optional<PropertyValue> value,
+                              std::string_view domain) override {
+    if (isRefused(domain)) return;
+    if (value) value = value->deepCopy();
+    pending_[std::string(domain)].insert_or_assign(std::string(key), std::move(value));
+  }
+
+  void DGWPreferencesSynchronize(std::string_view domain) override {
+    if (isRefused(domain)) return;
+    synchronized.emplace_back(domain);
+    flush(domain);
+  }
+
+  // Whether the key reads the same after a crash as it does now.
+  bool isDurable(std::string_view key, std::string_view domain) {
+    return DGWPreferencesGetValue(key, domain) == durable(key, domain);
+  }
+
+  std::vector<std::string> synchronized;  // every domain, in order
+
+ private:
+  using Changes = std::map<std::string, std::optional<PropertyValue>, std::less<>>;
+
+  bool isRefused(std::string_view domain) {
+    const bool refused = domain.empty() || domain.size() > 200 || domain.front() == '.' ||
+                         domain.find_first_of(std::string_view("/\n\0", 3)) != domain.npos;
+    if (refused && log_ != nullptr) log_->error("Refused the preference domain %@", domain);
+    return refused;
+  }
+
+  std::optional<PropertyValue> durable(std::string_view key, std::string_view domain) const {
+    const auto found = disk_->find(domain);
+    if (found == disk_->end()) return std::nullopt;
+    const auto entry = found->second.find(key);
+    return entry != found->second.end() ? std::optional(entry->second) : std::nullopt;
+  }
+
+  void flush(std::string_view domain) {
+    Changes& changes = pending_[std::string(domain)];
+    Domain& stored = (*disk_)[std::string(domain)];
+    for (auto& [key, value] : changes) {
+      if (value) {
+        stored.insert_or_assign(key, *value);
+      } else {
+        stored.erase(key);
+      }
+    }
+    changes.clear();
+  }
+
+  std::shared_ptr<Disk> disk_ = std::make_shared<Disk>();
+  SystemLog* log_;
+  std::map<std::string, Changes, std::less<>> pending_;
+};
+
+}  // namespace quorlet
+
+#endif  // QUORLET_TESTS_FAKES_FAKE_PREFERENCES_H_
