@@ -1,0 +1,159 @@
+#include "report/config.h"
+
+#include <openssl/crypto.h>
+#include <openssl/evp.h>
+
+#include <array>
+#include <set>
+#include <utility>
+#include <variant>
+
+#include "values/property_list.h"
+
+namespace quorlet {
+namespace {
+
+constexpr std::string_view kInternalTesting = "InternalTesting";
+constexpr std::string_view kTaskingDomain = "nuvex.da";
+
+// Lower-case hexadecimal MD5; empty when the library has no MD5.
+std::string Md5Hex(std::string_view bytes) {
+  // The machine's OpenSSL configuration may forbid MD5; here it only names a file's version.
+  OPENSSL_init_crypto(OPENSSL_INIT_NO_LOAD_CONFIG, nullptr);
+  std::array<unsigned char, EVP_MAX_MD_SIZE> digest{};
+  unsigned int length = 0;
+  if (EVP_Digest(bytes.data(), bytes.size(), digest.data(), &length, EVP_md5(), nullptr) != 1) {
+    return {};
+  }
+  constexpr std::string_view kDigits = "0123456789abcdef";
+  std::string text;
+  for (unsigned int i = 0; i < length; ++i) {
+    text += kDigits[digest[i] >> 4];
+    text += kDigits[digest[i] & 15];
+  }
+  return text;
+}
+
+// A group entry's table, or nothing for a name that means nothing.
+std::optional<Dictionary> TableNamed(std::string_view name, const KeyTables& tables) {
+  if (name == "ScalarKeys") return tables.scalarKeys;
+  if (name == "DistributionKeys") return tables.distributionKeys;
+  if (name == "ScalarKeyPrefixes") return tables.scalarPrefixes;
+  if (name == "DistributionKeyPrefixes") return tables.distributionPrefixes;
+  return std::nullopt;
+}
+
+std::vector<std::size_t> LengthsLongestFirst(const Dictionary& prefixes) {
+  std::set<std::size_t, std::greater<>> lengths;
+  for (const auto& [prefix, options] : prefixes) lengths.insert(prefix.size());
+  return {lengths.begin(), lengths.end()};
+}
+
+}  // namespace
+
+std::vector<WhitelistFault> MergeWhitelist(const Dictionary& root,
+                                           const std::function<bool(const std::string&)>& enabled,
+                                           const KeyTables& tables) {
+  std::vector<WhitelistFault> faults;
+  for (const auto& [groupName, groupValue] : root) {
+    if (!enabled(groupName)) continue;
+    const Dictionary* group = groupValue.asDictionary();
+    if (group == nullptr) {
+      faults.push_back({groupName, "", "is not a dictionary"});
+      continue;
+    }
+    for (const auto& [name, value] : *group) {
+      auto table = TableNamed(name, tables);
+      if (!table) continue;
+      const Dictionary* entries = value.asDictionary();
+      if (entries == nullptr) {
+        faults.push_back({groupName, name, "is not a dictionary"});
+        continue;
+      }
+      for (const auto& [key, options] : *entries) {
+        if (options.asDictionary() == nullptr) {
+          faults.push_back({groupName, key, "has options that are not a dictionary"});
+        } else {
+          (*table)[key] = options;
+        }
+      }
+    }
+  }
+  return faults;
+}
+
+bool IsGroupEnabled(const std::string& group, bool isInternalDevice, Platform& platform) {
+  if (group == kInternalTesting && !isInternalDevice) return false;
+  bool found = false;
+  const bool value = platform.preferences.DGWPreferencesGetBoolValue(group, kTaskingDomain, found);
+  if (!value && !isInternalDevice && found) {
+    platform.log.log("keyGroup %@ is disabled by tasking", group);
+    return false;
+  }
+  return true;
+}
+
+std::optional<TLConfig> TLConfig::init(Platform& platform) {
+  TLConfig config(platform.log);
+  config._isInternalDevice = platform.queries.TLIsInternalDevice();
+
+  const auto bytes = platform.environment.readFile(kWhitelistPath, kMaxPropertyListBytes);
+  if (!bytes) {
+    platform.log.error("Couldn't load whitelist");
+    return std::nullopt;
+  }
+  config._configFileDigest = Md5Hex(*bytes);
+
+  const auto parsed = ReadPropertyList(*bytes);
+  const auto* value = std::get_if<PropertyValue>(&parsed);
+  const Dictionary* root = value != nullptr ? value->asDictionary() : nullptr;
+  if (root == nullptr) {
+    platform.log.error("Couldn't parse the contents of the config file. Error: %@",
+                       value != nullptr ? std::string("the root is not a dictionary")
+                                        : std::get<PropertyListError>(parsed).description);
+    return std::nullopt;
+  }
+
+  const auto enabled = [&](const std::string& group) {
+    return IsGroupEnabled(group, config._isInternalDevice, platform);
+  };
+  const auto faults = MergeWhitelist(*root, enabled,
+                                     {config._scalarKeys, config._scalarPrefixes,
+                                      config._distributionKeys, config._distributionPrefixes});
+  for (const WhitelistFault& fault : faults) {
+    platform.log.error("Skipping whitelist entry %@ of keyGroup %@: it %@", fault.key, fault.group,
+                       fault.reason);
+  }
+  config._scalarPrefixLengths = LengthsLongestFirst(config._scalarPrefixes);
+  config._distributionPrefixLengths = LengthsLongestFirst(config._distributionPrefixes);
+  return config;
+}
+
+std::optional<KeyOptions> TLConfig::configOptionsForScalarKey(std::string_view key) const {
+  return optionsForKey(key, _scalarKeys, _scalarPrefixes, _scalarPrefixLengths);
+}
+
+std::optional<KeyOptions> TLConfig::configOptionsForDistributionKey(std::string_view key) const {
+  return optionsForKey(key, _distributionKeys, _distributionPrefixes, _distributionPrefixLengths);
+}
+
+std::optional<KeyOptions> TLConfig::optionsForKey(
+    std::string_view key, const Dictionary& keys, const Dictionary& prefixes,
+    const std::vector<std::size_t>& prefixLengths) const {
+  if (const PropertyValue* options = keys.find(key)) return *options->asDictionary();
+  for (const std::size_t length : prefixLengths) {
+    if (length > key.size()) continue;
+    const std::string_view prefix = key.substr(0, length);
+    if (const PropertyValue* options = prefixes.find(prefix)) {
+      _log->debug("prefix match %@ for %@", prefix, key);
+      return *options->asDictionary();
+    }
+  }
+  if (_isInternalDevice) {
+    _log->debug("passing @{} for %@ as device is Nuvex Internal", key);
+    return KeyOptions();
+  }
+  return std::nullopt;
+}
+
+}  // namespace quorlet

@@ -1,0 +1,114 @@
+// The aggregated log: its document, its metadata, and the hand-over to the diagnostics library.
+#include <utility>
+#include <variant>
+
+#include "report/report.h"
+#include "values/property_list.h"
+
+namespace quorlet {
+namespace {
+
+constexpr std::string_view kDomain = "nuvex.aggregated.quorlet";
+constexpr std::string_view kLastOSVersion = "LastOSVersion";
+constexpr std::string_view kAllApps = "nuvex.tilehall.numAllInstalledApps";
+constexpr std::string_view kThirdPartyApps = "nuvex.tilehall.numThirdPartyApps";
+constexpr char kUnknown[] = "<unknown>";
+
+std::string FirstOrUnknown(const std::vector<std::string>& list) {
+  return list.empty() ? kUnknown : list.front();
+}
+
+// Remembers the running OS version; when it is new, the metadata that tells the one before.
+std::optional<Dictionary> NoteOSVersion(Platform& platform) {
+  const auto previous = platform.preferences.DGWPreferencesGetValue(kLastOSVersion, kDomain);
+  const std::string current = platform.diagnostics.DGWOSVersion();
+  const std::string* previousText = previous ? previous->asString() : nullptr;
+  if (previousText != nullptr && *previousText == current) return std::nullopt;
+  platform.preferences.DGWPreferencesSetValue(kLastOSVersion, PropertyValue(current), kDomain);
+  platform.preferences.DGWPreferencesSynchronize(kDomain);
+  Dictionary metadata;
+  metadata["previous_os_version"] = previousText != nullptr ? *previousText : kUnknown;
+  return metadata;
+}
+
+}  // namespace
+
+void TLReport::serializeWithDateAndAppInfo(std::int32_t yesterday,
+                                           const std::optional<Array>& appInfo) {
+  if (_scalarsOutput.empty() && _distributionsOutput.empty() && _histogramsOutput.empty()) return;
+  addInstalledAppInfo();
+  addMetadataKeys();
+  reportDatabaseSize();
+  reportCPUUptime();
+  reportVMStats();
+
+  const std::string digest = _config ? _config->configFileDigest() : std::string();
+  _config.reset();
+
+  const auto document = WriteXmlPropertyList(assembleDocument(yesterday, digest, appInfo));
+  if (const auto* error = std::get_if<PropertyListError>(&document)) {
+    _platform.log.error("Could not create aggregated plist: %@", error->description);
+    return;
+  }
+  const auto metadata = NoteOSVersion(_platform);
+  const auto writer = [&](LogOutput& output) {
+    return output.write(std::get<std::string>(document));
+  };
+  if (!_platform.diagnostics.DGWWriteLogForSubmission("193", "log-aggregated", metadata, writer)) {
+    _platform.log.error("Failed to write aggregated log");
+  }
+}
+
+Dictionary TLReport::assembleDocument(std::int32_t yesterday, const std::string& whitelistDigest,
+                                      const std::optional<Array>& appInfo) {
+  const auto tasking = [this](std::string_view key) {
+    return _platform.preferences.DGWPreferencesGetValue(key, kDomain);
+  };
+  const auto taskID = tasking("TaskingID");
+  const auto taskDigest = tasking("TaskingDigest");
+  const auto payload = tasking("TaskingPayload");
+
+  Dictionary document;
+  document["TLCrashLogVersion"] = Int32(1);
+  document["TLStartDate"] = _platform.counterStore.dateForDaysSince1970(yesterday);
+  document["TLLogCreationDate"] = _platform.clock.now();
+  document["TLMetadata"] = _metadataOutput;
+  document["TLScalars"] = _scalarsOutput;
+  document["TLDistributions"] = _distributionsOutput;
+  document["TLDistributionsHistogram"] = _histogramsOutput;
+  document["TLTasking"] =
+      payload && payload->asArray() != nullptr ? *payload : PropertyValue(Array());
+  document["TLTaskID"] =
+      taskID && taskID->asString() != nullptr ? *taskID : PropertyValue("(no tasking id)");
+  document["TLTaskDigest"] = taskDigest ? *taskDigest : PropertyValue("(no tasking digest)");
+  document["TLWhitelistDigest"] = whitelistDigest;
+  if (appInfo) document["TLActivatedAppInfo"] = *appInfo;
+  return document;
+}
+
+void TLReport::addInstalledAppInfo() {
+  const auto allOptions = optionsForScalarKey(kAllApps);
+  const auto userOptions = optionsForScalarKey(kThirdPartyApps);
+  if (!allOptions && !userOptions) return;
+  std::int64_t all = 0;
+  std::int64_t user = 0;
+  _platform.applications.EnumerateApplicationBundles([&](ApplicationBundleType type) {
+    ++all;
+    if (type == ApplicationBundleType::UserApplicationBundleType) ++user;
+  });
+  if (allOptions) addScalarForKeyWithOptions(all, kAllApps, *allOptions);
+  if (userOptions) addScalarForKeyWithOptions(user, kThirdPartyApps, *userOptions);
+}
+
+void TLReport::addMetadataKeys() {
+  LocaleService& locale = _platform.locale;
+  const auto preferred = locale.PreferredLanguages();
+  const auto shown = locale.PreferredLocalizations(locale.SystemLanguages(), preferred);
+  _metadataOutput["TLUserInterfaceLanguage"] = FirstOrUnknown(shown);
+  _metadataOutput["TLPreferredUserInterfaceLanguage"] = FirstOrUnknown(preferred);
+  if (const auto region = locale.CurrentRegionCode()) {
+    _metadataOutput["TLUserSetRegionFormat"] = *region;
+  }
+}
+
+}  // namespace quorlet

@@ -1,0 +1,124 @@
+#include "report/config.h"
+
+#include <gtest/gtest.h>
+
+#include "fakes/fake_platform.h"
+#include "fakes/whitelist.h"
+
+namespace quorlet {
+namespace {
+
+class ConfigTest : public testing::Test {
+ protected:
+  void whitelist(const std::string& groups) {
+    device.environment.files[std::string(kWhitelistPath)] = Plist("<dict>" + groups + "</dict>");
+  }
+  void makeInternal() { device.deviceInfo.answers["InternalBuild"] = true; }
+  TLConfig load() {
+    auto config = TLConfig::init(device.services);
+    EXPECT_TRUE(config.has_value());
+    return *config;
+  }
+  // The options' text, "-" when the key is left out.
+  static std::string text(const std::optional<KeyOptions>& options) {
+    return options ? (options->empty() ? "{}" : PropertyValue(*options).description()) : "-";
+  }
+  static std::string sigFig(const std::optional<KeyOptions>& options) {
+    const auto digits = options ? RoundingOption(*options, kSigFig) : std::nullopt;
+    return digits ? std::to_string(*digits) : text(options);
+  }
+
+  FakePlatform device;
+};
+
+TEST_F(ConfigTest, ExactKeysComeBeforePrefixesAndLongPrefixesBeforeShortOnes) {
+  whitelist(Group("G", "ScalarKeys", {{"a.b.c", "sig_fig", "1"}}) +
+            Group("H", "ScalarKeyPrefixes",
+                  {{"a.", "sig_fig", "2"}, {"a.b.c.d", "sig_fig", "3"}, {"a.b", "sig_fig", "4"}}) +
+            Group("I", "DistributionKeyPrefixes", {{"", "x", "9"}}));
+  const TLConfig config = load();
+  const std::pair<const char*, const char*> cases[] = {
+      {"a.b.c", "1"}, {"a.x", "2"}, {"a.b.c.d.e", "3"}, {"a.b.c.", "4"}, {"a", "-"}, {"A.x", "-"}};
+  for (const auto& [key, expected] : cases) {
+    EXPECT_EQ(sigFig(config.configOptionsForScalarKey(key)), expected) << key;
+  }
+  EXPECT_TRUE(config.configOptionsForDistributionKey("anything")) << "an empty prefix matches all";
+  EXPECT_EQ(device.log.at(LogLevel::kDebug).front(), "prefix match a. for a.x");
+}
+
+TEST_F(ConfigTest, LaterGroupsReplaceEarlierOnes) {
+  whitelist(Group("B", "ScalarKeys", {{"k", "sig_fig", "2"}}) +
+            Group("A", "ScalarKeys", {{"k", "sig_fig", "1"}}));
+  EXPECT_EQ(sigFig(load().configOptionsForScalarKey("k")), "2");
+}
+
+TEST_F(ConfigTest, TaskingSwitchesGroupsOff) {
+  whitelist(Group("Absent", "ScalarKeys", {{"absent", "sig_fig", "1"}}) +
+            Group("Off", "ScalarKeys", {{"off", "sig_fig", "1"}}) +
+            Group("On", "ScalarKeys", {{"on", "sig_fig", "1"}}) +
+            Group("Text", "ScalarKeys", {{"text", "sig_fig", "1"}}) +
+            Group("InternalTesting", "ScalarKeys", {{"internal", "sig_fig", "1"}}));
+  device.preferences.DGWPreferencesSetValue("Off", PropertyValue(false), "nuvex.da");
+  device.preferences.DGWPreferencesSetValue("On", PropertyValue(true), "nuvex.da");
+  device.preferences.DGWPreferencesSetValue("Text", PropertyValue("no"), "nuvex.da");
+  const auto allowed = [&](const TLConfig& config) {
+    std::string keys;
+    for (const char* key : {"absent", "off", "on", "text", "internal"}) {
+      const auto options = config.configOptionsForScalarKey(key);
+      if (options && !options->empty()) keys += std::string(key) + " ";
+    }
+    return keys;
+  };
+  EXPECT_EQ(allowed(load()), "absent on text ");
+  EXPECT_EQ(device.log.at(LogLevel::kDefault),
+            std::vector<std::string>{"keyGroup Off is disabled by tasking"});
+
+  FakePlatform internal;
+  internal.environment.files = device.environment.files;
+  internal.deviceInfo.answers["InternalBuild"] = true;
+  internal.preferences.DGWPreferencesSetValue("Off", PropertyValue(false), "nuvex.da");
+  const auto config = TLConfig::init(internal.services);
+  EXPECT_EQ(allowed(*config), "absent off on text internal ");
+  EXPECT_EQ(text(config->configOptionsForScalarKey("unknown")), "{}");
+  EXPECT_EQ(internal.log.lines.back().second,
+            "passing @{} for unknown as device is Nuvex Internal");
+}
+
+TEST_F(ConfigTest, TheDigestIsOfTheBytes) {
+  device.environment.files[std::string(kWhitelistPath)] = "<plist version=\"1.0\"><dict/></plist>";
+  // printf '<plist version="1.0"><dict/></plist>' | md5sum
+  EXPECT_EQ(load().configFileDigest(), "be5a5e8f37d7f11fc2c74e4372ebb8f0");
+}
+
+TEST_F(ConfigTest, FaultyEntriesAreSkippedWithOneLineEach) {
+  whitelist(
+      "<key>G</key><dict><key>ScalarKeys</key><dict><key>good</key><dict/>"
+      "<key>bad</key><string>x</string></dict>"
+      "<key>DistributionKeys</key><array/><key>ScalarKeyz</key><true/></dict>"
+      "<key>H</key><integer>1</integer>");
+  EXPECT_TRUE(load().configOptionsForScalarKey("good"));
+  EXPECT_EQ(device.log.errors(),
+            (std::vector<std::string>{
+                "Skipping whitelist entry DistributionKeys of keyGroup G: it is not a dictionary",
+                "Skipping whitelist entry bad of keyGroup G: it has options that are not a "
+                "dictionary",
+                "Skipping whitelist entry  of keyGroup H: it is not a dictionary"}));
+}
+
+TEST_F(ConfigTest, WithoutAUsableFileThereIsNoConfig) {
+  EXPECT_FALSE(TLConfig::init(device.services));
+  EXPECT_EQ(device.log.errors(), std::vector<std::string>{"Couldn't load whitelist"});
+  for (const char* document : {"", "garbage", "<plist><dict><key>a</key></dict></plist>",
+                               "<plist version=\"1.0\"><array/></plist>", "bplist00\x01\x02"}) {
+    device.log.lines.clear();
+    device.environment.files[std::string(kWhitelistPath)] = document;
+    EXPECT_FALSE(TLConfig::init(device.services)) << document;
+    ASSERT_EQ(device.log.errors().size(), 1u) << document;
+    EXPECT_TRUE(device.log.errors()[0].starts_with(
+        "Couldn't parse the contents of the config file. Error: "))
+        << device.log.errors()[0];
+  }
+}
+
+}  // namespace
+}  // namespace quorlet
