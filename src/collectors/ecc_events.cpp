@@ -1,0 +1,60 @@
+// An event as the kernel hands it out, 72 bytes, little-endian:
+//   0  u8      event identifier
+//   1  u8      number of valid registers
+//   2  6 bytes not read
+//   8  8 x u64 registers
+#include "collectors/ecc_events.h"
+
+#include <algorithm>
+#include <array>
+#include <cerrno>
+#include <cstddef>
+#include <cstdint>
+#include <string>
+
+#include "values/byte_reader.h"
+
+namespace quorlet {
+namespace {
+
+constexpr char kParameter[] = "kern.next_ecc_event";
+constexpr std::size_t kRecordSize = 72;
+constexpr std::size_t kRegisters = 8;
+constexpr int kEventsPerPass = 10;
+constexpr std::int32_t kStructuredLogType = 172;
+
+using Record = std::array<std::byte, kRecordSize>;
+
+// A count beyond the eight registers is reported as it is; the registers end with the record.
+Dictionary EntryFromRecord(const Record& record) {
+  ByteReader reader(record);
+  const auto id = reader.little<std::uint8_t>();
+  const auto count = reader.little<std::uint8_t>();
+  reader.skip(6);
+  Dictionary entry{{"id", Int32(id)}, {"count", Int32(count)}};
+  for (std::size_t i = 0; i < std::min<std::size_t>(count, kRegisters); ++i) {
+    entry["reg" + std::to_string(i)] =
+        Int64(static_cast<std::int64_t>(reader.little<std::uint64_t>()));
+  }
+  return entry;
+}
+
+}  // namespace
+
+void logECCEvents(Platform& platform) {
+  std::size_t length = kRecordSize;
+  for (int handled = 0; handled < kEventsPerPass; ++handled) {
+    // Zero for each event, so that a short one does not show the registers of the one before.
+    Record record{};
+    const auto buffer = std::span(record).first(std::min(length, kRecordSize));
+    const int error = platform.kernelParameters.sysctlbyname(kParameter, buffer, length);
+    if (error == ENOENT || error == EBUSY) return;
+    if (error != 0) {
+      platform.log.log("Unexpected errno (%d) reading ECC events from kernel", error);
+      return;
+    }
+    platform.crashSupport.FSLogStructuredData(kStructuredLogType, EntryFromRecord(record));
+  }
+}
+
+}  // namespace quorlet

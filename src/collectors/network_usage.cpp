@@ -1,0 +1,214 @@
+// The baseline is the preference "netUsageBaseline": a dictionary with a row for each name, an
+// array of the since-time and the four counts in the order of kFields, as they were received.
+#include "collectors/network_usage.h"
+
+#include <algorithm>
+#include <array>
+#include <chrono>
+#include <cmath>
+#include <cstddef>
+#include <cstdint>
+#include <limits>
+#include <memory>
+#include <mutex>
+#include <optional>
+#include <string>
+#include <string_view>
+#include <utility>
+
+#include "platform/run_step.h"
+#include "values/property_list.h"
+
+namespace quorlet {
+namespace {
+
+constexpr char kDomain[] = "nuvex.diagwell.quorlet";
+constexpr char kBaseline[] = "netUsageBaseline";
+constexpr std::chrono::seconds kReplyLimit{10};
+constexpr double kSecondsPerDay = 86400;
+
+constexpr std::array<std::string_view, 4> kFields{"wifiInBytes", "wifiOutBytes", "wwanInBytes",
+                                                  "wwanOutBytes"};
+constexpr std::string_view kFieldSuffix = "Bytes";
+
+// A longer name is no name of a process, and its keys might be refused by the store, which would
+// then drop the other counters with them.
+constexpr std::size_t kLongestName = 1024;
+// A baseline that is larger than a document may be could not be stored, and the next run would add
+// everything again. The rest is left to the domain's other keys.
+constexpr std::size_t kBaselineBytes = kMaxPropertyListBytes - 1024 * 1024;
+
+struct UsageRecord {
+  std::string_view name;
+  std::string_view prefix;
+  Date since;  // as the stored baseline can tell it
+  std::array<Number, kFields.size()> counts;
+};
+
+const Number* NumberEntry(const Dictionary& dictionary, std::string_view key) {
+  const PropertyValue* value = dictionary.find(key);
+  return value != nullptr ? value->asNumber() : nullptr;
+}
+
+// Nothing for a record that lacks something; the names are the dictionary's.
+std::optional<UsageRecord> ReadRecord(const Dictionary& record) {
+  const bool isBundle = record.contains("bundleName");
+  const std::string* name = StringEntry(record, isBundle ? "bundleName" : "procName");
+  const PropertyValue* since = record.find(UsageSinceTimeKey);
+  const Number* counts[kFields.size()];
+  std::ranges::transform(kFields, counts,
+                         [&](std::string_view field) { return NumberEntry(record, field); });
+  const bool isComplete = name != nullptr && since != nullptr && since->asDate() != nullptr &&
+                          std::ranges::find(counts, nullptr) == std::end(counts);
+  if (!isComplete) return std::nullopt;
+  return UsageRecord{*name,
+                     isBundle ? "" : "nuvex.",
+                     AsWritten(*since->asDate()),
+                     {*counts[0], *counts[1], *counts[2], *counts[3]}};
+}
+
+std::int64_t DayNumberOfDate(Date date) {
+  return static_cast<std::int64_t>(std::floor(date.secondsSince1970 / kSecondsPerDay));
+}
+
+std::int64_t SaturatingDifference(std::int64_t value, std::int64_t subtracted) {
+  std::int64_t difference = 0;
+  if (!__builtin_sub_overflow(value, subtracted, &difference)) return difference;
+  return value < 0 ? std::numeric_limits<std::int64_t>::min()
+                   : std::numeric_limits<std::int64_t>::max();
+}
+
+// The most that a row takes in the stored document.
+std::size_t RowBytes(std::string_view name) {
+  constexpr std::size_t kRowWithoutName = 320;
+  const auto escaped =
+      std::ranges::count_if(name, [](char c) { return c == '&' || c == '<' || c == '>'; });
+  return kRowWithoutName + name.size() + 4 * static_cast<std::size_t>(escaped);
+}
+
+// Compares the records of one reply with the baseline.
+class UsageComparison {
+ public:
+  UsageComparison(Dictionary baseline, std::int64_t yesterday, CounterBatch& counters)
+      : old_(std::move(baseline)), yesterday_(yesterday), counters_(counters) {}
+
+  void add(const UsageRecord& record) {
+    const std::optional<std::string> name = reserveRow(record.name);
+    if (!name) {
+      ++leftOut_;
+      return;
+    }
+    const auto& counts = record.counts;
+    const Array* previous = ArrayEntry(old_, *name);
+    const Date* start =
+        previous != nullptr && !previous->empty() ? (*previous)[0].asDate() : nullptr;
+    if (start != nullptr && AsWritten(*start) == record.since) {
+      addGrowth(record, *previous);
+    } else {
+      addFirstCounts(record);
+    }
+    new_[*name] = Array{record.since, counts[0], counts[1], counts[2], counts[3]};
+  }
+
+  const Dictionary& baseline() const { return new_; }
+  // How many records were refused for their size.
+  std::uint64_t leftOut() const { return leftOut_; }
+
+ private:
+  // The name under which the row is stored, or nothing when it would be too large.
+  std::optional<std::string> reserveRow(std::string_view name) {
+    if (name.size() > kLongestName) return std::nullopt;
+    std::string stored = AsWritten(name);
+    const std::size_t size = RowBytes(stored);
+    if (size > room_) return std::nullopt;
+    room_ -= size;
+    return stored;
+  }
+
+  void addGrowth(const UsageRecord& record, const Array& previous) {
+    for (std::size_t i = 0; i < kFields.size(); ++i) {
+      const Number* stored = i + 1 < previous.size() ? previous[i + 1].asNumber() : nullptr;
+      const std::int64_t delta = SaturatingDifference(record.counts[i].toInt64(),
+                                                      stored != nullptr ? stored->toInt64() : 0);
+      if (delta > 0) addDataUsageScalar(kFields[i], record, delta);
+      if (delta < 0) addToKey("baddata.", record, 1);
+    }
+  }
+
+  void addFirstCounts(const UsageRecord& record) {
+    if (DayNumberOfDate(record.since) < yesterday_) {
+      addToKey("olddata.", record, 1);
+      return;
+    }
+    for (std::size_t i = 0; i < kFields.size(); ++i) {
+      addDataUsageScalar(kFields[i], record, record.counts[i].toInt64());
+    }
+  }
+
+  // What is less than 1 KB is not recorded.
+  void addDataUsageScalar(std::string_view field, const UsageRecord& record, std::int64_t bytes) {
+    const std::int64_t kilobytes = bytes / 1024;
+    if (kilobytes == 0) return;
+    field.remove_suffix(kFieldSuffix.size());
+    addToKey(std::string(field) + "KB.", record, kilobytes);
+  }
+
+  void addToKey(std::string_view kind, const UsageRecord& record, std::int64_t value) {
+    key_.assign("datausage.").append(kind).append(record.prefix).append(record.name);
+    counters_.TLClientAddValueForScalarKey(key_, value);
+  }
+
+  const Dictionary old_;
+  const std::int64_t yesterday_;
+  CounterBatch& counters_;
+  Dictionary new_;
+  std::size_t room_ = kBaselineBytes;
+  std::uint64_t leftOut_ = 0;
+  std::string key_;
+};
+
+}  // namespace
+
+void processDataUsageReply(const Array& records, CounterStore& counterStore,
+                           Preferences& preferences, SystemLog& log) {
+  // A late reply may meet the one of the next pass, and both would add the same growth.
+  static std::mutex oneAtATime;
+  const std::lock_guard hold(oneAtATime);
+  const std::int64_t yesterday = std::int64_t{counterStore.TLDaysSince1970()} - 1;
+  const auto stored = preferences.DGWPreferencesGetValue(kBaseline, kDomain);
+  const Dictionary* baseline = stored ? stored->asDictionary() : nullptr;
+  CounterBatch counters(counterStore);
+  UsageComparison comparison(baseline != nullptr ? *baseline : Dictionary(), yesterday, counters);
+  for (const PropertyValue& value : records) {
+    const Dictionary* dictionary = value.asDictionary();
+    if (dictionary == nullptr) continue;
+    if (const auto record = ReadRecord(*dictionary)) comparison.add(*record);
+  }
+  if (comparison.leftOut() != 0) {
+    log.error("Left out %llu network usage records whose names are too long or that are too many",
+              comparison.leftOut());
+  }
+  // The two stores cannot be changed at once. This way round, a run that is killed in between loses
+  // no traffic: the next one adds the same growth again.
+  counters.commit();
+  preferences.DGWPreferencesSetValue(kBaseline, comparison.baseline(), kDomain);
+  preferences.DGWPreferencesSynchronize(kDomain);
+}
+
+void collectDataUsage(Platform& platform) {
+  // Shared with the reply, which may come when nobody waits any more.
+  const std::shared_ptr<Semaphore> replied = platform.semaphores.create();
+  platform.networkUsage.QueryProcessDataUsage(
+      {}, UsageNameKind::kProcessName,
+      [replied, &counterStore = platform.counterStore, &preferences = platform.preferences,
+       &log = platform.log](const Array& records) {
+        RunStep(log, "network usage reply",
+                [&] { processDataUsageReply(records, counterStore, preferences, log); });
+        replied->signal();
+      });
+  if (!replied->wait(kReplyLimit)) {
+    platform.log.log("Vigil timed out, no datausage available");
+  }
+}
+
+}  // namespace quorlet

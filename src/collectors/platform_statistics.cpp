@@ -1,0 +1,40 @@
+#include "collectors/platform_statistics.h"
+
+#include <cstdint>
+
+#include "collectors/ecc_events.h"
+#include "collectors/network_usage.h"
+#include "platform/run_step.h"
+
+namespace quorlet {
+namespace {
+
+// The entry, a number of bytes, in MiB; -1 without such an entry.
+std::int64_t Mebibytes(const Dictionary& usage, std::string_view entry) {
+  const auto bytes = IntegerEntry(usage, entry);
+  return bytes ? *bytes >> 20 : -1;
+}
+
+void CollectDiskUsage(DeviceInfo& deviceInfo, CounterBatch& counters) {
+  const auto answer = deviceInfo.DQCopyAnswer("DiskUsage");
+  const Dictionary* dictionary = answer ? answer->asDictionary() : nullptr;
+  const Dictionary usage = dictionary != nullptr ? *dictionary : Dictionary();
+  counters.TLClientSetValueForScalarKey("nuvex.tilehall.DiskUsageUserTotalBlocks",
+                                        Mebibytes(usage, "kDQQDiskUsageTotalDiskCapacity"));
+  counters.TLClientSetValueForScalarKey("nuvex.tilehall.DiskUsageUserBlocksFree",
+                                        Mebibytes(usage, "kDQQDiskUsageTotalDataAvailable"));
+}
+
+}  // namespace
+
+void collectPlatformStatistics(Platform& platform) {
+  SystemLog& log = platform.log;
+  // Committed at the end: nothing of the store is held while a step waits.
+  CounterBatch counters(platform.counterStore);
+  RunStep(log, "disk usage", [&] { CollectDiskUsage(platform.deviceInfo, counters); });
+  RunStep(log, "ECC events", [&] { logECCEvents(platform); });
+  RunStep(log, "network usage", [&] { collectDataUsage(platform); });
+  RunStep(log, "counters", [&] { counters.commit(); });
+}
+
+}  // namespace quorlet

@@ -1,0 +1,148 @@
+#include "driver/tasking.h"
+
+#include <gtest/gtest.h>
+
+#include "fakes/fake_platform.h"
+
+namespace quorlet {
+namespace {
+
+constexpr char kOwn[] = "nuvex.aggregated.quorlet";
+
+PropertyValue Entry(const char* domain, const char* key, PropertyValue value) {
+  return Dictionary{{"Domain", domain}, {"Key", key}, {"Value", std::move(value)}};
+}
+
+// The device runs build A1 on day 20000 and has noted that before.
+class TaskingTest : public testing::Test {
+ protected:
+  TaskingTest() {
+    store(kOwn, "LastOSUpdate", Dictionary{{"version", "A1"}, {"day", Int32(20000)}});
+  }
+  void store(const char* domain, const char* key, std::optional<PropertyValue> value) {
+    device.preferences.DGWPreferencesSetValue(key, std::move(value), domain);
+  }
+  std::string stored(const char* domain, const char* key) {
+    const auto value = device.preferences.DGWPreferencesGetValue(key, domain);
+    return value ? value->description() : "-";
+  }
+  void schedule(const char* id, std::optional<Array> payload) {
+    Dictionary tasking{{"TaskingID", id}, {"TaskingDigest", Int64(9)}};
+    if (payload) tasking["TaskingPayload"] = *payload;
+    store("nuvex.Ferryman", "ScheduledTasking", tasking);
+  }
+  // Runs an update; returns what it said, and whether it announced a change.
+  std::vector<std::string> update() {
+    device.log.lines.clear();
+    device.notifications.posted.clear();
+    updateTasking(device.services);
+    auto texts = device.log.at(LogLevel::kDefault);
+    for (const auto& name : device.notifications.posted) texts.push_back("posted " + name);
+    return texts;
+  }
+
+  FakePlatform device;
+};
+
+using Texts = std::vector<std::string>;
+const char kPosted[] = "posted nuvex.da.tasking_changed";
+
+TEST_F(TaskingTest, ATaskingsLife) {
+  EXPECT_EQ(update(), Texts{}) << "nothing scheduled";
+
+  schedule("one", Array{Entry("x", "a", Int64(1)), Entry("y", "b", "text")});
+  EXPECT_EQ(update(), Texts{kPosted}) << "the first tasking";
+  EXPECT_EQ(stored("x", "a") + stored("y", "b"), "1text");
+  EXPECT_EQ(stored(kOwn, "TaskingID") + stored(kOwn, "TaskingOS") + stored(kOwn, "TaskingDigest"),
+            "oneA19");
+  EXPECT_TRUE(device.preferences.isDurable("a", "x"));
+  EXPECT_TRUE(device.preferences.isDurable("TaskingPayload", kOwn));
+
+  store("x", "a", Int64(5));
+  EXPECT_EQ(update(), Texts{}) << "the same tasking under the same build";
+  EXPECT_EQ(stored("x", "a"), "5");
+
+  schedule("two", Array{Entry("x", "c", true)});
+  EXPECT_EQ(update(), (Texts{"Tasking update (one -> two, A1 -> A1)", kPosted}));
+  EXPECT_EQ(stored("x", "a") + stored("y", "b") + stored("x", "c"), "--1");
+
+  device.osVersion.build = "B2";
+  EXPECT_EQ(update(), (Texts{"OS change since last run (A1 -> B2)",
+                             "Tasking update (two -> two, A1 -> B2)", kPosted}));
+  EXPECT_EQ(stored(kOwn, "LastOSUpdate"), "{\n    day = 20000;\n    version = B2;\n}");
+
+  schedule("three", std::nullopt);
+  EXPECT_EQ(update(), (Texts{"Tasking update (two -> three, B2 -> B2)", kPosted}));
+  EXPECT_EQ(stored("x", "c") + stored(kOwn, "TaskingID") + stored(kOwn, "TaskingPayload"), "---");
+  EXPECT_EQ(stored(kOwn, "TaskingOS"), "B2");
+  EXPECT_EQ(update(), Texts{kPosted}) << "removed but not replaced: like the first tasking";
+}
+
+TEST_F(TaskingTest, WithoutABuildATaskingNeverMatches) {
+  device.osVersion.build.reset();
+  schedule("one", Array{Entry("x", "a", Int64(1))});
+  EXPECT_EQ(update(), Texts{kPosted});
+  EXPECT_EQ(update(), (Texts{"Tasking update (one -> one, (null) -> (null))", kPosted}));
+  EXPECT_EQ(stored("x", "a"), "1");
+}
+
+TEST_F(TaskingTest, OurOwnRecordIsWrittenLast) {
+  schedule("one", Array{Entry("zz", "a", Int64(1)), Entry(kOwn, "k", Int64(1)),
+                        Entry("aa", "a", Int64(1))});
+  device.preferences.synchronized.clear();
+  update();
+  EXPECT_EQ(device.preferences.synchronized, (Texts{"aa", "zz", kOwn}));
+}
+
+TEST_F(TaskingTest, WrongShapesCountAsAbsent) {
+  for (const PropertyValue& scheduled :
+       {PropertyValue("x"), PropertyValue(Array()), PropertyValue(Dictionary()),
+        PropertyValue(Dictionary{{"TaskingID", Int64(1)}, {"TaskingPayload", Array()}})}) {
+    store("nuvex.Ferryman", "ScheduledTasking", scheduled);
+    EXPECT_EQ(update(), Texts{}) << scheduled.description();
+  }
+  store(kOwn, "LastOSUpdate", Int64(3));
+  EXPECT_EQ(update(), Texts{"OS change since last run ((null) -> A1)"});
+  schedule("one", Array{"x", Dictionary{{"Key", "a"}}, Dictionary{{"Domain", "x"}},
+                        Dictionary{{"Domain", Int64(1)}, {"Key", "a"}}, Entry("x", "k", "v")});
+  EXPECT_EQ(update(), Texts{kPosted});
+  EXPECT_EQ(stored("x", "k"), "v");
+  store(kOwn, "TaskingPayload", PropertyValue("x"));
+  schedule("two", Array{Entry("y", "k", "w")});
+  EXPECT_EQ(update().size(), 2u);
+  EXPECT_EQ(stored("x", "k") + stored("y", "k"), "vw") << "nothing known to be removed";
+}
+
+TEST_F(TaskingTest, LogsAreSubmittedForSomeDaysAfterAnOSChange) {
+  schedule("one", Array());
+  update();
+  const struct {
+    PropertyValue days;
+    std::int32_t today;
+    const char* text;
+  } cases[] = {
+      {Int64(3), 20000, "Aggressive submission day 0 of 3; triggering log submission"},
+      {Int64(3), 20002, "Aggressive submission day 2 of 3; triggering log submission"},
+      {Int64(3), 20003, nullptr},
+      {Int64(3), 19998, "Aggressive submission day 2 of 3; triggering log submission"},
+      {Int64(0), 20000, nullptr},
+      {Int64(-1), 20000, nullptr},
+      {"9", 20000, nullptr},
+      {Int64((1ll << 32) + 1), 20000,
+       "Aggressive submission day 0 of 1; triggering log submission"},
+  };
+  for (const auto& c : cases) {
+    device.diagnostics.tasking["AggressiveSubmissionDays"] = c.days;
+    device.diagnostics.submissions = 0;
+    device.clock.goToDay(c.today);
+    EXPECT_EQ(update(), c.text != nullptr ? Texts{c.text} : Texts{}) << c.days.description();
+    EXPECT_EQ(device.diagnostics.submissions, c.text != nullptr ? 1 : 0);
+  }
+  device.clock.goToDay(20000);
+  device.diagnostics.tasking["AggressiveSubmissionDays"] = Int64(3);
+  store("nuvex.Ferryman", "ScheduledTasking", std::nullopt);
+  EXPECT_EQ(update(), Texts{}) << "nothing scheduled, nothing submitted";
+}
+
+}  // namespace
+}  // namespace quorlet
