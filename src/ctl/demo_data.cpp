@@ -1,0 +1,224 @@
+#include "ctl/demo_data.h"
+
+#include <algorithm>
+#include <array>
+#include <span>
+#include <string_view>
+#include <utility>
+#include <variant>
+
+#include "report/config.h"
+#include "values/property_list.h"
+
+namespace quorlet {
+namespace {
+
+// Category bit 8, one element, format simple: what the daily pass collects.
+constexpr std::int64_t kSimpleChannel = 0x0000'0001'0100'0001;
+constexpr std::int64_t kUnitBytes = 0x0900'8200'0000'0000;
+constexpr std::int64_t kHubId = 0x100;
+constexpr std::int64_t kNetworkId = 0x1001;
+
+std::string Document(const PropertyValue& root) {
+  auto document = WriteXmlPropertyList(root);
+  std::string* text = std::get_if<std::string>(&document);
+  return text != nullptr ? std::move(*text) : std::string();
+}
+
+void AppendLittle(std::uint64_t number, std::size_t width, std::string& bytes) {
+  for (std::size_t i = 0; i < width; ++i) bytes += static_cast<char>((number >> (8 * i)) & 0xFF);
+}
+
+std::string Little(std::uint64_t number, std::size_t width) {
+  std::string bytes;
+  AppendLittle(number, width, bytes);
+  return bytes;
+}
+
+Array Bounds(std::span<const std::int64_t> bounds) {
+  Array array;
+  for (const std::int64_t bound : bounds) array.push_back(Int64(bound));
+  return array;
+}
+
+Dictionary SystemMetricKeys() {
+  return {{"nuvex.diagwell.tallyd.database.size", Dictionary()},
+          {"nuvex.diagwell.tallyd.database.corruptions", Dictionary()},
+          {"nuvex.usage.cur_boot_session_cpu_uptime", Dictionary{{kSigFig, Int64(2)}}},
+          {"nuvex.kernel.memorystatus_freeze_count", Dictionary()},
+          {"nuvex.kernel.memorystatus_freeze_pageouts", Dictionary{{kSigFig, Int64(2)}}},
+          {"nuvex.kernel.memorystatus_freeze_budget_pages_remaining", Dictionary()},
+          {"nuvex.kernel.memorystatus_thaw_count", Dictionary()},
+          {"nuvex.kernel.swapusage", Dictionary{{kSigFig, Int64(2)}}}};
+}
+
+Dictionary Whitelist() {
+  const Dictionary twoDigits{{kSigFig, Int64(2)}};
+  const Dictionary applications{
+      {"ScalarKeys", Dictionary{{"nuvex.demo.launches", Dictionary{{kBucketInterval, Int64(100)}}},
+                                {"nuvex.demo.crashes", Dictionary()},
+                                {"nuvex.tilehall.numAllInstalledApps", Dictionary()},
+                                {"nuvex.tilehall.numThirdPartyApps", Dictionary()}}},
+      {"DistributionKeys",
+       Dictionary{
+           {"nuvex.demo.launch.milliseconds",
+            Dictionary{{kIntervals, Bounds(std::array<std::int64_t, 4>{100, 200, 400, 800})}}}}}};
+  const Dictionary battery{
+      {"ScalarKeys", Dictionary{{"nuvex.demo.battery.cycles", Dictionary()}}},
+      {"DistributionKeyPrefixes",
+       Dictionary{
+           {"nuvex.demo.battery.",
+            Dictionary{{kIntervals, Bounds(std::array<std::int64_t, 4>{20, 40, 60, 80})}}}}}};
+  const Dictionary network{
+      {"ScalarKeyPrefixes", Dictionary{{"nuvex.demo.net.", twoDigits}, {"datausage.", twoDigits}}},
+      {"DistributionKeys", Dictionary{{"nuvex.demo.latency.milliseconds", Dictionary()}}}};
+  const Dictionary storage{
+      {"ScalarKeys", Dictionary{{"nuvex.tilehall.DiskUsageUserTotalBlocks", twoDigits},
+                                {"nuvex.tilehall.DiskUsageUserBlocksFree",
+                                 Dictionary{{kBucketInterval, Int64(100)}, {kSigFig, Int64(2)}}}}},
+      {"ScalarKeyPrefixes", Dictionary{{"nuvex.NANDInfo.", Dictionary()}}}};
+  return {{"Applications", applications},
+          {"Battery", battery},
+          {"InternalTesting",
+           Dictionary{{"ScalarKeyPrefixes", Dictionary{{"nuvex.internal.", Dictionary()}}}}},
+          {"Network", network},
+          {"ReportingChannels",
+           Dictionary{{"ScalarKeyPrefixes", Dictionary{{"nuvex.drvreport.", Dictionary()}}}}},
+          {"Storage", storage},
+          {"System", Dictionary{{"ScalarKeys", SystemMetricKeys()}}}};
+}
+
+struct DemoChannel {
+  std::int64_t id;
+  const char* name;
+  std::uint64_t value;
+};
+constexpr std::array<DemoChannel, 3> kNetworkChannels = {
+    {{1, "net0 received", 7'340'032}, {2, "net0 sent", 1'048'576}, {3, "net0 dropped", 4096}}};
+
+// A network driver that publishes a legend, and what the hub delivers for its channels.
+Dictionary NetworkDriver() {
+  Array legendEntries;
+  Array channels;
+  for (const DemoChannel& channel : kNetworkChannels) {
+    legendEntries.push_back(Array{Int64(channel.id), Int64(kSimpleChannel), channel.name});
+    std::string element;
+    AppendLittle(static_cast<std::uint64_t>(kNetworkId), 8, element);
+    AppendLittle(static_cast<std::uint64_t>(channel.id), 8, element);
+    AppendLittle(static_cast<std::uint64_t>(kSimpleChannel), 8, element);
+    AppendLittle(1, 8, element);  // time stamp
+    AppendLittle(channel.value, 8, element);
+    element.resize(64);  // the other values of a simple element stay 0
+    const auto bytes = std::as_bytes(std::span(element));
+    channels.push_back(Dictionary{{"ChannelID", Int64(channel.id)},
+                                  {"Elements", Data(bytes.begin(), bytes.end())}});
+  }
+  const Dictionary legendGroup{
+      {"DrvReportGroupName", "Network"},
+      {"DrvReportChannelInfo", Dictionary{{"DrvReportChannelUnit", Int64(kUnitBytes)}}},
+      {"DrvReportChannels", legendEntries}};
+  return {{"EntryID", Int64(kNetworkId)},
+          {"EntryName", "net0"},
+          {"ClassName", "DemoNetworkController"},
+          {"Properties",
+           Dictionary{{"DrvReportLegendPublic", true}, {"DrvReportLegend", Array{legendGroup}}}},
+          {"Channels", channels}};
+}
+
+Dictionary Hub() {
+  return {{"EntryID", Int64(kHubId)},
+          {"EntryName", "DrvReportHub"},
+          {"ClassName", "DrvReportHub"},
+          {"Properties", Dictionary()}};
+}
+
+Array UsageRecords(Date since) {
+  const auto counts = [since](const char* nameKey, const char* name, std::int64_t wifiIn,
+                              std::int64_t wifiOut, std::int64_t wwanIn, std::int64_t wwanOut) {
+    return Dictionary{{nameKey, name},
+                      {"since", since},
+                      {"wifiInBytes", Int64(wifiIn)},
+                      {"wifiOutBytes", Int64(wifiOut)},
+                      {"wwanInBytes", Int64(wwanIn)},
+                      {"wwanOutBytes", Int64(wwanOut)}};
+  };
+  Dictionary browser = counts("bundleName", "org.example.browser", 52'428'800, 3'145'728, 0, 0);
+  browser["procName"] = "browser";
+  return {browser, counts("procName", "syncd", 8192, 20'480, 4096, 1024)};
+}
+
+std::string DesktopFile(std::string_view name) {
+  return std::string("[Desktop Entry]\nType=Application\nName=")
+      .append(name)
+      .append("\nExec=true\n");
+}
+
+struct DemoScalar {
+  const char* key;
+  std::int64_t value;
+};
+// The last one is not in the whitelist: no log holds it.
+constexpr std::array<DemoScalar, 6> kScalars = {{{"nuvex.demo.launches", 1234},
+                                                 {"nuvex.demo.crashes", 2},
+                                                 {"nuvex.demo.battery.cycles", 417},
+                                                 {"nuvex.demo.net.wifi.bytes", 987'654'321},
+                                                 {"nuvex.demo.net.cellular.bytes", 12'345'678},
+                                                 {"nuvex.demo.unlisted", 42}}};
+
+struct DemoDistribution {
+  const char* key;
+  int low;
+  int high;
+};
+constexpr std::array<DemoDistribution, 3> kDistributions = {
+    {{"nuvex.demo.launch.milliseconds", 60, 1200},
+     {"nuvex.demo.battery.level", 5, 100},
+     {"nuvex.demo.latency.milliseconds", 8, 250}}};
+
+constexpr std::int32_t kSampleSpacing = 300;  // seconds
+
+// Values that look measured, and are the same on every machine.
+std::vector<DistributionSample> DemoSamples(const DemoDistribution& distribution) {
+  std::vector<DistributionSample> samples;
+  std::uint32_t state = 1;
+  for (std::int32_t second = 0; second < 86400; second += kSampleSpacing) {
+    state = state * 1'664'525 + 1'013'904'223;
+    const auto range = static_cast<std::uint32_t>(distribution.high - distribution.low);
+    const double value = distribution.low + static_cast<double>((state >> 8) % (range * 4)) / 4;
+    samples.push_back({value, second});
+  }
+  return samples;
+}
+
+}  // namespace
+
+std::vector<DemoFile> MakeDemoFiles(Date startOfToday) {
+  return {
+      {std::string(kWhitelistPath), Document(Whitelist())},
+      {"/var/mobile/Library/Preferences/nuvex.diagwell.plist",
+       Document(Dictionary{{"SubmissionEnabled", true}})},
+      {"/var/db/drivers/hub.plist", Document(Hub())},
+      {"/var/db/drivers/net0.plist", Document(NetworkDriver())},
+      {"/var/db/vigil/usage.plist", Document(UsageRecords(startOfToday))},
+      {"/var/db/kernel/kern.memorystatus_freeze_count", Little(17, 4)},
+      {"/var/db/kernel/kern.memorystatus_freeze_pageouts", Little(52'311, 8)},
+      {"/var/db/kernel/kern.memorystatus_freeze_budget_pages_remaining", Little(20'480, 8)},
+      {"/var/db/kernel/kern.memorystatus_thaw_count", Little(5, 4)},
+      {"/etc/os-release", "NAME=\"Demo OS\"\nVERSION_ID=1.0\nBUILD_ID=1A1\n"},
+      {"/etc/machine-id", "00000000000000000000000000000de0\n"},
+      {"/usr/share/applications/org.example.clock.desktop", DesktopFile("Clock")},
+      {"/usr/local/share/applications/org.example.browser.desktop", DesktopFile("Browser")},
+  };
+}
+
+bool AddDemoCounters(TallyLedger& ledger, std::int32_t day) {
+  return std::ranges::all_of(kScalars,
+                             [&](const DemoScalar& scalar) {
+                               return ledger.setScalar(scalar.key, day, scalar.value);
+                             }) &&
+         std::ranges::all_of(kDistributions, [&](const DemoDistribution& distribution) {
+           return ledger.recordValues(distribution.key, day, DemoSamples(distribution));
+         });
+}
+
+}  // namespace quorlet

@@ -1,0 +1,28 @@
+// What "quorletctl init --demo" puts into a root: enough for a pass to have something to report.
+#ifndef QUORLET_CTL_DEMO_DATA_H_
+#define QUORLET_CTL_DEMO_DATA_H_
+
+#include <cstdint>
+#include <string>
+#include <vector>
+
+#include "platform/linux/tally_ledger.h"
+#include "values/property_value.h"
+
+namespace quorlet {
+
+struct DemoFile {
+  std::string path;  // absolute path of the system
+  std::string bytes;
+};
+
+// A whitelist, preferences, drivers, usage records since the start of `today`, kernel parameters,
+// an OS release, a machine id and two applications.
+std::vector<DemoFile> MakeDemoFiles(Date startOfToday);
+
+// Counters of the day: scalars and distributions. False after an error line.
+[[nodiscard]] bool AddDemoCounters(TallyLedger& ledger, std::int32_t day);
+
+}  // namespace quorlet
+
+#endif  // QUORLET_CTL_DEMO_DATA_H_

@@ -1,0 +1,211 @@
+// quorletctl logs: the logs that were written for submission.
+//
+// A log is one line of JSON (the header), then the body.
+#include <fcntl.h>
+#include <sys/stat.h>
+#include <unistd.h>
+
+#include <CLI/CLI.hpp>
+#include <algorithm>
+#include <array>
+#include <memory>
+#include <tuple>
+#include <vector>
+
+#include "ctl/json_value.h"
+#include "ctl/options.h"
+#include "ctl/session.h"
+#include "values/property_list.h"
+#include "values/text.h"
+
+namespace quorlet {
+namespace {
+
+constexpr std::string_view kLogsDirectory = "/var/mobile/Library/Logs/Diagwell/";
+// In the order in which a log passes through them.
+constexpr std::array<std::string_view, 2> kStages = {"pending", "outbox"};
+// All logs together take no more.
+constexpr std::size_t kMaxLogBytes = 64 << 20;
+constexpr std::size_t kMaxHeaderBytes = 1 << 20;
+constexpr std::string_view kLatest = "latest";
+
+struct LogsArguments {
+  std::string file;
+  bool json = false;
+};
+
+struct StoredLog {
+  std::string stage;
+  std::string name;
+  std::uint64_t size = 0;
+  std::string created;  // RFC 3339
+  std::string type;     // empty: the header cannot be read
+  timespec modified{};
+};
+
+std::string StageDirectory(std::string_view stage) {
+  return Root::FromEnvironment().path(std::string(kLogsDirectory).append(stage));
+}
+
+// The log's first line, or nothing when it is not a JSON object.
+std::optional<Dictionary> ParseHeader(std::string_view log) {
+  const std::string_view line = log.substr(0, std::min(log.find('\n'), kMaxHeaderBytes));
+  const auto parsed = ParseJson(line, JsonForm::kPlain);
+  const auto* value = std::get_if<PropertyValue>(&parsed);
+  const Dictionary* header = value != nullptr ? value->asDictionary() : nullptr;
+  return header != nullptr ? std::optional(*header) : std::nullopt;
+}
+
+std::string StringMember(const Dictionary& header, std::string_view name) {
+  const std::string* text = StringEntry(header, name);
+  return text != nullptr ? *text : std::string();
+}
+
+// The first bytes of an open file, up to the end of its first line or kMaxHeaderBytes.
+std::string ReadFirstLine(int descriptor) {
+  std::string bytes;
+  std::array<char, 4096> block;
+  while (bytes.size() < kMaxHeaderBytes && bytes.find('\n') == std::string::npos) {
+    const ssize_t size = ::read(descriptor, block.data(), block.size());
+    if (size <= 0) break;
+    bytes.append(block.data(), static_cast<std::size_t>(size));
+  }
+  return bytes;
+}
+
+// Nothing for what is not a regular file, or has gone meanwhile.
+std::optional<StoredLog> Examine(std::string_view stage, const std::string& name) {
+  const std::string path = StageDirectory(stage) + "/" + name;
+  const int descriptor = ::open(path.c_str(), O_RDONLY | O_NONBLOCK | O_NOFOLLOW | O_CLOEXEC);
+  if (descriptor < 0) return std::nullopt;
+  struct stat status {};
+  std::optional<StoredLog> log;
+  if (::fstat(descriptor, &status) == 0 && S_ISREG(status.st_mode)) {
+    const Dictionary header = ParseHeader(ReadFirstLine(descriptor)).value_or(Dictionary());
+    log = StoredLog{std::string(stage),
+                    name,
+                    static_cast<std::uint64_t>(status.st_size),
+                    StringMember(header, "created"),
+                    StringMember(header, "type"),
+                    status.st_mtim};
+    // A text of another form would upset the order of creation.
+    if (log->created.size() != Rfc3339({}).size()) {
+      log->created = Rfc3339({static_cast<double>(status.st_mtim.tv_sec)});
+    }
+  }
+  ::close(descriptor);
+  return log;
+}
+
+// Every log, the newest last.
+std::vector<StoredLog> FindLogs() {
+  std::vector<StoredLog> logs;
+  for (const std::string_view stage : kStages) {
+    for (const std::string& name : ListDirectory(StageDirectory(stage))) {
+      // Temporary files are hidden.
+      if (name.starts_with('.')) continue;
+      if (auto log = Examine(stage, name)) logs.push_back(std::move(*log));
+    }
+  }
+  std::ranges::sort(logs, {}, [](const StoredLog& log) {
+    return std::tuple(log.created, log.modified.tv_sec, log.modified.tv_nsec, log.name);
+  });
+  return logs;
+}
+
+void List(Session& session, const LogsArguments& arguments) {
+  const std::vector<StoredLog> logs = FindLogs();
+  if (arguments.json) {
+    Array list;
+    for (const StoredLog& log : logs) {
+      list.push_back(Dictionary{{"directory", log.stage},
+                                {"name", log.name},
+                                {"size", UInt64(log.size)},
+                                {"created", log.created},
+                                {"type", log.type}});
+    }
+    session.out.line(JsonText(list, JsonForm::kPlain));
+    return;
+  }
+  for (const StoredLog& log : logs) {
+    const std::string size = std::to_string(log.size);
+    std::string line = log.stage == kStages[0] ? "pending  " : "outbox   ";
+    line += Escape(log.created);
+    line.append(size.size() < 9 ? 9 - size.size() : 1, ' ').append(size).append("  type ");
+    line += log.type.empty() ? "?" : Escape(log.type);
+    line.append("  ").append(Escape(log.name));
+    session.out.line(line);
+  }
+}
+
+std::string ReadLog(const std::string& path) {
+  auto bytes = ReadWholeFile(path, kMaxLogBytes);
+  if (const int* error = std::get_if<int>(&bytes)) {
+    throw Failure("cannot read " + path + ": " + ErrnoText(*error));
+  }
+  return std::get<std::string>(std::move(bytes));
+}
+
+// The log of that name, wherever it has got to.
+std::string ReadNamedLog(const std::string& name) {
+  if (!IsSafeName(name)) throw Failure("not the name of a log: " + name);
+  for (const std::string_view stage : kStages) {
+    const std::string path = StageDirectory(stage) + "/" + name;
+    if (::access(path.c_str(), F_OK) == 0) return ReadLog(path);
+  }
+  throw Failure("neither pending nor outbox has a log " + name);
+}
+
+std::string ReadRequestedLog(const std::string& file) {
+  if (file.find('/') != std::string::npos) return ReadLog(file);
+  if (file != kLatest) return ReadNamedLog(file);
+  const std::vector<StoredLog> logs = FindLogs();
+  if (logs.empty()) throw Failure("there is no log yet");
+  return ReadNamedLog(logs.back().name);
+}
+
+void Show(Session& session, const LogsArguments& arguments) {
+  const std::string log = ReadRequestedLog(arguments.file);
+  if (!arguments.json) {
+    session.out.write(log);
+    return;
+  }
+  const auto header = ParseHeader(log);
+  if (!header) throw Failure("the log does not start with a line of JSON");
+  const std::size_t lineBreak = log.find('\n');
+  const std::string_view body =
+      lineBreak == std::string::npos ? "" : std::string_view(log).substr(lineBreak + 1);
+  const auto document = ReadPropertyList(body);
+  const auto* value = std::get_if<PropertyValue>(&document);
+  const Dictionary both{{"header", *header},
+                        {"body", value != nullptr ? *value : PropertyValue(body)}};
+  session.out.line(JsonText(both, JsonForm::kPlain));
+}
+
+}  // namespace
+
+void AddLogsCommands(CLI::App& app, Session& session) {
+  CLI::App* logs = AddFamily(app, "logs", "Logs written for submission: pending and outbox",
+                             "quorletctl logs show latest");
+  const auto arguments = std::make_shared<LogsArguments>();
+  CLI::App* list = AddCommand(*logs, "list", "List the logs, the newest last", "",
+                              "quorletctl logs list --json");
+  AddJsonFlag(*list, arguments->json);
+  list->callback([&session, arguments] {
+    session.command = [&session, arguments] { List(session, *arguments); };
+  });
+
+  CLI::App* show =
+      AddCommand(*logs, "show", "Print a log",
+                 "What is printed is the header, one line of JSON, then the body.\n"
+                 "With --json: one object with \"header\" and \"body\" (a property list as JSON).",
+                 "quorletctl logs show latest");
+  show->add_option("FILE", arguments->file, "A listed name, \"latest\", or a path with a \"/\"")
+      ->required();
+  AddJsonFlag(*show, arguments->json);
+  show->callback([&session, arguments] {
+    session.command = [&session, arguments] { Show(session, *arguments); };
+  });
+}
+
+}  // namespace quorlet

@@ -1,0 +1,109 @@
+// quorletctl: the companion program for people and scripts.
+//
+// Exit status: 0, 1 when the command failed, 2 when the command line makes no sense. Both of the
+// latter come with exactly one line on standard error.
+#include <fcntl.h>
+
+#include <CLI/CLI.hpp>
+#include <csignal>
+#include <cstdlib>
+
+#include "ctl/session.h"
+
+namespace quorlet {
+namespace {
+
+constexpr int kFailed = 1;
+constexpr int kUsage = 2;
+
+// A closed standard stream must not become the descriptor of a file that is written; opened the
+// wrong way round, its use still fails.
+void OccupyStandardStreams() {
+  for (const int stream : {0, 1, 2}) {
+    if (::fcntl(stream, F_GETFD) != -1) continue;
+    [[maybe_unused]] const int opened = ::open("/dev/null", stream == 0 ? O_WRONLY : O_RDONLY);
+  }
+}
+
+void AddCommands(CLI::App& app, Session& session) {
+  app.require_subcommand(1);
+  app.set_version_flag("--version", "quorletctl " QUORLET_VERSION);
+  app.footer(
+      "QUORLET_ROOT names the directory that stands for \"/\" (default: the machine's own).\n"
+      "Exit status: 0, 1 failed, 2 wrong usage.\n"
+      "Example: QUORLET_ROOT=/tmp/demo quorletctl init --demo");
+  AddInitCommand(app, session);
+  AddTallyCommands(app, session);
+  AddPrefsCommands(app, session);
+  AddReportCommands(app, session);
+  AddLogsCommands(app, session);
+  AddWhitelistCommands(app, session);
+  AddSendCommands(app, session);
+}
+
+int ReportUsage(const CLI::App& app, std::string_view why) {
+  std::string command = "quorletctl";
+  const CLI::App* level = &app;
+  while (!level->get_subcommands().empty()) {
+    level = level->get_subcommands().front();
+    command += " " + level->get_name();
+  }
+  PrintErrorLine(std::string(why) + " (see: " + command + " --help)");
+  return kUsage;
+}
+
+// Parses the command line; when it holds a command, `session.command` is set.
+int Parse(CLI::App& app, Session& session, int argc, char** argv) {
+  try {
+    app.parse(argc, argv);
+  } catch (const CLI::CallForHelp&) {
+    session.out.write(app.help());
+  } catch (const CLI::CallForVersion&) {
+    session.out.line(app.version());
+  } catch (const CLI::RequiredError& error) {
+    // A misspelt command is one that is missing, and a word too many.
+    const std::vector<std::string> words = app.remaining(true);
+    return ReportUsage(app, words.empty() ? error.what() : "Unknown: " + words.front());
+  } catch (const CLI::ParseError& error) {
+    return ReportUsage(app, error.what());
+  }
+  return 0;
+}
+
+int Run(int argc, char** argv) {
+  Session session;
+  CLI::App app("Puts counters, preferences and whitelists before quorlet and shows its logs.",
+               "quorletctl");
+  AddCommands(app, session);
+  if (const int status = Parse(app, session, argc, argv)) return status;
+  try {
+    if (session.command) session.command();
+  } catch (const std::exception& failure) {
+    // What has been written already belongs to the result as far as it goes.
+    [[maybe_unused]] const bool written = session.out.finish();
+    PrintErrorLine(failure.what());
+    return kFailed;
+  }
+  if (!session.out.finish()) {
+    PrintErrorLine("cannot write to standard output: " + ErrnoText(session.out.error()));
+    return kFailed;
+  }
+  session.messages.print();
+  return 0;
+}
+
+}  // namespace
+}  // namespace quorlet
+
+int main(int argc, char** argv) {
+  quorlet::OccupyStandardStreams();
+  // A closed pipe and a file that hits the size limit are failed writes like any other.
+  std::signal(SIGPIPE, SIG_IGN);
+  std::signal(SIGXFSZ, SIG_IGN);
+  try {
+    return quorlet::Run(argc, argv);
+  } catch (const std::exception& failure) {
+    quorlet::PrintErrorLine(failure.what());
+    return quorlet::kFailed;
+  }
+}

@@ -1,0 +1,53 @@
+#include "ctl/messages.h"
+
+#include <unistd.h>
+
+#include "ctl/output.h"
+
+namespace quorlet {
+namespace {
+
+// A damaged whitelist can have a message for each of its entries.
+constexpr std::size_t kMaxMessages = 1000;
+constexpr std::size_t kMaxMessageBytes = 4096;
+
+class CollectingLog final : public SystemLog {
+ public:
+  explicit CollectingLog(Messages& messages) : messages_(messages) {}
+  void write(LogLevel level, std::string_view text) override { messages_.add(level, text); }
+
+ private:
+  Messages& messages_;
+};
+
+}  // namespace
+
+void PrintErrorLine(std::string_view text) {
+  const std::string line = "quorletctl: " + Escape(text) + "\n";
+  // Nothing is left to say when standard error fails.
+  [[maybe_unused]] const ssize_t written = ::write(STDERR_FILENO, line.data(), line.size());
+}
+
+std::unique_ptr<SystemLog> Messages::makeLog() { return std::make_unique<CollectingLog>(*this); }
+
+void Messages::add(LogLevel level, std::string_view text) {
+  if (level < lowest_) return;
+  if (kept_.size() == kMaxMessages) {
+    ++dropped_;
+    if (level == LogLevel::kError) errors_.back() = text.substr(0, kMaxMessageBytes);
+    return;
+  }
+  kept_.emplace_back(text.substr(0, kMaxMessageBytes));
+  if (level == LogLevel::kError) errors_.push_back(kept_.back());
+}
+
+std::string Messages::lastErrorOr(std::string_view otherwise) const {
+  return errors_.empty() ? std::string(otherwise) : errors_.back();
+}
+
+void Messages::print() const {
+  for (const std::string& message : kept_) PrintErrorLine(message);
+  if (dropped_ != 0) PrintErrorLine("and " + Counted(dropped_, "more message"));
+}
+
+}  // namespace quorlet

@@ -1,0 +1,59 @@
+// Options and arguments that several commands have, strictly read.
+#ifndef QUORLET_CTL_OPTIONS_H_
+#define QUORLET_CTL_OPTIONS_H_
+
+#include <charconv>
+#include <concepts>
+#include <cstdint>
+#include <limits>
+#include <optional>
+#include <string>
+#include <string_view>
+#include <system_error>
+
+namespace CLI {
+class App;
+class Option;
+}  // namespace CLI
+
+namespace quorlet {
+
+// The lowest day is left out: a history query needs the day before.
+inline constexpr std::int32_t kFirstDay = std::numeric_limits<std::int32_t>::min() + 1;
+inline constexpr std::int32_t kLastDay = std::numeric_limits<std::int32_t>::max();
+inline constexpr std::int32_t kLastSecond = 86399;
+
+// The whole text as a decimal number (a real: also "1e9", "inf", "nan"), or nothing when it is not
+// one or does not fit.
+template <typename T>
+requires std::integral<T> || std::same_as<T, double> std::optional<T> ParseNumber(
+    std::string_view text) {
+  T value{};
+  const char* end = text.data() + text.size();
+  const auto [stopped, error] = std::from_chars(text.data(), end, value);
+  if (error != std::errc{} || stopped != end) return std::nullopt;
+  return value;
+}
+
+// A day number, kFirstDay to kLastDay.
+std::optional<std::int32_t> ParseDay(std::string_view text);
+// A second of the day, 0 to kLastSecond.
+std::optional<std::int32_t> ParseSecond(std::string_view text);
+
+// Adds "--day N"; `meaning` says what it does and what holds without it.
+void AddDayOption(CLI::App& command, std::optional<std::int32_t>& day, const std::string& meaning);
+
+void AddJsonFlag(CLI::App& command, bool& json);
+
+// A command. `description` fits a line; `notes`, lines of their own or nothing, and `example` end
+// its help.
+CLI::App* AddCommand(CLI::App& parent, const std::string& name, const std::string& description,
+                     const std::string& notes, const std::string& example);
+
+// A command that only holds further ones, of which one must be given.
+CLI::App* AddFamily(CLI::App& parent, const std::string& name, const std::string& description,
+                    const std::string& example);
+
+}  // namespace quorlet
+
+#endif  // QUORLET_CTL_OPTIONS_H_

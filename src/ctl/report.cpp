@@ -1,0 +1,129 @@
+// quorletctl report: the aggregated log that a pass would write.
+#include "report/report.h"
+
+#include <CLI/CLI.hpp>
+#include <memory>
+
+#include "ctl/json_value.h"
+#include "ctl/options.h"
+#include "ctl/session.h"
+#include "values/property_list.h"
+
+namespace quorlet {
+namespace {
+
+struct PreviewArguments {
+  std::optional<std::int32_t> day;
+  bool json = false;
+};
+
+// The diagnostics library, except that a log is kept in memory instead of being written.
+class CapturingDiagnostics final : public Diagnostics {
+ public:
+  explicit CapturingDiagnostics(Diagnostics& diagnostics) : diagnostics_(diagnostics) {}
+
+  bool DiagnosticLogSubmissionEnabled() override {
+    return diagnostics_.DiagnosticLogSubmissionEnabled();
+  }
+  std::string DGWOSVersion() override { return diagnostics_.DGWOSVersion(); }
+  std::optional<PropertyValue> DGWGetDATaskingValue(std::string_view name) override {
+    return diagnostics_.DGWGetDATaskingValue(name);
+  }
+  bool DGWWriteLogForSubmission(std::string_view, std::string_view,
+                                const std::optional<Dictionary>&,
+                                const LogWriter& writer) override {
+    Capture capture;
+    if (!writer(capture)) return false;
+    body_ = std::move(capture.bytes);
+    return true;
+  }
+  void SubmitDiagnosticLogs() override {}
+
+  // The captured log's body, or nothing when none was written.
+  const std::optional<std::string>& body() const { return body_; }
+
+ private:
+  struct Capture final : LogOutput {
+    bool write(std::string_view more) override {
+      bytes += more;
+      return true;
+    }
+    std::string bytes;
+  };
+
+  Diagnostics& diagnostics_;
+  std::optional<std::string> body_;
+};
+
+Platform WithDiagnostics(const Platform& services, Diagnostics& diagnostics) {
+  return {.log = services.log,
+          .clock = services.clock,
+          .preferences = services.preferences,
+          .counterStore = services.counterStore,
+          .diagnostics = diagnostics,
+          .crashSupport = services.crashSupport,
+          .supportLibrary = services.supportLibrary,
+          .deviceInfo = services.deviceInfo,
+          .osVersion = services.osVersion,
+          .kernelParameters = services.kernelParameters,
+          .environment = services.environment,
+          .queries = services.queries,
+          .applications = services.applications,
+          .locale = services.locale,
+          .passLock = services.passLock,
+          .namedService = services.namedService,
+          .notifications = services.notifications,
+          .networkUsage = services.networkUsage,
+          .semaphores = services.semaphores};
+}
+
+// Says why there is no document as well as it can be known: the first complaint of the layers
+// below is the likely cause.
+std::string NothingToReport(std::int32_t day, const Messages& messages) {
+  std::string text = "nothing to report for day " + std::to_string(day);
+  if (!messages.errors().empty()) text += " (" + messages.errors().front() + ")";
+  return text;
+}
+
+void Preview(Session& session, const PreviewArguments& arguments) {
+  const auto platform = session.open(Access::kReadOnly);
+  CapturingDiagnostics diagnostics(platform->services().diagnostics);
+  Platform services = WithDiagnostics(platform->services(), diagnostics);
+  const std::int32_t day =
+      arguments.day ? *arguments.day : services.counterStore.TLDaysSince1970() - 1;
+
+  TLReport report(services);
+  report.writeLogForYesterdayWithAppInfo(day, std::nullopt);
+  if (!diagnostics.body()) throw Failure(NothingToReport(day, session.messages));
+
+  if (arguments.json) {
+    const auto document = ReadPropertyList(*diagnostics.body());
+    if (const auto* error = std::get_if<PropertyListError>(&document)) {
+      throw Failure("the document cannot be read back: " + error->description);
+    }
+    session.out.line(JsonText(std::get<PropertyValue>(document), JsonForm::kPlain));
+  } else {
+    session.out.write(*diagnostics.body());
+  }
+  if (!services.diagnostics.DiagnosticLogSubmissionEnabled()) {
+    session.messages.add(LogLevel::kDefault,
+                         "note: submission is disabled, a pass would not write this log");
+  }
+}
+
+}  // namespace
+
+void AddReportCommands(CLI::App& app, Session& session) {
+  CLI::App* report = AddFamily(app, "report", "The aggregated log", "quorletctl report preview");
+  const auto arguments = std::make_shared<PreviewArguments>();
+  CLI::App* preview =
+      AddCommand(*report, "preview", "Print the log that a pass for a day would write",
+                 "Nothing changes.", "quorletctl report preview --day 20516");
+  AddDayOption(*preview, arguments->day, "Day number (without it: yesterday)");
+  AddJsonFlag(*preview, arguments->json);
+  preview->callback([&session, arguments] {
+    session.command = [&session, arguments] { Preview(session, *arguments); };
+  });
+}
+
+}  // namespace quorlet

@@ -1,0 +1,259 @@
+// quorletctl tally: counters in and out of the counter store.
+#include <CLI/CLI.hpp>
+#include <cmath>
+#include <memory>
+#include <vector>
+
+#include "ctl/json_value.h"
+#include "ctl/options.h"
+#include "ctl/session.h"
+#include "ctl/tally_import.h"
+#include "ctl/tally_lines.h"
+
+namespace quorlet {
+namespace {
+
+constexpr char kStoreSilent[] = "the counter store could not be written";
+
+struct TallyArguments {
+  std::string key;
+  std::int64_t scalar = 0;
+  std::vector<double> numbers;
+  std::optional<std::int32_t> day;
+  std::optional<std::int32_t> second;
+  std::string file = "-";
+  bool json = false;
+};
+using Arguments = std::shared_ptr<TallyArguments>;
+
+std::int32_t DayOrToday(const TallyArguments& arguments, LinuxPlatform& platform) {
+  return arguments.day ? *arguments.day : platform.services().counterStore.TLDaysSince1970();
+}
+
+std::int32_t SecondOfToday(LinuxPlatform& platform) {
+  const double now = std::floor(platform.services().clock.now().secondsSince1970);
+  return static_cast<std::int32_t>(now - std::floor(now / 86400) * 86400);
+}
+
+void ChangeScalar(Session& session, const TallyArguments& arguments, bool add) {
+  const auto platform = session.open(Access::kReadWrite);
+  const std::int32_t day = DayOrToday(arguments, *platform);
+  TallyLedger& ledger = platform->ledger();
+  const bool kept = add ? ledger.addToScalar(arguments.key, day, arguments.scalar)
+                        : ledger.setScalar(arguments.key, day, arguments.scalar);
+  if (!kept) throw Failure(session.messages.lastErrorOr(kStoreSilent));
+}
+
+void Record(Session& session, const TallyArguments& arguments) {
+  const auto platform = session.open(Access::kReadWrite);
+  const std::int32_t day = DayOrToday(arguments, *platform);
+  const std::int32_t second = arguments.second ? *arguments.second : SecondOfToday(*platform);
+  std::vector<DistributionSample> samples;
+  for (const double number : arguments.numbers) samples.push_back({number, second});
+  if (!platform->ledger().recordValues(arguments.key, day, samples)) {
+    throw Failure(session.messages.lastErrorOr(kStoreSilent));
+  }
+}
+
+void Import(Session& session, const TallyArguments& arguments) {
+  const auto platform = session.open(Access::kReadWrite);
+  const ImportCounts counts = ImportTallies(arguments.file, platform->ledger(), session.messages);
+  session.out.line("imported " + Counted(counts.scalars, "scalar") + " and " +
+                   Counted(counts.values, "value"));
+}
+
+// Writes the rows of the store as lines or as one JSON object, row by row.
+class Dump {
+ public:
+  Dump(Output& out, bool json) : out_(out), json_(json) {}
+
+  void run(TLHistory* history, std::optional<std::int32_t> day) {
+    const std::int32_t above = day ? *day - 1 : kFirstDay - 1;
+    const std::int32_t upTo = day ? *day : kLastDay;
+    if (json_) out_.write("{\"scalars\":[");
+    if (history != nullptr) {
+      history->scalarsForKeyPrefixMinDaysSince1970MaxDaysSince1970RowHandler(
+          "", above, upTo,
+          [this](std::string_view key, std::int32_t rowDay, std::int64_t value, bool& stop) {
+            scalar(key, rowDay, value);
+            stop = !out_.ok();
+          });
+    }
+    if (json_) out_.write("],\"distributions\":[");
+    isFirst_ = true;
+    if (history != nullptr) {
+      history->distributionsForKeyPrefixMinDaysSince1970MaxDaysSince1970RowHandler(
+          "", above, upTo,
+          [this](std::string_view key, std::int32_t rowDay, TLHistoryDistributionEnumerator& values,
+                 bool& stop) {
+            distribution(key, rowDay, values);
+            stop = !out_.ok();
+          });
+    }
+    if (json_) out_.line("]}");
+  }
+
+ private:
+  void scalar(std::string_view key, std::int32_t day, std::int64_t value) {
+    buffer_.clear();
+    if (json_) {
+      openRow(key, day);
+      buffer_ += "\"value\":" + std::to_string(value) + "}";
+    } else {
+      AppendScalarLine(day, Escape(key), value, buffer_);
+    }
+    out_.write(buffer_);
+  }
+
+  void distribution(std::string_view key, std::int32_t day,
+                    TLHistoryDistributionEnumerator& values) {
+    const std::string escapedKey = Escape(key);
+    buffer_.clear();
+    if (json_) {
+      openRow(key, day);
+      buffer_ += "\"values\":[";
+    }
+    bool isFirstValue = true;
+    DistributionSample sample;
+    while (out_.ok() && values.getNextValueSecondsInDayOffset(sample.value, sample.secondsInDay)) {
+      if (json_) {
+        appendPair(sample, isFirstValue);
+        isFirstValue = false;
+      } else {
+        AppendSampleLine(day, escapedKey, sample, buffer_);
+      }
+      out_.write(buffer_);
+      buffer_.clear();
+    }
+    if (json_) buffer_ += "]}";
+    out_.write(buffer_);
+  }
+
+  void openRow(std::string_view key, std::int32_t day) {
+    buffer_ += isFirst_ ? "\n" : ",\n";
+    isFirst_ = false;
+    buffer_ +=
+        "{\"day\":" + std::to_string(day) + ",\"key\":" + JsonText(key, JsonForm::kPlain) + ",";
+  }
+
+  void appendPair(const DistributionSample& sample, bool isFirstValue) {
+    if (!isFirstValue) buffer_ += ',';
+    buffer_ += '[' + std::to_string(sample.secondsInDay) + ',';
+    const std::string number = RealText(sample.value);
+    buffer_ += std::isfinite(sample.value) ? number : '"' + number + '"';
+    buffer_ += ']';
+  }
+
+  Output& out_;
+  bool json_;
+  bool isFirst_ = true;
+  std::string buffer_;
+};
+
+void DumpTallies(Session& session, const TallyArguments& arguments) {
+  const auto platform = session.open(Access::kReadOnly);
+  const auto history = platform->ledger().openHistory();
+  // A store that is not there yet holds nothing; one that cannot be read has said so.
+  Dump(session.out, arguments.json).run(history.get(), arguments.day);
+  if (!session.messages.errors().empty()) throw Failure(session.messages.lastErrorOr(""));
+}
+
+void AddKey(CLI::App& command, TallyArguments& arguments) {
+  command.add_option("KEY", arguments.key, "The counter's key, any bytes")->required();
+}
+
+void AddScalarCommand(CLI::App& tally, Session& session, bool add) {
+  const auto arguments = std::make_shared<TallyArguments>();
+  const std::string name = add ? "add" : "set";
+  CLI::App* command =
+      AddCommand(tally, name, add ? "Add to a scalar (a missing one counts as 0)" : "Set a scalar",
+                 "", "quorletctl tally " + name + " nuvex.demo.launches 5");
+  AddKey(*command, *arguments);
+  const auto parse = [arguments](const std::string& text) {
+    const auto value = ParseNumber<std::int64_t>(text);
+    if (!value) throw CLI::ValidationError("VALUE", "not a whole number of 64 bits: " + text);
+    arguments->scalar = *value;
+  };
+  command->add_option_function<std::string>("VALUE", parse, "A whole number")->required();
+  AddDayOption(*command, arguments->day, "Day number (without it: today)");
+  command->callback([&session, arguments, add] {
+    session.command = [&session, arguments, add] { ChangeScalar(session, *arguments, add); };
+  });
+}
+
+void AddRecordCommand(CLI::App& tally, Session& session) {
+  const auto arguments = std::make_shared<TallyArguments>();
+  CLI::App* command =
+      AddCommand(tally, "record", "Record values of a distribution",
+                 "Values like -inf and -.5, and keys with a \"-\" in front, go after \"--\".",
+                 "quorletctl tally record nuvex.demo.latency 12.5 -3 80 --second 43200");
+  AddKey(*command, *arguments);
+  const auto parse = [arguments](const std::vector<std::string>& texts) {
+    for (const std::string& text : texts) {
+      const auto number = ParseNumber<double>(text);
+      if (!number) throw CLI::ValidationError("VALUE", "not a number: " + text);
+      arguments->numbers.push_back(*number);
+    }
+  };
+  command
+      ->add_option_function<std::vector<std::string>>("VALUE", parse,
+                                                      "Numbers, also inf and nan, in order")
+      ->required();
+  AddDayOption(*command, arguments->day, "Day number (without it: today)");
+  const auto parseSecond = [arguments](const std::string& text) {
+    arguments->second = ParseSecond(text);
+    if (!arguments->second) {
+      throw CLI::ValidationError("--second", "not a second of the day: " + text);
+    }
+  };
+  command
+      ->add_option_function<std::string>("--second", parseSecond,
+                                         "Second of the day, 0 to 86399 (without it: now)")
+      ->type_name("S");
+  command->callback([&session, arguments] {
+    session.command = [&session, arguments] { Record(session, *arguments); };
+  });
+}
+
+void AddImportCommand(CLI::App& tally, Session& session) {
+  const auto arguments = std::make_shared<TallyArguments>();
+  CLI::App* command = AddCommand(
+      tally, "import", "Import lines, all of them or none",
+      "The fields of a line are separated by one tab:\n"
+      "  scalar DAY KEY VALUE\n"
+      "  value DAY KEY SECOND NUMBER\n"
+      "In a KEY, \\t \\n \\r \\\\ and \\xNN stand for a tab, line feed, carriage return,\n"
+      "backslash and the byte NN (hexadecimal).",
+      "quorletctl tally dump | QUORLET_ROOT=/tmp/copy quorletctl tally import");
+  command->add_option("FILE", arguments->file, "The file (without it, or \"-\": standard input)");
+  command->callback([&session, arguments] {
+    session.command = [&session, arguments] { Import(session, *arguments); };
+  });
+}
+
+void AddDumpCommand(CLI::App& tally, Session& session) {
+  const auto arguments = std::make_shared<TallyArguments>();
+  CLI::App* command =
+      AddCommand(tally, "dump", "Print counters as lines that \"tally import\" reads",
+                 "Scalars come first; both are ordered by key, then day.",
+                 "quorletctl tally dump --day 20516");
+  AddDayOption(*command, arguments->day, "Day number (without it: every day)");
+  AddJsonFlag(*command, arguments->json);
+  command->callback([&session, arguments] {
+    session.command = [&session, arguments] { DumpTallies(session, *arguments); };
+  });
+}
+
+}  // namespace
+
+void AddTallyCommands(CLI::App& app, Session& session) {
+  CLI::App* tally = AddFamily(app, "tally", "Counters: put them in, get them out",
+                              "quorletctl tally add nuvex.demo.launches 1");
+  AddScalarCommand(*tally, session, false);
+  AddScalarCommand(*tally, session, true);
+  AddRecordCommand(*tally, session);
+  AddImportCommand(*tally, session);
+  AddDumpCommand(*tally, session);
+}
+
+}  // namespace quorlet
