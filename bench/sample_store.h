@@ -1,0 +1,28 @@
+// The store that is measured: a day of a busy device.
+#ifndef QUORLET_BENCH_SAMPLE_STORE_H_
+#define QUORLET_BENCH_SAMPLE_STORE_H_
+
+#include <cstdint>
+#include <string>
+#include <vector>
+
+#include "platform/linux/tally_ledger.h"
+
+namespace quorlet::bench {
+
+inline constexpr int kScalars = 10'000;
+inline constexpr int kDistributions = 500;
+inline constexpr int kValuesPerDistribution = 4'000;
+
+std::string ScalarKey(int number);
+std::string DistributionKey(int number);
+
+// The values of a distribution: durations in ms, the same ones in every run.
+std::vector<DistributionSample> SampleValues(int distribution);
+
+// Records all of it for `day`. False when the ledger refused.
+[[nodiscard]] bool FillLedger(TallyLedger& ledger, std::int32_t day);
+
+}  // namespace quorlet::bench
+
+#endif  // QUORLET_BENCH_SAMPLE_STORE_H_
