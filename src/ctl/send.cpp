@@ -1,9 +1,10 @@
 // quorletctl send: messages to quorlet's named service.
-#include <poll.h>
 #include <sys/socket.h>
+#include <sys/time.h>
 
 #include <CLI/CLI.hpp>
 #include <chrono>
+#include <cmath>
 #include <memory>
 #include <thread>
 
@@ -55,6 +56,9 @@ void Send(const Dictionary& message, double waitSeconds) {
   const auto* text = std::get_if<std::string>(&document);
   if (text == nullptr || text->size() > kMaxFrameBytes) throw Failure("the message is too large");
   const Descriptor connection = Connect(waitSeconds);
+  // A service that is stuck must not keep a script for ever.
+  const timeval limit{.tv_sec = 60, .tv_usec = 0};
+  setsockopt(connection.get(), SOL_SOCKET, SO_SNDTIMEO, &limit, sizeof limit);
   if (const int error = WriteFully(connection.get(), MakeFrame(*text))) {
     throw Failure(std::string("cannot send to ") + kServiceName + ": " + ErrnoText(error));
   }
@@ -146,7 +150,10 @@ void AddSendCommands(CLI::App& app, Session& session) {
                        const char* example, void (*run)(const SendArguments&)) {
     CLI::App* command = AddCommand(*send, name, description, notes, example);
     command->add_option("--wait", arguments->waitSeconds, kWaitHelp)
-        ->check(CLI::Range(0.0, kLongestWait));
+        ->check(CLI::Range(0.0, kLongestWait))
+        ->check([](const std::string& text) {
+          return ParseNumber<double>(text).value_or(NAN) >= 0 ? "" : "not a number of seconds";
+        });
     command->callback(
         [&session, arguments, run] { session.command = [arguments, run] { run(*arguments); }; });
     return command;

@@ -96,20 +96,18 @@ class CounterStore {
   // Makes everything recorded so far durable and drops rows older than 30 days.
   virtual void TLClientCheckpoint() = 0;
 
-  // Sets, or adds to (saturating), today's value of the key. A failure leaves one error line.
-  virtual void TLClientSetValueForScalarKey(std::string_view key, std::int64_t value) = 0;
-  virtual void TLClientAddValueForScalarKey(std::string_view key, std::int64_t value) = 0;
-
   // Makes all changes in order and at once: in one short transaction, where the store has them. A
   // failure leaves one error line, and none of them is made.
-  virtual void writeScalars(std::span<const ScalarChange> changes) {
-    for (const ScalarChange& change : changes) {
-      if (change.kind == ScalarChange::Kind::kSet) {
-        TLClientSetValueForScalarKey(change.key, change.value);
-      } else {
-        TLClientAddValueForScalarKey(change.key, change.value);
-      }
-    }
+  virtual void writeScalars(std::span<const ScalarChange> changes) = 0;
+
+  // Sets, or adds to (saturating), today's value of one key.
+  void TLClientSetValueForScalarKey(std::string_view key, std::int64_t value) {
+    const ScalarChange change{ScalarChange::Kind::kSet, std::string(key), value};
+    writeScalars({&change, 1});
+  }
+  void TLClientAddValueForScalarKey(std::string_view key, std::int64_t value) {
+    const ScalarChange change{ScalarChange::Kind::kAdd, std::string(key), value};
+    writeScalars({&change, 1});
   }
 
   // A reader on the store's default location, or nullptr when it cannot be opened.

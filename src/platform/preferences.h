@@ -11,7 +11,7 @@
 namespace quorlet {
 
 // A domain name that the platform refuses (see the implementation) reads as empty, and writing to
-// it does nothing; both leave one error line in the system log.
+// it does nothing; the first time, one error line in the system log says so.
 class Preferences {
  public:
   virtual ~Preferences() = default;

@@ -42,14 +42,15 @@ class FakeCounterStore : public CounterStore {
     std::erase_if(scalars, isOld);
     std::erase_if(distributions, isOld);
   }
-  void TLClientSetValueForScalarKey(std::string_view key, std::int64_t value) override {
-    scalars[{std::string(key), TLDaysSince1970()}] = value;
-  }
-  void TLClientAddValueForScalarKey(std::string_view key, std::int64_t value) override {
-    std::int64_t& sum = scalars[{std::string(key), TLDaysSince1970()}];
-    if (__builtin_add_overflow(sum, value, &sum)) {
-      sum = value < 0 ? std::numeric_limits<std::int64_t>::min()
-                      : std::numeric_limits<std::int64_t>::max();
+  void writeScalars(std::span<const ScalarChange> changes) override {
+    for (const ScalarChange& change : changes) {
+      std::int64_t& value = scalars[{change.key, TLDaysSince1970()}];
+      if (change.kind == ScalarChange::Kind::kSet) {
+        value = change.value;
+      } else if (__builtin_add_overflow(value, change.value, &value)) {
+        value = change.value < 0 ? std::numeric_limits<std::int64_t>::min()
+                                 : std::numeric_limits<std::int64_t>::max();
+      }
     }
   }
   std::unique_ptr<TLHistory> initWithDefaultPath() override {

@@ -5,6 +5,7 @@
 #include <map>
 #include <memory>
 #include <optional>
+#include <set>
 #include <string>
 #include <utility>
 #include <vector>
@@ -63,7 +64,9 @@ class FakePreferences : public Preferences {
   bool isRefused(std::string_view domain) {
     const bool refused = domain.empty() || domain.size() > 200 || domain.front() == '.' ||
                          domain.find_first_of(std::string_view("/\n\0", 3)) != domain.npos;
-    if (refused && log_ != nullptr) log_->error("Refused the preference domain %@", domain);
+    if (refused && refused_.emplace(domain).second && log_ != nullptr) {
+      log_->error("Refused the preference domain %@", domain);
+    }
     return refused;
   }
 
@@ -88,6 +91,7 @@ class FakePreferences : public Preferences {
   }
 
   std::shared_ptr<Disk> disk_ = std::make_shared<Disk>();
+  std::set<std::string> refused_;
   SystemLog* log_;
   std::map<std::string, Changes, std::less<>> pending_;
 };

@@ -169,6 +169,54 @@ TEST_F(NamedServiceTest, SilentPeersDoNotLockOthersOut) {
   EXPECT_EQ(log.errors().size(), 0u);
 }
 
+TEST_F(NamedServiceTest, TheOrderOfArrivalHoldsAcrossConnections) {
+  ASSERT_TRUE(listen(*service));
+  const Descriptor one = connect();
+  const Descriptor two = connect();
+  serve();
+  send(two, FrameOf("a"));
+  send(one, FrameOf("b"));
+  EXPECT_EQ(serve(), "a b ") << "not the order in which the peers connected";
+  send(one, FrameOf("c"));
+  EXPECT_EQ(service->RunMainLoop(1, true), MainLoopResult::kHandledEvent);
+  const Descriptor newcomer = connect();
+  send(newcomer, FrameOf("d"));
+  send(two, FrameOf("e"));
+  send(one, FrameOf("f"));
+  EXPECT_EQ(serve(), "c d e f ") << "what comes while another message is handled";
+}
+
+TEST_F(NamedServiceTest, APeerThatHasSpokenKeepsItsPlace) {
+  ASSERT_TRUE(listen(*service));
+  const Descriptor announced = connect();
+  send(announced, FrameOf("status"));
+  EXPECT_EQ(serve(), "status ");
+  std::vector<Descriptor> silent;
+  for (std::size_t i = 0; i <= kMaxConnections; ++i) {
+    silent.push_back(connect());
+    serve(0.001);
+  }
+  send(announced, FrameOf("apps"));
+  EXPECT_EQ(serve(), "apps ");
+}
+
+TEST_F(NamedServiceTest, WithoutDescriptorsTheOthersAreServedAndOneLineIsLogged) {
+  ASSERT_TRUE(listen(*service));
+  const Descriptor peer = connect();
+  serve();
+  const Descriptor queued = connect();
+  rlimit limit{};
+  ASSERT_EQ(getrlimit(RLIMIT_NOFILE, &limit), 0);
+  const rlimit none{.rlim_cur = 3, .rlim_max = limit.rlim_max};
+  ASSERT_EQ(setrlimit(RLIMIT_NOFILE, &none), 0);
+  for (int i = 0; i < 3; ++i) {
+    send(peer, FrameOf("a"));
+    EXPECT_EQ(serve(0.01), "a ");
+  }
+  ASSERT_EQ(setrlimit(RLIMIT_NOFILE, &limit), 0);
+  EXPECT_EQ(log.errors().size(), 1u);
+}
+
 TEST_F(NamedServiceTest, AStaleSocketIsReplacedAndNothingElse) {
   ASSERT_TRUE(listen(*service));
   auto second = MakeLinuxNamedService(device.root(), log);

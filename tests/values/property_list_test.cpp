@@ -9,12 +9,14 @@
 #include <limits>
 #include <vector>
 
+#include "values/text.h"
+
 namespace quorlet {
 namespace {
 
 constexpr double kInfinity = std::numeric_limits<double>::infinity();
 
-std::string Xml(std::string_view body) { return "<plist>" + std::string(body) + "</plist>"; }
+std::string Xml(std::string_view body) { return FormatText("<plist>%s</plist>", body); }
 
 // A binary document of these objects; the first is the root, references have one byte.
 std::string Binary(const std::vector<std::string>& objects) {
@@ -53,8 +55,7 @@ std::string Nested(std::size_t depth) {
 // `levels` arrays, each of which holds the next one eight times; the last one holds `leaf`.
 std::string SharedArrays(int levels, const std::string& leaf) {
   std::vector<std::string> objects;
-  for (int i = 1; i <= levels; ++i)
-    objects.push_back("\xA8" + std::string(8, static_cast<char>(i)));
+  for (int i = 1; i <= levels; ++i) objects.push_back(Bytes({0xA8, i, i, i, i, i, i, i, i}));
   objects.push_back(leaf);
   return Binary(objects);
 }
@@ -78,7 +79,8 @@ std::string ErrorOf(const std::string& document) {
 std::string Written(const PropertyValue& value) {
   const auto result = WriteXmlPropertyList(value);
   const auto* error = std::get_if<PropertyListError>(&result);
-  return error == nullptr ? std::get<std::string>(result) : "error: " + error->description;
+  return error == nullptr ? std::get<std::string>(result)
+                          : FormatText("error: %s", error->description);
 }
 
 TEST(XmlReader, ReadsGoodDocuments) {
@@ -149,8 +151,9 @@ TEST(XmlReader, RefusesBadDocumentsAndSaysWhy) {
     while (!contents.empty()) {
       const auto end = std::min(contents.find('|'), contents.size());
       const std::string content(contents.substr(0, end));
-      EXPECT_EQ(ErrorOf(Xml("<" + element + ">" + content + "</" + element + ">")),
-                "line 1: <" + element + "> holds \"" + content + "\", which is not " + expected);
+      EXPECT_EQ(
+          ErrorOf(Xml(FormatText("<%s>%s</%s>", element, content, element))),
+          FormatText("line 1: <%s> holds \"%s\", which is not %s", element, content, expected));
       contents.remove_prefix(std::min(end + 1, contents.size()));
     }
   };

@@ -28,12 +28,15 @@ class LinuxCounterStore : public CounterStore {
     static_cast<void>(ledger_.dropDaysBefore(TLDaysSince1970() - kDaysKept));
   }
 
-  void TLClientSetValueForScalarKey(std::string_view key, std::int64_t value) override {
-    static_cast<void>(ledger_.setScalar(key, TLDaysSince1970(), value));
-  }
-
-  void TLClientAddValueForScalarKey(std::string_view key, std::int64_t value) override {
-    static_cast<void>(ledger_.addToScalar(key, TLDaysSince1970(), value));
+  void writeScalars(std::span<const ScalarChange> changes) override {
+    const std::int32_t today = TLDaysSince1970();
+    static_cast<void>(ledger_.inTransaction([&] {
+      return std::ranges::all_of(changes, [&](const ScalarChange& change) {
+        return change.kind == ScalarChange::Kind::kSet
+                   ? ledger_.setScalar(change.key, today, change.value)
+                   : ledger_.addToScalar(change.key, today, change.value);
+      });
+    }));
   }
 
   std::unique_ptr<TLHistory> initWithDefaultPath() override { return ledger_.openHistory(); }

@@ -8,7 +8,8 @@
 namespace quorlet {
 namespace {
 
-// The length that the frame at `offset` announces; the header must have arrived.
+// The length that the frame at `offset` announces; the header must have
+// arrived.
 std::size_t AnnouncedLength(const std::string& bytes, std::size_t offset) {
   ByteReader reader(std::as_bytes(std::span(bytes)).subspan(offset, kFrameHeaderBytes));
   return reader.little<std::uint32_t>();
@@ -52,8 +53,9 @@ std::optional<std::string> FrameBuffer::take() {
   return payload;
 }
 
-// Drops what was taken once that is at least half of what is held, so that each byte is moved a
-// bounded number of times. A large frame's memory is given back.
+// Drops what was taken once that is at least half of what is held, so that each
+// byte is moved a bounded number of times. A large frame's memory is given
+// back.
 void FrameBuffer::compact() {
   if (taken_ < bytes_.size() - taken_) return;
   bytes_.erase(0, taken_);

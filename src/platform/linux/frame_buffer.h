@@ -1,7 +1,8 @@
 // Assembles the frames of one connection from the bytes that arrive.
 //
-// A frame is a u32 length (little-endian, at most 16 MiB) and that many bytes. Nobody vouches for
-// what a peer sends: memory grows with what has arrived, never with what a length announces.
+// A frame is a u32 length (little-endian, at most 16 MiB) and that many bytes.
+// Nobody vouches for what a peer sends: memory grows with what has arrived,
+// never with what a length announces.
 #ifndef QUORLET_PLATFORM_LINUX_FRAME_BUFFER_H_
 #define QUORLET_PLATFORM_LINUX_FRAME_BUFFER_H_
 
@@ -13,7 +14,7 @@
 namespace quorlet {
 
 inline constexpr std::size_t kFrameHeaderBytes = 4;
-inline constexpr std::size_t kMaxFrameBytes = 16 * 1024 * 1024;
+inline constexpr std::size_t kMaxFrameBytes = std::size_t{16} * 1024 * 1024;
 
 // `payload` (at most kMaxFrameBytes) as a frame.
 std::string MakeFrame(std::string_view payload);
@@ -26,9 +27,12 @@ class FrameBuffer {
   // Takes the next complete frame's payload, or nothing when there is none.
   std::optional<std::string> take();
 
-  // A frame announced more than kMaxFrameBytes; what follows it cannot be told apart any more.
-  // Frames before it can still be taken.
+  // A frame announced more than kMaxFrameBytes; what follows it cannot be told
+  // apart any more. Frames before it can still be taken.
   bool isBroken() const { return broken_; }
+
+  // The memory set aside for what has arrived.
+  std::size_t capacity() const { return bytes_.capacity(); }
 
  private:
   void compact();

@@ -3,6 +3,7 @@
 #include <stdlib.h>
 #include <sys/stat.h>
 
+#include <algorithm>
 #include <charconv>
 #include <cstring>
 #include <string_view>
@@ -14,11 +15,12 @@ namespace quorlet {
 namespace {
 
 constexpr int kFirstPassedDescriptor = 3;
+constexpr long kMostPassed = 1024;
 constexpr int kBacklog = 128;
 
 // The decimal number in an environment variable, or -1.
 long EnvironmentNumber(const char* name) {
-  const char* text = getenv(name);
+  const char* text = secure_getenv(name);
   if (text == nullptr) return -1;
   long number = -1;
   const char* end = text + std::strlen(text);
@@ -66,6 +68,10 @@ std::optional<std::variant<ListeningSocket, std::string>> ListeningSocket::Passe
   const bool forUs = EnvironmentNumber("LISTEN_PID") == getpid() && count > 0;
   for (const char* name : {"LISTEN_PID", "LISTEN_FDS", "LISTEN_FDNAMES"}) unsetenv(name);
   if (!forUs) return std::nullopt;
+  // None of them is for a process that we might start.
+  for (long i = 0; i < std::min(count, kMostPassed); ++i) {
+    fcntl(kFirstPassedDescriptor + static_cast<int>(i), F_SETFD, FD_CLOEXEC);
+  }
   Descriptor first(kFirstPassedDescriptor);
   if (SocketOption(first.get(), SO_DOMAIN) != AF_UNIX ||
       SocketOption(first.get(), SO_TYPE) != SOCK_STREAM ||

@@ -1,14 +1,20 @@
 // The named service: sockets, frames and the main thread's event loop.
 //
-// A connection is read only while none of its frames waits to be handled. A peer that floods the
-// service so has at most one block of its bytes ahead of everybody else's, and messages are handled
-// in the order in which their last bytes were read.
+// The kernel tells which sources (connections, and the socket for new ones)
+// woke up, in the order in which they did: each is told once (edge-triggered)
+// and read until it is empty, so that a source that wakes up again while a
+// handler runs takes its place behind those that woke up before. What was read
+// of one source is handled before the next is read, and a peer that floods the
+// service has at most one block of its bytes ahead of everybody else's.
 #include "platform/linux/named_service.h"
 
 #include <poll.h>
+#include <sys/epoll.h>
+#include <sys/ioctl.h>
 #include <sys/socket.h>
 
 #include <algorithm>
+#include <array>
 #include <cerrno>
 #include <chrono>
 #include <cmath>
@@ -28,8 +34,15 @@ namespace {
 using Time = std::chrono::steady_clock::time_point;
 
 constexpr std::size_t kReadBytes = 256 * 1024;
+// What all connections together may hold; the one among the large holders that
+// has been silent longest goes first.
+constexpr std::size_t kMaxHeldBytes = std::size_t{64} * 1024 * 1024;
+// New connections in a row before everybody else has a turn.
+constexpr int kAcceptsInARow = 64;
+constexpr auto kAcceptPause = std::chrono::seconds(1);
 
-// One peer. While it is being announced to the listener it is the Peer that may be accepted.
+// One peer. While it is being announced to the listener it is the Peer that may
+// be accepted.
 struct Connection : Peer {
   explicit Connection(Descriptor peer) : socket(std::move(peer)) {}
   Descriptor socket;  // not open after the peer has hung up or was dropped
@@ -37,9 +50,11 @@ struct Connection : Peer {
   FrameBuffer frames;
   std::size_t waiting = 0;  // complete frames that have not been handled
   std::uint64_t heard = 0;  // the higher, the later
+  bool hasSpoken = false;   // a whole message has come
 };
 
-// Milliseconds for poll(2): rounded up, so that the end of a slice is not met by spinning.
+// Milliseconds for poll(2): rounded up, so that the end of a slice is not met
+// by spinning.
 int PollTimeout(Time deadline) {
   const auto left =
       std::chrono::ceil<std::chrono::milliseconds>(deadline - std::chrono::steady_clock::now());
@@ -66,13 +81,17 @@ class LinuxNamedService : public NamedService {
 
  private:
   bool handleOneMessage();
-  bool pollOnce(Time deadline);
+  bool serveReady();
+  void findReady(Time deadline);
+  bool watch(int descriptor, std::uint32_t events);
   bool acceptOne();
-  bool announce(Connection& connection);
-  void readFrom(Connection& connection);
+  void pauseAccepting(int error);
+  bool announce(const std::shared_ptr<Connection>& connection);
+  void readFrom(const std::shared_ptr<Connection>& connection);
   void drop(Connection& connection) { connection.socket = Descriptor(); }
   void forgetDropped();
-  void makeRoom();
+  std::shared_ptr<Connection> findQuietest() const;
+  void limitMemory(const Connection& reading);
   template <typename Call>
   void guarded(Call call);
 
@@ -80,10 +99,18 @@ class LinuxNamedService : public NamedService {
   SystemLog& log_;
   std::optional<ListeningSocket> listening_;
   ListenerHandler listener_;
-  bool acceptPaused_ = false;  // for the rest of the slice
+  Descriptor epoll_;
+  std::optional<Time> acceptAgainAt_;  // while no descriptor or memory is left
+                                       // for new connections
+  bool acceptFails_ = false;           // and that was said
+  int acceptsLeft_ = 0;
   Connection* announced_ = nullptr;
   std::vector<std::shared_ptr<Connection>> connections_;
   std::deque<std::shared_ptr<Connection>> arrived_;  // once for each complete frame
+  // Sources that have something to be read, in that order; nullptr is the
+  // listening socket.
+  std::deque<std::shared_ptr<Connection>> ready_;
+  std::vector<std::shared_ptr<Connection>> unfinished_;  // they may have more, in the next round
   std::uint64_t clock_ = 0;
   std::string readBuffer_;
 };
@@ -99,6 +126,11 @@ bool LinuxNamedService::ListenNamedService(std::string_view name, ListenerHandle
     log_.error("Cannot listen as %@: %@", name, *reason);
     return false;
   }
+  epoll_ = Descriptor(epoll_create1(EPOLL_CLOEXEC));
+  if (!epoll_.isOpen() || !watch(std::get<ListeningSocket>(socket).get(), EPOLLIN)) {
+    log_.error("Cannot listen as %@: %@", name, ErrnoText(errno));
+    return false;
+  }
   listening_ = std::move(std::get<ListeningSocket>(socket));
   listener_ = std::move(handler);
   return true;
@@ -106,14 +138,16 @@ bool LinuxNamedService::ListenNamedService(std::string_view name, ListenerHandle
 
 MainLoopResult LinuxNamedService::RunMainLoop(double seconds, bool returnAfterOneEvent) {
   const Time deadline = DeadlineIn(seconds);
-  acceptPaused_ = false;
-  for (bool first = true;; first = false) {
-    // An event that has arrived is handled even in a slice of no time at all.
-    const bool handled = handleOneMessage() || pollOnce(deadline);
-    if (handled && returnAfterOneEvent) return MainLoopResult::kHandledEvent;
-    if (!first && (arrived_.empty() || !returnAfterOneEvent) &&
-        std::chrono::steady_clock::now() >= deadline) {
-      return MainLoopResult::kTimedOut;
+  // An event that has arrived is handled even in a slice of no time at all: the
+  // last look comes after the deadline.
+  for (bool isLastLook = false;;) {
+    if (handleOneMessage() || serveReady()) {
+      if (returnAfterOneEvent) return MainLoopResult::kHandledEvent;
+      if (std::chrono::steady_clock::now() >= deadline) return MainLoopResult::kTimedOut;
+    } else if (arrived_.empty() && ready_.empty()) {
+      if (isLastLook) return MainLoopResult::kTimedOut;
+      isLastLook = std::chrono::steady_clock::now() >= deadline;
+      findReady(deadline);
     }
   }
 }
@@ -140,95 +174,187 @@ bool LinuxNamedService::handleOneMessage() {
   return false;
 }
 
-// Waits until something happens or the deadline, and takes in what there is. True when a new peer
-// was announced.
-bool LinuxNamedService::pollOnce(Time deadline) {
+// Takes in what the first ready source has. True when a new peer was announced.
+bool LinuxNamedService::serveReady() {
+  if (ready_.empty()) return false;
+  const std::shared_ptr<Connection> source = std::move(ready_.front());
+  ready_.pop_front();
+  if (source == nullptr) return acceptOne();
+  if (source->socket.isOpen()) readFrom(source);
+  return false;
+}
+
+// Waits until a source wakes up or the deadline.
+void LinuxNamedService::findReady(Time deadline) {
   forgetDropped();
-  std::vector<pollfd> polled;
-  for (const auto& connection : connections_) {
-    polled.push_back({connection->waiting == 0 ? connection->socket.get() : -1, POLLIN, 0});
+  if (acceptAgainAt_ && std::chrono::steady_clock::now() >= *acceptAgainAt_) {
+    acceptAgainAt_.reset();
+    if (!watch(listening_->get(), EPOLLIN)) pauseAccepting(errno);
   }
-  const bool accepts = listening_ && !acceptPaused_;
-  polled.push_back({accepts ? listening_->get() : -1, POLLIN, 0});
-  if (poll(polled.data(), polled.size(), PollTimeout(deadline)) <= 0) return false;
-  for (std::size_t i = 0; i + 1 < polled.size(); ++i) {
-    if (polled[i].revents != 0) readFrom(*connections_[i]);
+  acceptsLeft_ = kAcceptsInARow;
+  ready_.assign(unfinished_.begin(), unfinished_.end());
+  unfinished_.clear();
+  const Time end = std::min(deadline, acceptAgainAt_.value_or(deadline));
+  const int timeout = ready_.empty() ? PollTimeout(end) : 0;
+  if (!epoll_.isOpen()) {
+    poll(nullptr, 0, timeout);
+    return;
   }
-  for (std::size_t i = 0; i + 1 < polled.size(); ++i) {
-    for (std::size_t n = 0; polled[i].revents != 0 && n < connections_[i]->waiting; ++n) {
-      arrived_.push_back(connections_[i]);
+  std::array<epoll_event, kMaxConnections + 1> events;
+  const int count =
+      epoll_wait(epoll_.get(), events.data(), static_cast<int>(events.size()), timeout);
+  for (int i = 0; i < count; ++i) {
+    const int descriptor = events[static_cast<std::size_t>(i)].data.fd;
+    const auto found = std::ranges::find(
+        connections_, descriptor, [](const auto& connection) { return connection->socket.get(); });
+    if (found != connections_.end()) {
+      ready_.push_back(*found);
+    } else if (descriptor == listening_->get()) {
+      ready_.push_back(nullptr);
     }
   }
-  return polled.back().revents != 0 && acceptOne();
+}
+
+bool LinuxNamedService::watch(int descriptor, std::uint32_t events) {
+  epoll_event event{};
+  event.events = events;
+  event.data.fd = descriptor;
+  return epoll_ctl(epoll_.get(), EPOLL_CTL_ADD, descriptor, &event) == 0;
 }
 
 // Takes in one new connection. False when it is none of ours.
 bool LinuxNamedService::acceptOne() {
+  forgetDropped();
+  const bool isFull = connections_.size() >= kMaxConnections;
+  const auto quietest = isFull ? findQuietest() : nullptr;
+  // Where everybody has something to be read, that comes first; the newcomer
+  // waits in the queue.
+  if (acceptsLeft_-- <= 0 || (isFull && quietest == nullptr)) return false;
   Descriptor socket(accept4(listening_->get(), nullptr, nullptr, SOCK_CLOEXEC | SOCK_NONBLOCK));
   if (!socket.isOpen()) {
-    if (errno == EAGAIN || errno == EINTR || errno == ECONNABORTED) return false;
-    // Out of descriptors or memory: the peer stays in the queue, and asking again would only spin.
-    log_.error("Cannot accept a connection: %@", ErrnoText(errno));
-    acceptPaused_ = true;
+    if (errno != EAGAIN && errno != EINTR && errno != ECONNABORTED) pauseAccepting(errno);
     return false;
   }
+  acceptFails_ = false;
+  ready_.push_front(nullptr);  // the next one in the queue came before what woke up later
   ucred peer{};
   socklen_t size = sizeof peer;
   if (getsockopt(socket.get(), SOL_SOCKET, SO_PEERCRED, &peer, &size) != 0 ||
       (peer.uid != 0 && peer.uid != geteuid())) {
-    log_.error("Closing a connection of user %u: only root and our own user are served",
-               static_cast<unsigned>(peer.uid));
+    log_.error(
+        "Closing a connection of user %u: only root and our own user "
+        "are served",
+        static_cast<unsigned>(peer.uid));
     return false;
   }
-  makeRoom();
+  if (!watch(socket.get(), EPOLLIN | EPOLLET)) {
+    log_.error("Closing a connection that cannot be watched: %@", ErrnoText(errno));
+    return false;
+  }
+  if (isFull) {
+    log_.info("Dropping a silent connection for a new one");
+    drop(*quietest);
+    forgetDropped();
+  }
   auto connection = std::make_shared<Connection>(std::move(socket));
   connection->heard = ++clock_;
   connections_.push_back(connection);
-  return announce(*connection);
+  return announce(connection);
 }
 
-bool LinuxNamedService::announce(Connection& connection) {
-  announced_ = &connection;
-  guarded([&] { listener_({&connection}); });
+// Out of descriptors or memory: the peer stays in the queue, and asking again
+// at once would spin.
+void LinuxNamedService::pauseAccepting(int error) {
+  if (!acceptFails_) log_.error("Cannot accept connections: %@", ErrnoText(error));
+  acceptFails_ = true;
+  acceptAgainAt_ = std::chrono::steady_clock::now() + kAcceptPause;
+  epoll_ctl(epoll_.get(), EPOLL_CTL_DEL, listening_->get(), nullptr);
+}
+
+bool LinuxNamedService::announce(const std::shared_ptr<Connection>& connection) {
+  announced_ = connection.get();
+  guarded([&] { listener_({connection.get()}); });
   announced_ = nullptr;
-  if (!connection.handler) drop(connection);
+  if (connection->handler) {
+    ready_.push_front(connection);  // what it sent came with it
+  } else {
+    drop(*connection);
+  }
   return true;
 }
 
-void LinuxNamedService::readFrom(Connection& connection) {
+// Reads what there is, at most about one block.
+void LinuxNamedService::readFrom(const std::shared_ptr<Connection>& connection) {
   readBuffer_.resize(kReadBytes);
-  const ssize_t size = Uninterrupted(
-      [&] { return recv(connection.socket.get(), readBuffer_.data(), readBuffer_.size(), 0); });
-  if (size < 0 && errno == EAGAIN) return;
-  if (size <= 0) {
-    // A peer that hangs up in the middle of a frame is no event, and nobody's error.
-    drop(connection);
-    return;
+  for (std::size_t taken = 0; taken < kReadBytes;) {
+    const ssize_t size = Uninterrupted(
+        [&] { return recv(connection->socket.get(), readBuffer_.data(), readBuffer_.size(), 0); });
+    if (size < 0 && errno == EAGAIN) return;
+    if (size <= 0) {
+      // A peer that hangs up in the middle of a frame is no event, and nobody's
+      // error.
+      drop(*connection);
+      return;
+    }
+    taken += static_cast<std::size_t>(size);
+    connection->heard = ++clock_;
+    const std::size_t completed =
+        connection->frames.append({readBuffer_.data(), static_cast<std::size_t>(size)});
+    connection->hasSpoken = connection->hasSpoken || completed != 0;
+    connection->waiting += completed;
+    arrived_.insert(arrived_.end(), completed, connection);
+    if (connection->frames.isBroken()) {
+      log_.error(
+          "Closing a connection: it announced a message of more than "
+          "%llu bytes",
+          kMaxFrameBytes);
+      drop(*connection);
+      return;
+    }
+    limitMemory(*connection);
   }
-  connection.heard = ++clock_;
-  connection.waiting +=
-      connection.frames.append({readBuffer_.data(), static_cast<std::size_t>(size)});
-  if (connection.frames.isBroken()) {
-    log_.error("Closing a connection: it announced a message of more than %llu bytes",
-               kMaxFrameBytes);
-    drop(connection);
-  }
+  unfinished_.push_back(connection);
 }
 
-// Connections that are gone; those with frames left to be handled live on in arrived_.
+// Connections that are gone; those with frames left to be handled live on in
+// arrived_.
 void LinuxNamedService::forgetDropped() {
   std::erase_if(connections_, [](const auto& connection) { return !connection->socket.isOpen(); });
 }
 
-// Drops the connection that has been silent longest, if there is no place for one more.
-void LinuxNamedService::makeRoom() {
-  forgetDropped();
-  if (connections_.size() < kMaxConnections) return;
-  const auto silent = std::ranges::min_element(connections_, {}, [](const auto& connection) {
-    return std::pair(connection->waiting != 0, connection->heard);
-  });
-  log_.info("Dropping a silent connection for a new one");
-  connections_.erase(silent);
+// The connection that gives its place to a newcomer: one that has nothing
+// unread; those that have never sent a message first, since a peer that has may
+// well be waiting for its notification; then the one that has been silent
+// longest. nullptr when everybody has something unread.
+std::shared_ptr<Connection> LinuxNamedService::findQuietest() const {
+  std::shared_ptr<Connection> quietest;
+  for (const auto& connection : connections_) {
+    int unread = 0;
+    if (ioctl(connection->socket.get(), FIONREAD, &unread) == 0 && unread > 0) continue;
+    const auto rank = [](const Connection& each) { return std::pair(each.hasSpoken, each.heard); };
+    if (quietest == nullptr || rank(*connection) < rank(*quietest)) quietest = connection;
+  }
+  return quietest;
+}
+
+void LinuxNamedService::limitMemory(const Connection& reading) {
+  if (reading.frames.capacity() <= kReadBytes) return;
+  while (true) {
+    std::size_t held = 0;
+    std::shared_ptr<Connection> silent;
+    for (const auto& connection : connections_) {
+      held += connection->frames.capacity();
+      if (!connection->socket.isOpen() || connection.get() == &reading) continue;
+      if (connection->frames.capacity() <= kReadBytes) continue;
+      if (silent == nullptr || connection->heard < silent->heard) silent = connection;
+    }
+    if (held <= kMaxHeldBytes || silent == nullptr) return;
+    log_.error(
+        "Closing a connection that keeps back the rest of a message, to "
+        "save memory");
+    drop(*silent);
+    std::erase(connections_, silent);
+  }
 }
 
 // What a handler throws must not end the service.

@@ -18,7 +18,9 @@ namespace {
 
 constexpr char kRecordsPath[] = "/var/db/vigil/usage.plist";
 constexpr std::chrono::milliseconds kUnitUsageLimit(100);
-constexpr double kMaxDelaySeconds = 30.0 * 86400;  // as good as never
+constexpr double kMaxDelaySeconds = 30.0 * 86400;
+constexpr std::chrono::nanoseconds kNever =
+    std::chrono::hours(30 * 24);  // no process lives so long
 
 struct Answer {
   std::chrono::nanoseconds delay{0};
@@ -90,7 +92,7 @@ class LinuxNetworkUsage : public NetworkUsage {
     const std::string path = root_.path(kRecordsPath);
     const auto bytes = ReadWholeFile(path, kMaxPropertyListBytes);
     if (const int* error = std::get_if<int>(&bytes)) {
-      if (*error == ENOENT) return {.records = readUnits()};
+      if (*error == ENOENT) return readUnits();
       log_.error("Cannot read %@: %@", path, ErrnoText(*error));
       return {};
     }
@@ -127,11 +129,13 @@ class LinuxNetworkUsage : public NetworkUsage {
     return answer;
   }
 
-  Array readUnits() {
+  // A service manager that is late has not answered: an empty reply would say that nobody has used
+  // the network, and the counts to compare with would be gone.
+  Answer readUnits() {
     auto records = ReadUnitUsage(root_, kUnitUsageLimit);
-    if (records) return std::move(*records);
+    if (records) return {.delay = {}, .records = std::move(*records)};
     log_.error("The service manager did not say what its services transferred");
-    return {};
+    return {.delay = kNever, .records = {}};
   }
 
   const Root root_;

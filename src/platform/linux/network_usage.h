@@ -13,9 +13,10 @@ namespace quorlet {
 // or {Delay (seconds), Records (array)} for a reply that comes later. Without that file the
 // machine's services are the records (ReadUnitUsage), if that takes no longer than 100 ms.
 //
-// A file that is damaged, and a service manager that does not answer, give one error line and no
-// records. The destructor drops the replies that have not come and waits for the rest; an exception
-// that leaves a reply becomes an error line. Safe to use from any thread.
+// A file that is damaged gives one error line and no records; a service manager that does not
+// answer in time gives one error line, and no reply. The destructor drops the replies that have not
+// come and waits for the rest; an exception that leaves a reply becomes an error line. Safe to use
+// from any thread.
 std::unique_ptr<NetworkUsage> MakeLinuxNetworkUsage(const Root& root, SystemLog& log);
 
 }  // namespace quorlet

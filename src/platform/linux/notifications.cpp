@@ -18,8 +18,9 @@ std::uint64_t CountIn(const std::string& path) {
   if (text == nullptr) return 0;
   std::uint64_t count = 0;
   const auto [end, error] = std::from_chars(text->data(), text->data() + text->size(), count);
-  const bool whole = text->data() + text->size() - end <= 1;  // the line break
-  return error == std::errc() && whole ? count : 0;
+  const std::string_view rest =
+      std::string_view(*text).substr(static_cast<std::size_t>(end - text->data()));
+  return error == std::errc() && (rest.empty() || rest == "\n") ? count : 0;
 }
 
 class LinuxNotifications : public Notifications {

@@ -12,6 +12,7 @@
 #include <cstdio>
 #include <map>
 #include <mutex>
+#include <set>
 #include <string>
 #include <utility>
 #include <variant>
@@ -23,6 +24,7 @@ namespace quorlet {
 namespace {
 
 constexpr char kDirectory[] = "/var/mobile/Library/Preferences";
+constexpr std::size_t kLongestShownName = 201;  // a byte more than a good name has
 
 // What tells one content of a file from another; `error` is set when there is none to be seen.
 struct FileVersion {
@@ -148,10 +150,20 @@ class LinuxPreferences : public Preferences {
   Domain* findDomain(std::string_view name) {
     if (const auto found = domains_.find(name); found != domains_.end()) return &found->second;
     if (!IsSafeName(name)) {
-      log_.error("Refused the preference domain name \"%@\"", name);
+      refuse(name);
       return nullptr;
     }
     return &domains_[std::string(name)];
+  }
+
+  // Says so once for each name: tasking, say, may come back to one several times.
+  void refuse(std::string_view name) {
+    constexpr std::size_t kMostRemembered = 1000;
+    const std::string shown(name.substr(0, kLongestShownName));
+    if (refused_.size() < kMostRemembered ? refused_.insert(shown).second
+                                          : !refused_.contains(shown)) {
+      log_.error("Refused the preference domain name \"%@\"", shown);
+    }
   }
 
   std::string path(std::string_view domain) const {
@@ -249,6 +261,7 @@ class LinuxPreferences : public Preferences {
   SystemLog& log_;
   std::mutex mutex_;
   std::map<std::string, Domain, std::less<>> domains_;
+  std::set<std::string> refused_;
 };
 
 }  // namespace

@@ -6,7 +6,6 @@
 #include <array>
 #include <cstdint>
 #include <filesystem>
-#include <optional>
 #include <system_error>
 
 namespace quorlet {
@@ -14,17 +13,17 @@ namespace {
 
 constexpr int kAttempts = 3;
 
-// Tells two states of a file apart.
+// Tells two states of a file apart; all 0 when it is missing.
 struct FileState {
-  std::uint64_t inode;
-  std::int64_t size, seconds, nanoseconds;
+  std::uint64_t inode = 0;
+  std::int64_t size = 0, seconds = 0, nanoseconds = 0;
   bool operator==(const FileState&) const = default;
 };
 
-std::optional<FileState> StateOf(const std::string& path) {
+FileState StateOf(const std::string& path) {
   struct stat status {};
-  if (stat(path.c_str(), &status) != 0) return std::nullopt;
-  return FileState{status.st_ino, status.st_size, status.st_mtim.tv_sec, status.st_mtim.tv_nsec};
+  if (stat(path.c_str(), &status) != 0) return {};
+  return {status.st_ino, status.st_size, status.st_mtim.tv_sec, status.st_mtim.tv_nsec};
 }
 
 std::string TemporaryDirectory() {
