@@ -2,7 +2,8 @@
 //
 // Lays out a root whose daily pass has the sample store to report: a whitelist that allows every
 // key (half of the scalars rounded, a fifth of the distributions with a histogram) and the owner's
-// consent; and writes the same values to a plain table of an SQLite database, for comparison.
+// consent; beside it /every_key.plist, the same whitelist with an entry for each key. Also writes
+// the same values to a plain table of an SQLite database, for comparison.
 #include <sqlite3.h>
 
 #include <cstdio>
@@ -14,24 +15,27 @@
 namespace quorlet::bench {
 namespace {
 
-Dictionary Whitelist() {
+// A whitelist by subsystem, or with one entry for each key, which says the same.
+Dictionary Whitelist(bool everyKey) {
   Dictionary scalars;
-  for (int i = 0; i < kScalars; ++i) {
+  for (int i = 0; i < (everyKey ? kScalars : kSubsystems); ++i) {
     Dictionary options;
     if (i % 4 == 0) options["sig_fig"] = Int64(2);
     if (i % 4 == 1) options["bucket_interval"] = Int64(100);
-    scalars[ScalarKey(i)] = options;
+    scalars[everyKey ? ScalarKey(i) : SubsystemPrefix(i)] = options;
   }
   Dictionary distributions;
-  for (int i = 0; i < kDistributions; ++i) {
+  for (int i = 0; i < (everyKey ? kDistributions : kSubsystems); ++i) {
     Dictionary options;
     if (i % 5 == 0) {
       options["intervals"] = Array{Int64(1),  Int64(2),   Int64(5),   Int64(10),  Int64(20),
                                    Int64(50), Int64(100), Int64(200), Int64(500), Int64(1000)};
     }
-    distributions[DistributionKey(i)] = options;
+    distributions[everyKey ? DistributionKey(i) : SubsystemPrefix(i)] = options;
   }
-  return {{"Bench", Dictionary{{"ScalarKeys", scalars}, {"DistributionKeys", distributions}}}};
+  return {{"Bench",
+           Dictionary{{everyKey ? "ScalarKeys" : "ScalarKeyPrefixes", scalars},
+                      {everyKey ? "DistributionKeys" : "DistributionKeyPrefixes", distributions}}}};
 }
 
 bool WritePlist(const std::string& path, const Dictionary& root) {
@@ -74,7 +78,8 @@ int Run(const char* directory, const char* plainDatabase) {
   const bool good =
       FillLedger(platform.ledger(), yesterday) &&
       WritePlist(root.path("/Library/Application Support/TallyLedger/Whitelist_Zed.plist"),
-                 Whitelist()) &&
+                 Whitelist(false)) &&
+      WritePlist(root.path("/every_key.plist"), Whitelist(true)) &&
       WritePlist(root.path("/var/mobile/Library/Preferences/nuvex.diagwell.plist"),
                  {{"SubmissionEnabled", true}}) &&
       WritePlainTable(plainDatabase, yesterday);

@@ -5,12 +5,16 @@
 
 namespace quorlet::bench {
 
+std::string SubsystemPrefix(int number) {
+  return "nuvex.bench.subsystem" + std::to_string(number % kSubsystems) + ".";
+}
+
 std::string ScalarKey(int number) {
-  return "nuvex.bench.subsystem" + std::to_string(number % 40) + ".count" + std::to_string(number);
+  return SubsystemPrefix(number) + "count" + std::to_string(number);
 }
 
 std::string DistributionKey(int number) {
-  return "nuvex.bench.subsystem" + std::to_string(number % 40) + ".time" + std::to_string(number);
+  return SubsystemPrefix(number) + "time" + std::to_string(number);
 }
 
 std::vector<DistributionSample> SampleValues(int distribution) {

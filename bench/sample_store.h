@@ -10,10 +10,13 @@
 
 namespace quorlet::bench {
 
+inline constexpr int kSubsystems = 40;
 inline constexpr int kScalars = 10'000;
 inline constexpr int kDistributions = 500;
 inline constexpr int kValuesPerDistribution = 4'000;
 
+// What the keys of subsystem `number` (modulo kSubsystems) begin with.
+std::string SubsystemPrefix(int number);
 std::string ScalarKey(int number);
 std::string DistributionKey(int number);
 

@@ -262,11 +262,12 @@ class TreeWriter {
   }
 
   Node dictionaryNode(const Dictionary& dictionary, std::size_t above) {
-    // Of keys that repair makes the same, the last one's value stays.
+    // Of keys that repair makes the same, the last one's value stays. They come in order, so the
+    // end is the place for all but repaired ones.
     std::map<std::string, const PropertyValue*> entries;
     for (const auto& [key, value] : dictionary) {
       if (!takeContent(key.size())) return nullptr;
-      entries.insert_or_assign(AsWritten(key), &value);
+      entries.insert_or_assign(entries.end(), AsWritten(key), &value);
     }
     Node node(plist_new_dict());
     for (const auto& [key, value] : entries) {
@@ -275,7 +276,7 @@ class TreeWriter {
       // libplist hashes a key so that anyone can make many collide, which takes quadratic time. An
       // entry goes in under a number that no repaired key can be, and is then given its name.
       const plist_t entry = child.release();
-      plist_dict_set_item(node.get(), FormatText("\x01%llu", values_).c_str(), entry);
+      plist_dict_set_item(node.get(), ("\x01" + std::to_string(values_)).c_str(), entry);
       plist_set_key_val(plist_dict_item_get_key(entry), key.c_str());
     }
     return node;
@@ -319,6 +320,7 @@ PropertyListResult ReadPropertyList(std::span<const std::byte> bytes) {
 }
 
 std::string AsWritten(std::string_view text) {
+  if (PrintableAsciiPrefix(text) == text.size()) return std::string(text);
   const std::string repaired = RepairUtf8(text);
   std::string_view rest = repaired;
   std::string out;

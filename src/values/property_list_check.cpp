@@ -16,10 +16,9 @@ namespace quorlet {
 namespace {
 
 bool IsLetter(char c) { return (c >= 'a' && c <= 'z') || (c >= 'A' && c <= 'Z'); }
-bool IsBlank(char c) { return kXmlBlanks.find(c) != std::string_view::npos; }
+bool IsBlank(char c) { return c == ' ' || c == '\t' || c == '\r' || c == '\n'; }
 bool IsNameCharacter(char c) {
-  return IsLetter(c) || (c >= '0' && c <= '9') ||
-         std::string_view("_-.:").find(c) != std::string_view::npos;
+  return IsLetter(c) || (c >= '0' && c <= '9') || c == '_' || c == '-' || c == '.' || c == ':';
 }
 
 enum class Role : std::uint8_t { kRoot, kDictionary, kArray, kKey, kText, kFlag, kScalar };
@@ -79,7 +78,9 @@ class XmlChecker {
 
   bool atEnd() const { return at_ == text_.size(); }
   bool nextIs(std::string_view wanted) const { return text_.substr(at_).starts_with(wanted); }
-  void skipBlanks() { at_ = std::min(text_.find_first_not_of(kXmlBlanks, at_), text_.size()); }
+  void skipBlanks() {
+    while (at_ < text_.size() && IsBlank(text_[at_])) ++at_;
+  }
 
   // Moves past the next `end`, having skipped `skip` bytes, and gives what lies between.
   bool takeUntil(std::size_t skip, std::string_view end, std::string_view construct,
@@ -156,6 +157,10 @@ class XmlChecker {
     const std::size_t name = at_;
     while (!atEnd() && IsNameCharacter(text_[at_])) ++at_;
     tag.name = text_.substr(name, at_ - name);
+    if (!atEnd() && text_[at_] == '>' && !tag.name.empty()) {  // nearly every tag
+      ++at_;
+      return true;
+    }
     const std::size_t rest = at_;
     char quote = 0;
     for (; !atEnd(); ++at_) {
@@ -193,7 +198,8 @@ class XmlChecker {
   // The text up to and including the end tag of `element`.
   bool readText(const Element& element, std::string& out) {
     while (true) {
-      const std::size_t plain = std::min(text_.find_first_of("<&", at_), text_.size());
+      std::size_t plain = at_;
+      while (plain < text_.size() && text_[plain] != '<' && text_[plain] != '&') ++plain;
       out += text_.substr(at_, plain - at_);
       at_ = plain;
       std::string_view section;

@@ -162,6 +162,8 @@ std::optional<std::string> XmlReference(std::string_view name) {
 
 std::size_t XmlTextPrefix(std::string_view text) {
   for (std::size_t i = 0; i < text.size(); ++i) {
+    i += PrintableAsciiPrefix(text.substr(i));
+    if (i == text.size()) break;
     const auto byte = static_cast<unsigned char>(text[i]);
     if (byte < 0x20 && kXmlBlanks.find(text[i]) == std::string_view::npos) return i;
     // U+FFFE and U+FFFF.

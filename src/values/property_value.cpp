@@ -222,6 +222,10 @@ PropertyValue* Dictionary::find(std::string_view key) {
 }
 
 PropertyValue& Dictionary::operator[](std::string_view key) {
+  // Documents and the counter store come in order: then there is nothing to search.
+  if (!entries_->empty() && entries_->rbegin()->first < key) {
+    return entries_->emplace_hint(entries_->end(), key, PropertyValue())->second;
+  }
   const auto place = entries_->lower_bound(key);
   if (place != entries_->end() && place->first == key) return place->second;
   return entries_->emplace_hint(place, key, PropertyValue())->second;

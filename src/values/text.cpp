@@ -66,9 +66,26 @@ std::string FormatMessage(std::string_view text, std::span<const MessageArgument
   return out;
 }
 
+std::size_t PrintableAsciiPrefix(std::string_view text) {
+  std::size_t at = 0;
+  // Eight bytes at a time, without a branch for each: most text is nothing else.
+  for (; text.size() - at >= 8; at += 8) {
+    unsigned odd = 0;
+    for (std::size_t i = 0; i < 8; ++i) {
+      const auto byte = static_cast<unsigned char>(text[at + i]);
+      odd |= static_cast<unsigned>(byte < 0x20) | static_cast<unsigned>(byte > 0x7E);
+    }
+    if (odd != 0) break;
+  }
+  while (at < text.size() && text[at] >= 0x20 && text[at] <= 0x7E) ++at;
+  return at;
+}
+
 std::size_t ValidUtf8Prefix(std::string_view text) {
   std::size_t at = 0;
-  while (at < text.size()) {
+  while (true) {
+    while (at < text.size() && static_cast<unsigned char>(text[at]) < 0x80) ++at;
+    if (at == text.size()) break;
     const Sequence sequence = FirstSequence(text.substr(at));
     if (!sequence.valid) break;
     at += sequence.length;
@@ -79,6 +96,7 @@ std::size_t ValidUtf8Prefix(std::string_view text) {
 bool IsValidUtf8(std::string_view text) { return ValidUtf8Prefix(text) == text.size(); }
 
 std::string RepairUtf8(std::string_view text) {
+  if (PrintableAsciiPrefix(text) == text.size()) return std::string(text);
   std::string out;
   out.reserve(text.size());
   while (!text.empty()) {

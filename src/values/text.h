@@ -82,6 +82,8 @@ std::string FormatText(Message<Arguments...> message, const Arguments&... argume
 
 // `text` with every ill-formed UTF-8 sequence replaced by U+FFFD (one for each maximal subpart).
 std::string RepairUtf8(std::string_view text);
+// How many bytes at the start of `text` are printable ASCII.
+std::size_t PrintableAsciiPrefix(std::string_view text);
 bool IsValidUtf8(std::string_view text);
 // How many bytes of `text` come before the first ill-formed sequence; text.size() without one.
 std::size_t ValidUtf8Prefix(std::string_view text);

@@ -9,6 +9,7 @@
 #include <syslog.h>
 
 #include <array>
+#include <cmath>
 #include <mutex>
 
 #include "platform/linux/descriptor.h"
@@ -57,6 +58,7 @@ std::string OneEntry(std::string_view message) {
   if (rest.ends_with('\n')) rest.remove_suffix(1);
   if (rest.ends_with('\r')) rest.remove_suffix(1);
   std::string entry;
+  if (PrintableAsciiPrefix(rest) == rest.size()) return std::string(rest);
   entry.reserve(rest.size());
   while (!rest.empty()) {
     const std::size_t lineBreak = rest.starts_with("\r\n") ? 2 : rest.starts_with('\n') ? 1 : 0;
@@ -100,15 +102,36 @@ class FileLog : public SystemLog {
   FileLog(const Root& root, Clock& clock)
       : clock_(clock), directory_(root.path(kLogDirectory)), path_(directory_ + kLogName) {}
 
+  ~FileLog() override { (void)flush(); }
+
   void write(LogLevel level, std::string_view text) override {
-    const std::string line = Rfc3339(clock_.now()) + " " + Describe(level).name + " " + kIdent +
-                             "[" + std::to_string(getpid()) + "]: " + OneEntry(text) + "\n";
     const std::lock_guard lock(mutex_);
-    if (!append(line) && level == LogLevel::kError) (void)WriteFully(STDERR_FILENO, line);
+    const std::size_t start = waiting_.size();
+    appendTime();
+    waiting_.append(" ").append(Describe(level).name).append(" ").append(ident_);
+    waiting_.append(OneEntry(text)).append("\n");
+    // A pass may have thousands of debug lines; one system call for each would be most of its time.
+    if (level <= LogLevel::kInfo && waiting_.size() < kMostWaiting) return;
+    const std::string line = level == LogLevel::kError ? waiting_.substr(start) : "";
+    if (!flush()) (void)WriteFully(STDERR_FILENO, line);
   }
 
  private:
-  bool append(const std::string& line) {
+  static constexpr std::size_t kMostWaiting = 65536;
+
+  void appendTime() {
+    const double second = std::floor(clock_.now().secondsSince1970);
+    if (second != timeSecond_) {
+      timeSecond_ = second;
+      timeText_ = Rfc3339({second});
+    }
+    waiting_ += timeText_;
+  }
+
+  // Writes the lines that wait. They are gone afterwards, written or not.
+  bool flush() {
+    const std::string lines = std::exchange(waiting_, {});
+    if (lines.empty()) return true;
     if (!file_.isOpen()) {
       struct stat status = {};
       if (MakeDirectories(directory_) != 0 ||
@@ -117,7 +140,7 @@ class FileLog : public SystemLog {
       }
     }
     // A line that a full disk cut short is ended, so that it does not spoil the next one.
-    const std::string entry = cutShort_ ? "\n" + line : line;
+    const std::string entry = cutShort_ ? "\n" + lines : lines;
     const ssize_t written =
         Uninterrupted([&] { return ::write(file_.get(), entry.data(), entry.size()); });
     const bool complete = written == static_cast<ssize_t>(entry.size());
@@ -128,7 +151,12 @@ class FileLog : public SystemLog {
   Clock& clock_;
   const std::string directory_;
   const std::string path_;
+  const std::string ident_ = std::string(kIdent) + "[" + std::to_string(getpid()) + "]: ";
   std::mutex mutex_;
+  // Debug and info lines wait here for a message of a higher level, or the end.
+  std::string waiting_;
+  double timeSecond_ = -1;
+  std::string timeText_ = Rfc3339({-1});
   Descriptor file_;
   bool cutShort_ = false;
 };
