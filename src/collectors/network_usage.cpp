@@ -36,7 +36,7 @@ constexpr std::string_view kFieldSuffix = "Bytes";
 constexpr std::size_t kLongestName = 1024;
 // A baseline that is larger than a document may be could not be stored, and the next run would add
 // everything again. The rest is left to the domain's other keys.
-constexpr std::size_t kBaselineBytes = kMaxPropertyListBytes - 1024 * 1024;
+constexpr std::size_t kBaselineBytes = kMaxPropertyListBytes - std::size_t{1024} * 1024;
 
 struct UsageRecord {
   std::string_view name;
@@ -190,7 +190,8 @@ void processDataUsageReply(const Array& records, CounterStore& counterStore,
   }
   // The two stores cannot be changed at once. This way round, a run that is killed in between loses
   // no traffic: the next one adds the same growth again.
-  counters.commit();
+  // Without the counters the baseline stays: what was not counted is counted next time.
+  if (!counters.commit()) return;
   preferences.DGWPreferencesSetValue(kBaseline, comparison.baseline(), kDomain);
   preferences.DGWPreferencesSynchronize(kDomain);
 }

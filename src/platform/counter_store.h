@@ -97,17 +97,17 @@ class CounterStore {
   virtual void TLClientCheckpoint() = 0;
 
   // Makes all changes in order and at once: in one short transaction, where the store has them. A
-  // failure leaves one error line, and none of them is made.
-  virtual void writeScalars(std::span<const ScalarChange> changes) = 0;
+  // failure leaves one error line, and none of them is made: false.
+  [[nodiscard]] virtual bool writeScalars(std::span<const ScalarChange> changes) = 0;
 
   // Sets, or adds to (saturating), today's value of one key.
   void TLClientSetValueForScalarKey(std::string_view key, std::int64_t value) {
     const ScalarChange change{ScalarChange::Kind::kSet, std::string(key), value};
-    writeScalars({&change, 1});
+    static_cast<void>(writeScalars({&change, 1}));
   }
   void TLClientAddValueForScalarKey(std::string_view key, std::int64_t value) {
     const ScalarChange change{ScalarChange::Kind::kAdd, std::string(key), value};
-    writeScalars({&change, 1});
+    static_cast<void>(writeScalars({&change, 1}));
   }
 
   // A reader on the store's default location, or nullptr when it cannot be opened.
@@ -130,10 +130,11 @@ class CounterBatch {
   void TLClientAddValueForScalarKey(std::string_view key, std::int64_t value) {
     changes_.push_back({ScalarChange::Kind::kAdd, std::string(key), value});
   }
-  // Writes what was collected; the batch is empty afterwards.
-  void commit() {
-    if (!changes_.empty()) store_.writeScalars(changes_);
+  // Writes what was collected; the batch is empty afterwards. False when none of it was written.
+  bool commit() {
+    const bool written = changes_.empty() || store_.writeScalars(changes_);
     changes_.clear();
+    return written;
   }
 
  private:

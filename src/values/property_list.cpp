@@ -66,8 +66,14 @@ PropertyValue IntegerFromNode(plist_t node) {
   return UInt64(bits);
 }
 
-// libplist hands dates out in 32 bits of seconds; its binary form of one keeps all of it.
+// libplist hands dates out in 32 bits of seconds; the binary form of one that does not fit keeps
+// all of it.
 PropertyValue DateFromNode(plist_t node) {
+  std::int32_t seconds = 0;
+  std::int32_t microseconds = 0;
+  plist_get_date_val(node, &seconds, &microseconds);
+  const Node whole(plist_new_date(seconds, 0));
+  if (plist_compare_node_value(node, whole.get()) != 0) return Date{seconds + kEpoch2001};
   char* memory = nullptr;
   std::uint32_t size = 0;
   plist_to_bin(node, &memory, &size);

@@ -42,7 +42,8 @@ class FakeCounterStore : public CounterStore {
     std::erase_if(scalars, isOld);
     std::erase_if(distributions, isOld);
   }
-  void writeScalars(std::span<const ScalarChange> changes) override {
+  bool writeScalars(std::span<const ScalarChange> changes) override {
+    if (isFull) return false;
     for (const ScalarChange& change : changes) {
       std::int64_t& value = scalars[{change.key, TLDaysSince1970()}];
       if (change.kind == ScalarChange::Kind::kSet) {
@@ -52,6 +53,7 @@ class FakeCounterStore : public CounterStore {
                                  : std::numeric_limits<std::int64_t>::max();
       }
     }
+    return true;
   }
   std::unique_ptr<TLHistory> initWithDefaultPath() override {
     ++historiesOpened;
@@ -61,6 +63,7 @@ class FakeCounterStore : public CounterStore {
   std::map<RowKey, std::int64_t> scalars;
   std::map<RowKey, Samples> distributions;
   bool isMissing = false;  // no reader can be opened
+  bool isFull = false;     // nothing can be written
   int checkpoints = 0;
   int historiesOpened = 0;
 

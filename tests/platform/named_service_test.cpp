@@ -200,23 +200,6 @@ TEST_F(NamedServiceTest, APeerThatHasSpokenKeepsItsPlace) {
   EXPECT_EQ(serve(), "apps ");
 }
 
-TEST_F(NamedServiceTest, WithoutDescriptorsTheOthersAreServedAndOneLineIsLogged) {
-  ASSERT_TRUE(listen(*service));
-  const Descriptor peer = connect();
-  serve();
-  const Descriptor queued = connect();
-  rlimit limit{};
-  ASSERT_EQ(getrlimit(RLIMIT_NOFILE, &limit), 0);
-  const rlimit none{.rlim_cur = 3, .rlim_max = limit.rlim_max};
-  ASSERT_EQ(setrlimit(RLIMIT_NOFILE, &none), 0);
-  for (int i = 0; i < 3; ++i) {
-    send(peer, FrameOf("a"));
-    EXPECT_EQ(serve(0.01), "a ");
-  }
-  ASSERT_EQ(setrlimit(RLIMIT_NOFILE, &limit), 0);
-  EXPECT_EQ(log.errors().size(), 1u);
-}
-
 TEST_F(NamedServiceTest, AStaleSocketIsReplacedAndNothingElse) {
   ASSERT_TRUE(listen(*service));
   auto second = MakeLinuxNamedService(device.root(), log);
@@ -246,17 +229,6 @@ TEST_F(NamedServiceTest, AStaleSocketIsReplacedAndNothingElse) {
   second = MakeLinuxNamedService(other.root(), log);
   EXPECT_FALSE(listen(*second)) << "a directory";
   EXPECT_TRUE(other.exists("/run/quorlet/nuvex.test/file"));
-}
-
-TEST_F(NamedServiceTest, LongPathsAreReached) {
-  const std::string deep =
-      device.directory() + "/" + std::string(90, 'd') + "/" + std::string(90, 'e');
-  service = MakeLinuxNamedService(Root(deep), log);
-  ASSERT_TRUE(listen(*service));
-  const Descriptor peer = MakeUnixSocket();
-  ASSERT_EQ(UnixSocketAddress(deep + kServiceDirectory, kName).connect(peer.get()), 0);
-  send(peer, FrameOf("far"));
-  EXPECT_EQ(serve(), "far ");
 }
 
 TEST_F(NamedServiceTest, APassedSocketIsServed) {

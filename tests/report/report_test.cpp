@@ -229,23 +229,6 @@ TEST_F(ReportTest, TheLogHoldsWhatTheWhitelistAllows) {
   EXPECT_EQ(device.diagnostics.logs[0].name, "log-aggregated");
 }
 
-TEST_F(ReportTest, TaskingValuesReachTheLog) {
-  allowScalars({{"s", "", ""}});
-  device.counterStore.hasScalar("s", 19999, 1);
-  const Array payload{Dictionary{{"Key", "k"}}};
-  const char* domain = "nuvex.aggregated.quorlet";
-  device.preferences.DGWPreferencesSetValue("TaskingID", PropertyValue("id"), domain);
-  device.preferences.DGWPreferencesSetValue("TaskingDigest", Int64(5), domain);
-  device.preferences.DGWPreferencesSetValue("TaskingPayload", PropertyValue(payload), domain);
-  writeLog();
-  const Dictionary log = document();
-  EXPECT_EQ(*log.find("TLTaskID"), PropertyValue("id"));
-  EXPECT_EQ(*log.find("TLTaskDigest"), Int64(5));
-  EXPECT_EQ(*log.find("TLTasking"), PropertyValue(payload));
-  EXPECT_EQ(*log.find("TLDistributions"), PropertyValue(Dictionary()));
-  EXPECT_FALSE(log.contains("TLActivatedAppInfo"));
-}
-
 TEST_F(ReportTest, NothingToReportLeavesNoTrace) {
   allowScalars({{"s", "", ""}, {"nuvex.kernel.swapusage", "", ""}});
   device.counterStore.hasScalar("other", 19999, 1);

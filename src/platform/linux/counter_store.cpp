@@ -2,6 +2,9 @@
 
 #include <algorithm>
 #include <cmath>
+#include <functional>
+#include <string>
+#include <vector>
 
 namespace quorlet {
 namespace {
@@ -28,15 +31,23 @@ class LinuxCounterStore : public CounterStore {
     static_cast<void>(ledger_.dropDaysBefore(TLDaysSince1970() - kDaysKept));
   }
 
-  void writeScalars(std::span<const ScalarChange> changes) override {
+  bool writeScalars(std::span<const ScalarChange> changes) override {
     const std::int32_t today = TLDaysSince1970();
-    static_cast<void>(ledger_.inTransaction([&] {
-      return std::ranges::all_of(changes, [&](const ScalarChange& change) {
-        return change.kind == ScalarChange::Kind::kSet
-                   ? ledger_.setScalar(change.key, today, change.value)
-                   : ledger_.addToScalar(change.key, today, change.value);
+    // In key order, which is the order of the rows, so that pages are changed one after the other;
+    // changes of one key stay in their order.
+    std::vector<const ScalarChange*> sorted;
+    sorted.reserve(changes.size());
+    for (const ScalarChange& change : changes) sorted.push_back(&change);
+    std::ranges::stable_sort(
+        sorted, std::ranges::less(),
+        [](const ScalarChange* change) -> const std::string& { return change->key; });
+    return ledger_.inTransaction([&] {
+      return std::ranges::all_of(sorted, [&](const ScalarChange* change) {
+        return change->kind == ScalarChange::Kind::kSet
+                   ? ledger_.setScalar(change->key, today, change->value)
+                   : ledger_.addToScalar(change->key, today, change->value);
       });
-    }));
+    });
   }
 
   std::unique_ptr<TLHistory> initWithDefaultPath() override { return ledger_.openHistory(); }

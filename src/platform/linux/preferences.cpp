@@ -77,6 +77,8 @@ std::variant<std::string, PropertyListError> Document(const PropertyValue& value
 
 // Whether both look the same in a file; 5 and 5.0 do not, although they are equal.
 bool IsWrittenAlike(const PropertyValue& one, const PropertyValue& other) {
+  // Spares most changes the documents. What only repair makes alike is written once more.
+  if (!(one == other)) return false;
   const auto oneDocument = Document(one);
   const auto otherDocument = Document(other);
   const auto* oneText = std::get_if<std::string>(&oneDocument);
@@ -213,26 +215,43 @@ class LinuxPreferences : public Preferences {
     return settled;
   }
 
-  // Replaces the file by what it holds with the pending changes merged in. With the lock held.
-  void writeMerged(std::string_view name, Domain& domain) {
+  // What the file would hold with the pending changes, but for those in `refused`.
+  static Dictionary merge(const Domain& domain, const Changes& refused) {
     Dictionary merged = domain.stored.shallowCopy();
+    for (const auto& [key, value] : domain.pending) {
+      if (refused.contains(key)) continue;
+      if (value) {
+        merged[key] = *value;
+      } else {
+        merged.remove(key);
+      }
+    }
+    return merged;
+  }
+
+  // The pending changes that no file can hold, which must not keep the others out of it.
+  Changes findUnwritable(std::string_view name, const Domain& domain) {
     Changes refused;
     for (const auto& [key, value] : domain.pending) {
-      if (!value) {
-        merged.remove(key);
-        continue;
-      }
-      // One value that no file can hold must not keep the others out of it.
+      if (!value) continue;
       const auto alone = Document(Dictionary{{key, *value}});
       if (const auto* error = std::get_if<PropertyListError>(&alone)) {
         log_.error("Cannot write the preference %@ of %@: %@", key, name, error->description);
         refused.emplace(key, value);
-        continue;
       }
-      merged[key] = *value;
     }
-    if (refused.size() == domain.pending.size()) return;
-    const auto document = Document(merged);
+    return refused;
+  }
+
+  // Replaces the file by what it holds with the pending changes merged in. With the lock held.
+  void writeMerged(std::string_view name, Domain& domain) {
+    Changes refused;
+    auto document = Document(merge(domain, refused));
+    if (std::holds_alternative<PropertyListError>(document)) {
+      refused = findUnwritable(name, domain);
+      if (refused.size() == domain.pending.size()) return;
+      if (!refused.empty()) document = Document(merge(domain, refused));
+    }
     if (const auto* error = std::get_if<PropertyListError>(&document)) {
       log_.error("Cannot write the preferences %@: %@", path(name), error->description);
       return;

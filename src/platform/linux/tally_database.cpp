@@ -209,21 +209,7 @@ int TallyDatabase::setScalar(std::string_view key, std::int32_t day, std::int64_
 }
 
 int TallyDatabase::addToScalar(std::string_view key, std::int32_t day, std::int64_t value) {
-  std::int64_t sum = 0;
-  {
-    SqliteRun run(database_, getScalar_, std::int64_t{day}, key);
-    const int code = run.next();
-    if (code == SQLITE_ROW) {
-      sum = run.integer(0);
-    } else if (code != SQLITE_DONE) {
-      return code;
-    }
-  }
-  if (__builtin_add_overflow(sum, value, &sum)) {
-    sum = value < 0 ? std::numeric_limits<std::int64_t>::min()
-                    : std::numeric_limits<std::int64_t>::max();
-  }
-  return setScalar(key, day, sum);
+  return SqliteRun(database_, addScalar_, std::int64_t{day}, key, value).finish();
 }
 
 int TallyDatabase::findSequence(std::string_view key, std::int32_t day,

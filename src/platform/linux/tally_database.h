@@ -87,7 +87,13 @@ class TallyDatabase {
   bool isBlank_ = false;
   std::string scratch_;
 
-  SqliteStatement getScalar_{"SELECT value FROM scalars WHERE day = ?1 AND key = ?2"};
+  // SQLite would turn a sum that overflows into a real.
+  SqliteStatement addScalar_{
+      "INSERT INTO scalars(day, key, value) VALUES(?1, ?2, ?3) ON CONFLICT(day, key) DO UPDATE"
+      " SET value = CASE"
+      " WHEN ?3 > 0 AND value > 9223372036854775807 - ?3 THEN 9223372036854775807"
+      " WHEN ?3 < 0 AND value < -9223372036854775807 - 1 - ?3 THEN -9223372036854775807 - 1"
+      " ELSE value + ?3 END"};
   SqliteStatement putScalar_{"REPLACE INTO scalars(day, key, value) VALUES(?1, ?2, ?3)"};
   SqliteStatement findSequence_{"SELECT id FROM sequences WHERE day = ?1 AND key = ?2"};
   SqliteStatement putSequence_{"INSERT INTO sequences(day, key, id) VALUES(?1, ?2, ?3)"};
