@@ -190,7 +190,7 @@ void processDataUsageReply(const Array& records, CounterStore& counterStore,
   }
   // The two stores cannot be changed at once. This way round, a run that is killed in between loses
   // no traffic: the next one adds the same growth again.
-  // Without the counters the baseline stays: what was not counted is counted next time.
+  // For the same reason the baseline stays when the counters could not be written.
   if (!counters.commit()) return;
   preferences.DGWPreferencesSetValue(kBaseline, comparison.baseline(), kDomain);
   preferences.DGWPreferencesSynchronize(kDomain);

@@ -22,9 +22,9 @@ void collectDataUsage(Platform& platform);
 //   datausage.baddata.<process>    counts that went down although their since-time stayed the same
 //   datausage.olddata.<process>    records that started before yesterday and cannot be compared
 // <process> is the bundle name, or "nuvex." and the process name. The counts become the baseline of
-// the next reply, in place of the last one's. A record that lacks a name, the since-time or a count
-// is skipped. So are names of more than 1024 bytes, and records that the baseline has no room for;
-// one error line tells how many there were.
+// the next reply, in place of the last one's, unless the counters could not be written. A record
+// that lacks a name, the since-time or a count is skipped. So are names of more than 1024 bytes,
+// and records that the baseline has no room for; one error line tells how many there were.
 void processDataUsageReply(const Array& records, CounterStore& counterStore,
                            Preferences& preferences, SystemLog& log);
 

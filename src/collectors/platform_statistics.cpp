@@ -15,7 +15,8 @@ std::int64_t Mebibytes(const Dictionary& usage, std::string_view entry) {
   return bytes ? *bytes >> 20 : -1;
 }
 
-void CollectDiskUsage(DeviceInfo& deviceInfo, CounterBatch& counters) {
+void CollectDiskUsage(DeviceInfo& deviceInfo, CounterStore& counterStore) {
+  CounterBatch counters(counterStore);
   const auto answer = deviceInfo.DQCopyAnswer("DiskUsage");
   const Dictionary* dictionary = answer ? answer->asDictionary() : nullptr;
   const Dictionary usage = dictionary != nullptr ? *dictionary : Dictionary();
@@ -23,18 +24,16 @@ void CollectDiskUsage(DeviceInfo& deviceInfo, CounterBatch& counters) {
                                         Mebibytes(usage, "kDQQDiskUsageTotalDiskCapacity"));
   counters.TLClientSetValueForScalarKey("nuvex.tilehall.DiskUsageUserBlocksFree",
                                         Mebibytes(usage, "kDQQDiskUsageTotalDataAvailable"));
+  counters.commit();
 }
 
 }  // namespace
 
 void collectPlatformStatistics(Platform& platform) {
   SystemLog& log = platform.log;
-  // Committed at the end: nothing of the store is held while a step waits.
-  CounterBatch counters(platform.counterStore);
-  RunStep(log, "disk usage", [&] { CollectDiskUsage(platform.deviceInfo, counters); });
+  RunStep(log, "disk usage", [&] { CollectDiskUsage(platform.deviceInfo, platform.counterStore); });
   RunStep(log, "ECC events", [&] { logECCEvents(platform); });
   RunStep(log, "network usage", [&] { collectDataUsage(platform); });
-  RunStep(log, "counters", [&] { counters.commit(); });
 }
 
 }  // namespace quorlet

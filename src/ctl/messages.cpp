@@ -3,6 +3,7 @@
 #include <unistd.h>
 
 #include "ctl/output.h"
+#include "platform/linux/services.h"
 
 namespace quorlet {
 namespace {
@@ -13,11 +14,20 @@ constexpr std::size_t kMaxMessageBytes = 4096;
 
 class CollectingLog final : public SystemLog {
  public:
-  explicit CollectingLog(Messages& messages) : messages_(messages) {}
-  void write(LogLevel level, std::string_view text) override { messages_.add(level, text); }
+  CollectingLog(Messages& messages, Access access)
+      : messages_(messages),
+        systemLog_(access == Access::kReadWrite
+                       ? MakeLinuxSystemLog(Root::FromEnvironment(), access, *clock_)
+                       : nullptr) {}
+  void write(LogLevel level, std::string_view text) override {
+    messages_.add(level, text);
+    if (level == LogLevel::kError && systemLog_ != nullptr) systemLog_->write(level, text);
+  }
 
  private:
   Messages& messages_;
+  const std::unique_ptr<Clock> clock_ = MakeLinuxClock();
+  const std::unique_ptr<SystemLog> systemLog_;
 };
 
 }  // namespace
@@ -28,7 +38,9 @@ void PrintErrorLine(std::string_view text) {
   [[maybe_unused]] const ssize_t written = ::write(STDERR_FILENO, line.data(), line.size());
 }
 
-std::unique_ptr<SystemLog> Messages::makeLog() { return std::make_unique<CollectingLog>(*this); }
+std::unique_ptr<SystemLog> Messages::makeLog(Access access) {
+  return std::make_unique<CollectingLog>(*this, access);
+}
 
 void Messages::add(LogLevel level, std::string_view text) {
   if (level < lowest_) return;

@@ -9,6 +9,7 @@
 #include <string_view>
 #include <vector>
 
+#include "platform/linux/access.h"
 #include "platform/system_log.h"
 
 namespace quorlet {
@@ -26,8 +27,9 @@ void PrintErrorLine(std::string_view text);
 // that fails says so in exactly one line.
 class Messages {
  public:
-  // A system log that adds to these messages; they outlive it.
-  std::unique_ptr<SystemLog> makeLog();
+  // A system log that adds to these messages; they outlive it. With access to write, errors go to
+  // the root's system log as well.
+  std::unique_ptr<SystemLog> makeLog(Access access);
 
   void add(LogLevel level, std::string_view text);
   // Messages below `lowest` are not kept; without a call, those below the default level.

@@ -23,7 +23,8 @@ struct Session {
 
   // The services of the root that QUORLET_ROOT names.
   std::unique_ptr<LinuxPlatform> open(Access access) {
-    return std::make_unique<LinuxPlatform>(Root::FromEnvironment(), access, messages.makeLog());
+    return std::make_unique<LinuxPlatform>(Root::FromEnvironment(), access,
+                                           messages.makeLog(access));
   }
 };
 

@@ -29,8 +29,13 @@ std::string UuidText(const Data& uuid) {
   return text;
 }
 
+// The field's 64 bits; 0 when it is missing or not a number.
 std::int64_t IntegerField(const Dictionary& message, std::string_view key) {
-  return IntegerEntry(message, key).value_or(0);
+  const PropertyValue* value = message.find(key);
+  const Number* number = value != nullptr ? value->asNumber() : nullptr;
+  if (number == nullptr) return 0;
+  return number->kind() == NumberKind::kUInt64 ? static_cast<std::int64_t>(number->toUInt64())
+                                               : number->toInt64();
 }
 
 }  // namespace

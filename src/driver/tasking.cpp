@@ -1,6 +1,9 @@
 #include "driver/tasking.h"
 
+#include <algorithm>
 #include <cstdint>
+#include <cstdlib>
+#include <limits>
 #include <optional>
 #include <set>
 #include <string>
@@ -130,7 +133,7 @@ class TaskingUpdate {
   }
 
   // Our own record goes last: while it still tells of the old tasking, a run that was cut short is
-  // made good by the next one.
+  // made good by the next one with the same schedule.
   void synchronize() {
     const bool ownTouched = touched_.erase(std::string(kOwnDomain)) != 0;
     for (const std::string& domain : touched_) {
@@ -146,9 +149,12 @@ class TaskingUpdate {
     const std::int32_t changeDay = Low32(IntegerEntry(lastOS_, "day").value_or(0));
     const std::uint32_t forward =
         static_cast<std::uint32_t>(today_) - static_cast<std::uint32_t>(changeDay);
-    // 32-bit arithmetic that wraps: the magnitude of the most negative number is itself.
-    const auto difference = static_cast<std::int32_t>(forward);
-    const auto distance = static_cast<std::int32_t>(difference < 0 ? 0 - forward : forward);
+    // 32-bit arithmetic that wraps. The most negative number's magnitude does not fit, and a
+    // distance is never negative.
+    constexpr std::int32_t kFarthest = std::numeric_limits<std::int32_t>::max();
+    const std::int64_t difference = static_cast<std::int32_t>(forward);
+    const auto distance =
+        static_cast<std::int32_t>(std::min<std::int64_t>(std::abs(difference), kFarthest));
     if (days <= distance) return;
     platform_.log.log("Aggressive submission day %d of %d; triggering log submission", distance,
                       days);

@@ -17,6 +17,7 @@ bool EnvironmentQueries::TLIsInternalDevice() {
 }
 
 bool EnvironmentQueries::isMultiUserMode() {
+  const std::lock_guard hold(mutex_);
   if (multiUser_) return *multiUser_;
   if (deviceInfo_.DQGetBoolAnswer(kInternalBuild) && environment_.stat(kForceMultiUserMode)) {
     log_.log("Forcing Multi User Mode behavior due to the presence of /var/db/forceMultiUserMode");
@@ -29,6 +30,7 @@ bool EnvironmentQueries::isMultiUserMode() {
 }
 
 std::optional<std::string> EnvironmentQueries::dataHomePath() {
+  const std::lock_guard hold(mutex_);
   if (dataHome_) return dataHome_;
   if (!isMultiUserMode()) {
     dataHome_ = kSingleUserHome;

@@ -13,19 +13,20 @@
 
 namespace quorlet {
 
+// Safe to use from any thread: the counter store asks from the one that a reply comes on, too.
 class EnvironmentQueries {
  public:
   EnvironmentQueries(DeviceInfo& deviceInfo, Environment& environment, SystemLog& log)
       : deviceInfo_(deviceInfo), environment_(environment), log_(log) {}
 
-  // Whether the device runs an internal build. Safe to call from any thread.
+  // Whether the device runs an internal build.
   bool TLIsInternalDevice();
 
-  // Whether the system runs in multi-user mode. Main thread only.
+  // Whether the system runs in multi-user mode.
   bool isMultiUserMode();
 
   // The directory under which the counter store keeps its files, or nothing when the container of
-  // multi-user mode cannot be found; then the next call looks again. Main thread only.
+  // multi-user mode cannot be found; then the next call looks again.
   std::optional<std::string> dataHomePath();
 
  private:
@@ -34,6 +35,7 @@ class EnvironmentQueries {
   SystemLog& log_;
   std::once_flag internalOnce_;
   bool internal_ = false;
+  std::recursive_mutex mutex_;  // dataHomePath asks isMultiUserMode
   std::optional<bool> multiUser_;
   std::optional<std::string> dataHome_;
 };

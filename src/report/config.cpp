@@ -121,6 +121,10 @@ std::optional<TLConfig> TLConfig::init(Platform& platform) {
                                      {config._scalarKeys, config._scalarPrefixes,
                                       config._distributionKeys, config._distributionPrefixes});
   for (const WhitelistFault& fault : faults) {
+    if (fault.key.empty()) {
+      platform.log.error("Skipping keyGroup %@: it %@", fault.group, fault.reason);
+      continue;
+    }
     platform.log.error("Skipping whitelist entry %@ of keyGroup %@: it %@", fault.key, fault.group,
                        fault.reason);
   }

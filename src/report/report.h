@@ -42,7 +42,8 @@ class TLReport {
                                                   std::string_view key, const KeyOptions& options);
 
   // The bucket of `value`: the index of the first bound that is not less, or the number of bounds.
-  // `intervals` must ascend; RunningMaxima makes bounds in any order do so with the same answers.
+  // `intervals` must not descend; of bounds in any order, the largest so far at each position
+  // give the same answers.
   static std::uint32_t determineHistBucketForValueWithIntervals(double value,
                                                                 std::span<const double> intervals);
 

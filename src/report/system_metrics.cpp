@@ -43,7 +43,8 @@ std::int64_t ReadKernelMetric(KernelParameters& parameters, const KernelMetric& 
   std::array<std::byte, 32> record{};
   std::size_t length = metric.recordSize;
   const auto buffer = std::span(record).first(metric.recordSize);
-  if (parameters.sysctlbyname(metric.parameter, buffer, length) != 0) return -1;
+  const int error = parameters.sysctlbyname(metric.parameter, buffer, length);
+  if (error != 0 || length < metric.width) return -1;
   ByteReader reader(buffer);
   return metric.width == 4 ? static_cast<std::int64_t>(reader.little<std::uint32_t>())
                            : static_cast<std::int64_t>(reader.little<std::uint64_t>());
@@ -54,13 +55,17 @@ void BindPreferenceFunctions(SupportLibrary& library, SystemLog& log) {
     log.error("Failed to dynamically load the FaultScribeSupport framework");
     return;
   }
-  library.integerReader =
-      reinterpret_cast<IntegerPreferenceReader>(library.findFunction(kReaderName));
+  if (library.integerReader == nullptr) {
+    library.integerReader =
+        reinterpret_cast<IntegerPreferenceReader>(library.findFunction(kReaderName));
+  }
   if (library.integerReader == nullptr) {
     log.error("Failed to dyanmically link DGWPreferencesGetIntegerValue");
   }
-  library.integerWriter =
-      reinterpret_cast<IntegerPreferenceWriter>(library.findFunction(kWriterName));
+  if (library.integerWriter == nullptr) {
+    library.integerWriter =
+        reinterpret_cast<IntegerPreferenceWriter>(library.findFunction(kWriterName));
+  }
   if (library.integerWriter == nullptr) {
     log.error("Failed to dynamically link DGWPreferencesSetValue");
   }

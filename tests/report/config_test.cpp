@@ -102,7 +102,7 @@ TEST_F(ConfigTest, FaultyEntriesAreSkippedWithOneLineEach) {
                 "Skipping whitelist entry DistributionKeys of keyGroup G: it is not a dictionary",
                 "Skipping whitelist entry bad of keyGroup G: it has options that are not a "
                 "dictionary",
-                "Skipping whitelist entry  of keyGroup H: it is not a dictionary"}));
+                "Skipping keyGroup H: it is not a dictionary"}));
 }
 
 TEST_F(ConfigTest, WithoutAUsableFileThereIsNoConfig) {

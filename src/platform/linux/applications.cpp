@@ -52,7 +52,6 @@ bool IsApplication(std::string_view text) {
     const std::string_view key = Trimmed(line.substr(0, equals));
     const std::string_view value = Trimmed(line.substr(equals + 1));
     if (key == "Type") isApplication = value == "Application";
-    if (key == "Hidden" && value == "true") return false;
   }
   return isApplication;
 }

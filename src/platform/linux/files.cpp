@@ -110,8 +110,10 @@ int MakeDirectories(const std::string& directory) {
     if (parent.size() >= directory.size()) return ENOENT;
     if (const int error = MakeDirectories(parent)) return error;
     // Another process may have been faster.
-    if (mkdir(path, kDirectoryMode) != 0 && errno != EEXIST) return errno;
+    if (mkdir(path, kDirectoryMode) != 0) return errno == EEXIST ? 0 : errno;
   }
+  // The mode is fixed, whatever the process masks.
+  if (chmod(path, kDirectoryMode) != 0) return errno;
   // What is made durable inside must not be lost with its directory; where the parent cannot even
   // be read there is nothing to be done about it.
   (void)SyncDirectory(ParentDirectory(directory));

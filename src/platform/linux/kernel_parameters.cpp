@@ -81,8 +81,9 @@ class LinuxKernelParameters : public KernelParameters {
   }
 
  private:
-  // Takes the first file; one that does not fit the buffer stays. The lock on the directory keeps
-  // two processes from taking the same one.
+  // Takes the first file. One that does not fit the buffer is removed all the same, or it would
+  // stand before the others for ever. The lock on the directory keeps two processes from taking
+  // the same one.
   int takeFromQueue(const std::string& directory, std::span<std::byte> buffer,
                     std::size_t& length) {
     const Descriptor queue(
@@ -97,9 +98,10 @@ class LinuxKernelParameters : public KernelParameters {
       if (name.starts_with('.') || lstat(path.c_str(), &status) != 0 || !S_ISREG(status.st_mode)) {
         continue;
       }
-      if (const int error = ReadInto(path, buffer, length)) return error;
+      const int error = ReadInto(path, buffer, length);
+      if ((error != 0 && error != ENOMEM) || access_ == Access::kReadOnly) return error;
       // An entry that cannot be removed is not handed out, or it would be handed out for ever.
-      return access_ == Access::kReadOnly || unlink(path.c_str()) == 0 ? 0 : errno;
+      return unlink(path.c_str()) == 0 ? error : errno;
     }
     return ENOENT;
   }

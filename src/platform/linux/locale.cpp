@@ -75,9 +75,8 @@ class LinuxLocale : public LocaleService {
 
   std::optional<std::string> CurrentRegionCode() override {
     for (const char* name : {"LC_ALL", "LANG"}) {
-      // The first one that is a locale decides, even when it has no region.
       const auto tag = ParseLocaleName(variable(name));
-      if (tag) return tag->region.empty() ? std::nullopt : std::optional(tag->region);
+      if (tag && !tag->region.empty()) return tag->region;
     }
     return std::nullopt;
   }

@@ -10,6 +10,7 @@
 #include <algorithm>
 #include <cerrno>
 #include <cstdio>
+#include <exception>
 #include <map>
 #include <mutex>
 #include <set>
@@ -107,7 +108,13 @@ class LinuxPreferences : public Preferences {
       : directory_(root.path(kDirectory)), access_(access), log_(log) {}
 
   ~LinuxPreferences() override {
-    for (auto& [name, domain] : domains_) synchronize(name, domain);
+    for (auto& [name, domain] : domains_) {
+      try {
+        synchronize(name, domain);
+      } catch (const std::exception&) {
+        // Out of memory; the process ends all the same.
+      }
+    }
   }
 
   std::optional<PropertyValue> DGWPreferencesGetValue(std::string_view key,

@@ -111,7 +111,7 @@ class FileLog : public SystemLog {
     waiting_.append(" ").append(Describe(level).name).append(" ").append(ident_);
     waiting_.append(OneEntry(text)).append("\n");
     // A pass may have thousands of debug lines; one system call for each would be most of its time.
-    if (level <= LogLevel::kInfo && waiting_.size() < kMostWaiting) return;
+    if (level == LogLevel::kDebug && waiting_.size() < kMostWaiting) return;
     const std::string line = level == LogLevel::kError ? waiting_.substr(start) : "";
     if (!flush()) (void)WriteFully(STDERR_FILENO, line);
   }
@@ -153,7 +153,7 @@ class FileLog : public SystemLog {
   const std::string path_;
   const std::string ident_ = std::string(kIdent) + "[" + std::to_string(getpid()) + "]: ";
   std::mutex mutex_;
-  // Debug and info lines wait here for a message of a higher level, or the end.
+  // Debug lines wait here for a message of a higher level, or the end.
   std::string waiting_;
   double timeSecond_ = -1;
   std::string timeText_ = Rfc3339({-1});

@@ -13,6 +13,7 @@
 #include <algorithm>
 #include <limits>
 
+#include "platform/linux/descriptor.h"
 #include "platform/linux/tally_blocks.h"
 #include "platform/linux/tally_private_copy.h"
 
@@ -141,6 +142,8 @@ int TallyDatabase::setUp(const char* settings) {
 }
 
 int TallyDatabase::openForWriting(const std::string& path) {
+  // SQLite would make the file readable for everybody. What goes wrong here it finds out as well.
+  const Descriptor made(open(path.c_str(), O_RDONLY | O_CREAT | O_CLOEXEC | O_NONBLOCK, 0640));
   const int code = openFile(path, SQLITE_OPEN_READWRITE | SQLITE_OPEN_CREATE);
   return code == SQLITE_OK ? setUp(kWriterSettings) : code;
 }

@@ -220,6 +220,8 @@ void LinuxTallyLedger::countCorruption() {
   if (count == std::numeric_limits<std::int64_t>::max()) return;
   preferences_.DGWPreferencesSetValue(kCorruptionCountKey, Int64(count + 1),
                                       kCorruptionCountDomain);
+  // At once, so that the next process that finds damage counts on from here.
+  preferences_.DGWPreferencesSynchronize(kCorruptionCountDomain);
 }
 
 bool LinuxTallyLedger::startNewDatabase() {
