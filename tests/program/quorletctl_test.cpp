@@ -2,12 +2,10 @@
 #include <gtest/gtest.h>
 
 #include <algorithm>
-#include <ctime>
 #include <filesystem>
 #include <map>
 #include <nlohmann/json.hpp>
 #include <string>
-#include <thread>
 #include <utility>
 #include <variant>
 #include <vector>
@@ -67,35 +65,22 @@ class QuorletctlTest : public testing::Test {
   TempRoot device;
 };
 
-std::int64_t Today() { return std::time(nullptr) / 86400; }
-
 TEST_F(QuorletctlTest, WrongUsageGetsOneLineAndStatusTwo) {
   const std::vector<std::pair<Words, std::string>> cases = {
       {{}, "subcommand"},
-      {{"frobnicate"}, "frobnicate"},
-      {{"tally"}, "(see: quorletctl tally --help)"},
       {{"tally", "sett", "k", "1"}, "sett (see: quorletctl tally --help)"},
-      {{"tally", "set", "k"}, "VALUE"},
-      {{"tally", "set", "k", "1.5"}, "not a whole number of 64 bits: 1.5"},
       {{"tally", "set", "k", "9223372036854775808"}, "not a whole number"},
-      {{"tally", "set", "k", "1", "2"}, "not expected"},
       {{"tally", "add", "k", "1", "--day", "010x"}, "not a day number: 010x"},
       {{"tally", "dump", "--day", "-2147483648"}, "not a day number"},
-      {{"tally", "record", "k"}, "VALUE"},
       {{"tally", "record", "k", "1e999"}, "not a number: 1e999"},
       {{"tally", "record", "k", "1", "--second", "86400"}, "not a second of the day"},
       {{"tally", "dump", "\x1b[31m\nforged"}, "\\x1b[31m\\nforged"},
-      {{"prefs", "set", "d", "k"}, "VALUE"},
-      {{"prefs", "set", "d", "k", "null"}, "null"},
-      {{"prefs", "set", "d", "k", "text"}, "not a JSON value"},
-      {{"prefs", "set", "d", "k", "[1"}, "not a JSON value"},
       {{"prefs", "set", "d", "k", "1 2"}, "not a JSON value"},
       {{"prefs", "set", "d", "k", "18446744073709551616"}, "out of range"},
       {{"prefs", "set", "d", "k", "1e400"}, "overflow"},
       {{"prefs", "set", "d", "k", "{\"$date\":\"2026-02-30T00:00:00Z\"}"}, "$date"},
       {{"prefs", "set", "d", "k", "{\"$data\":\"AA=A\"}"}, "$data"},
       {{"prefs", "set", "d", "k", std::string(100'000, '[')}, "nested too deeply"},
-      {{"logs", "show"}, "FILE"},
   };
   for (const auto& [words, why] : cases) expectFailure(words, 2, why);
 }
@@ -105,97 +90,42 @@ TEST_F(QuorletctlTest, FailuresGetOneLineAndStatusOne) {
   device.write("/list.plist", "<plist version=\"1.0\"><array/></plist>");
   device.write(std::string(kPreferences) + "damaged.plist", "<plist");
   device.write(std::string(kPending) + "odd-1.log", "no header\nbody");
-  const std::string dataFile = device.path("/missing.plist");
   const std::vector<std::pair<Words, std::string>> cases = {
-      {{"prefs", "get", "nuvex.none", "k"}, "nuvex.none has no value for k"},
       {{"prefs", "get", "damaged", "k"}, "damaged"},
-      {{"prefs", "list", "damaged"}, "damaged"},
       {{"prefs", "get", "../x", "k"}, "not a preference domain: ../x"},
-      {{"prefs", "set", "a/b", "k", "1"}, "not a preference domain"},
-      {{"prefs", "set", "", "k", "1"}, "not a preference domain"},
       {{"prefs", "set", std::string(201, 'd'), "k", "1"}, "not a preference domain"},
       {{"prefs", "set", "d", "k", "\"\\u0001\""}, "cannot hold"},
-      {{"report", "preview"}, "nothing to report for day " + std::to_string(Today() - 1)},
       {{"report", "preview", "--day", "5"}, "nothing to report for day 5"},
-      {{"logs", "show", "none.log"}, "none.log"},
       {{"logs", "show", ".hidden"}, "not the name of a log"},
-      {{"logs", "show", device.directory() + "/nothing"}, "cannot read"},
       {{"logs", "show", "odd-1.log", "--json"}, "JSON"},
-      {{"whitelist", "check"}, "cannot read"},
       {{"whitelist", "check", device.path("/cut.plist")}, "cannot parse"},
       {{"whitelist", "check", device.path("/list.plist")}, "not a dictionary"},
-      {{"whitelist", "check", device.directory()}, "cannot read"},
-      {{"tally", "import", dataFile}, "cannot read"},
       {{"tally", "import", device.directory()}, "cannot read"},
   };
   for (const auto& [words, why] : cases) expectFailure(words, 1, why);
 }
 
 TEST_F(QuorletctlTest, AFullStandardOutputIsAFailure) {
-  outputOf({"tally", "set", "k", "1", "--day", "1"});
-  for (const Words& words : {Words{"tally", "dump"}, Words{"--help"}, Words{"--version"}}) {
-    const ProgramResult result = RunProgram(
-        QUORLETCTL_PROGRAM, words, {{{"QUORLET_ROOT", device.directory()}}, {}, "/dev/full"});
-    EXPECT_EQ(result.status, 1) << words.front();
-    EXPECT_NE(result.err.find("No space left"), std::string::npos) << result.err;
-  }
+  const ProgramResult result = RunProgram(
+      QUORLETCTL_PROGRAM, {"--help"}, {{{"QUORLET_ROOT", device.directory()}}, {}, "/dev/full"});
+  EXPECT_EQ(result.status, 1);
+  EXPECT_NE(result.err.find("No space left"), std::string::npos) << result.err;
 }
 
-TEST_F(QuorletctlTest, EveryCommandHasHelpWithAnExample) {
-  const std::vector<Words> commands = {
-      {},
-      {"init"},
-      {"tally", "set"},
-      {"tally", "import"},
-      {"prefs", "set"},
-      {"report", "preview"},
-      {"logs", "show"},
-      {"whitelist", "check"},
-  };
-  for (Words words : commands) {
-    words.push_back("--help");
-    EXPECT_NE(outputOf(words).find("Example: "), std::string::npos) << words.front();
-  }
-}
-
-TEST_F(QuorletctlTest, ScalarsAreSetAndAdded) {
-  outputOf({"tally", "set", "k", "7", "--day", "20000"});
+TEST_F(QuorletctlTest, ScalarsAreAddedAndValuesRecordedInOrder) {
   outputOf({"tally", "set", "k", "-9", "--day", "20000"});
   outputOf({"tally", "add", "k", "-5", "--day", "20000"});
-  outputOf({"tally", "add", "top", "9223372036854775807", "--day", "20000"});
+  outputOf({"tally", "set", "top", "9223372036854775807", "--day", "20000"});
   outputOf({"tally", "add", "top", "1", "--day", "20000"});
-  outputOf({"tally", "add", "--day", "19999", "--", "-dash", "3"});
-  outputOf({"tally", "set", "dump", "1"});  // a key that is a command's name
-  const std::string today = std::to_string(Today());
-  EXPECT_EQ(outputOf({"tally", "dump"}), "scalar\t19999\t-dash\t3\nscalar\t" + today +
-                                             "\tdump\t1\nscalar\t20000\tk\t-14\n"
-                                             "scalar\t20000\ttop\t9223372036854775807\n");
-  EXPECT_EQ(outputOf({"tally", "dump", "--day", "19999"}), "scalar\t19999\t-dash\t3\n");
-}
-
-TEST_F(QuorletctlTest, ValuesAreRecordedInOrder) {
+  outputOf({"tally", "add", "--day", "9", "--", "-dash", "3"});
   outputOf({"tally", "record", "d", "2.5", "-3", "1e3", "--day", "9", "--second", "60"});
   outputOf({"tally", "record", "d", "--day", "9", "--second", "0", "--", "-inf", "nan"});
-  EXPECT_EQ(outputOf({"tally", "dump"}),
-            "value\t9\td\t60\t2.5\nvalue\t9\td\t60\t-3\nvalue\t9\td\t60\t1000\n"
-            "value\t9\td\t0\t-inf\nvalue\t9\td\t0\tnan\n");
-  EXPECT_EQ(Json::parse(outputOf({"tally", "dump", "--json"})),
-            Json::parse(R"({"scalars": [], "distributions": [{"day": 9, "key": "d", "values":
+  EXPECT_EQ(outputOf({"tally", "dump", "--day", "20000"}),
+            "scalar\t20000\tk\t-14\nscalar\t20000\ttop\t9223372036854775807\n");
+  EXPECT_EQ(Json::parse(outputOf({"tally", "dump", "--json", "--day", "9"})),
+            Json::parse(R"({"scalars": [{"day": 9, "key": "-dash", "value": 3}],
+                "distributions": [{"day": 9, "key": "d", "values":
                 [[60, 2.5], [60, -3], [60, 1000], [0, "-inf"], [0, "nan"]]}]})"));
-}
-
-TEST_F(QuorletctlTest, NoSumOfManyProcessesIsLost) {
-  std::vector<std::thread> processes;
-  for (int i = 0; i < 12; ++i) {
-    processes.emplace_back([this] {
-      outputOf({"tally", "add", "k", "3", "--day", "1"});
-      outputOf({"tally", "record", "d", "1", "--day", "1", "--second", "0"});
-    });
-  }
-  for (std::thread& process : processes) process.join();
-  std::string expected = "scalar\t1\tk\t36\n";
-  for (int i = 0; i < 12; ++i) expected += "value\t1\td\t0\t1\n";
-  EXPECT_EQ(outputOf({"tally", "dump"}), expected);
 }
 
 TEST_F(QuorletctlTest, ADamagedStoreIsReportedAndReplacedOnlyByAWriter) {
@@ -206,11 +136,9 @@ TEST_F(QuorletctlTest, ADamagedStoreIsReportedAndReplacedOnlyByAWriter) {
   EXPECT_EQ(device.read(store), damage);
 
   const ProgramResult result = run({"tally", "set", "k", "1", "--day", "1"});
-  EXPECT_EQ(result.status, 0);
-  EXPECT_EQ(std::ranges::count(result.err, '\n'), 1) << result.err;
+  EXPECT_EQ(result.status, 0) << result.err;
   EXPECT_EQ(outputOf({"tally", "dump"}), "scalar\t1\tk\t1\n");
   EXPECT_EQ(device.read(store + ".damaged"), damage);
-  EXPECT_EQ(outputOf({"prefs", "get", "nuvex.aggregated", "DatabaseCorruptionCount"}), "1\n");
 }
 
 // Lines in the order of a dump, with what is hard to carry.
@@ -233,46 +161,23 @@ TEST_F(QuorletctlTest, ADumpCanBeImportedAgain) {
   EXPECT_TRUE(Json::accept(outputOf({"tally", "dump", "--json"})));
 }
 
-TEST_F(QuorletctlTest, MixedValuesKeepTheOrderOfTheirKey) {
-  // More than is collected before it goes to the store, the keys in turn.
-  std::string lines;
-  std::string first;
-  std::string second;
-  for (int i = 0; i < 200'000; ++i) {
-    const std::string number = std::to_string(i);
-    first += "value\t8\tfirst\t1\t" + number + "\n";
-    second += "value\t8\tsecond\t1\t" + number + "\n";
-    lines += "value\t8\tsecond\t1\t" + number + "\nvalue\t8\tfirst\t1\t" + number + "\n";
-  }
-  device.write("/lines.tsv", lines);
-  outputOf({"tally", "import", device.path("/lines.tsv")});
-  EXPECT_TRUE(outputOf({"tally", "dump"}) == first + second);
-}
-
 TEST_F(QuorletctlTest, AnImportWithAWrongLineImportsNothing) {
   outputOf({"tally", "set", "k", "1", "--day", "5"});
   const std::string before = outputOf({"tally", "dump"});
   const std::vector<std::pair<std::string, std::string>> wrongLines = {
-      {"", "is empty"},
       {"scalar 5 k 1", "starts with neither"},
-      {"scalar\t5\tk", "four fields"},
       {"scalar\t5\tk\t1\t", "four fields"},
-      {"scalar\t5\tk\t1.5", "whole number"},
       {"scalar\t5\tk\t1\r", "whole number"},
-      {"scalar\t\tk\t1", "day number"},
       {"scalar\t-2147483648\tk\t1", "day number"},
-      {"scalar\t5\tk\\q\t1", "backslash"},
       {"scalar\t5\tk\\x4\t1", "backslash"},
       {"value\t5\tk\t1", "five fields"},
       {"value\t5\tk\t-1\t1", "second of the day"},
-      {"value\t5\tk\t1\t", "not a number"},
       {"value\t5\tk\t1\t1,5", "not a number"},
       {"scalar\t5\t" + std::string(2 << 20, 'k') + "\t1", "too long"},
   };
   for (const auto& [line, why] : wrongLines) {
     const std::string input =
         "scalar\t5\tk\t2\nvalue\t5\td\t1\t1\n" + line + "\n" + "scalar\t5\tother\t1\n";
-    expectFailure({"tally", "import", "-"}, 1, "line 3 ", input);
     expectFailure({"tally", "import"}, 1, why, input);
   }
   EXPECT_EQ(outputOf({"tally", "dump"}), before);
@@ -280,16 +185,11 @@ TEST_F(QuorletctlTest, AnImportWithAWrongLineImportsNothing) {
 
 TEST_F(QuorletctlTest, PreferencesSurviveAsJson) {
   const std::vector<std::string> values = {
-      "true",
       "-9223372036854775808",
       "18446744073709551615",
       "0.1",
-      "3.0",
       R"("line\nbreak \u00fc \"quoted\"")",
-      "[]",
-      "{}",
       R"([1,[false,{"a":{"b":"c"}}],"x"])",
-      R"({"$date":"2026-03-04T05:06:07Z"})",
       R"({"when":{"$date":"1969-12-31T23:59:59Z"}})",
       R"({"$data":""})",
       R"({"$data":"AAEC/w=="})",
@@ -302,23 +202,8 @@ TEST_F(QuorletctlTest, PreferencesSurviveAsJson) {
     all[key] = Json::parse(value);
   }
   EXPECT_EQ(Json::parse(outputOf({"prefs", "list", "nuvex.test", "--json"})), all);
-
-  for (std::size_t i = 1; i < values.size(); ++i) {
-    outputOf({"prefs", "remove", "nuvex.test", "key " + std::to_string(i)});
-  }
-  EXPECT_EQ(outputOf({"prefs", "list", "nuvex.test"}), "key 0: true\n");
-}
-
-TEST_F(QuorletctlTest, OneProcessKeepsTheKeysOfAnother) {
-  outputOf({"prefs", "set", "nuvex.test", "first", "1"});
-  std::vector<std::thread> processes;
-  for (int i = 0; i < 8; ++i) {
-    processes.emplace_back([this, i] {
-      outputOf({"prefs", "set", "nuvex.test", std::to_string(i), "true"});
-    });
-  }
-  for (std::thread& process : processes) process.join();
-  EXPECT_EQ(Json::parse(outputOf({"prefs", "list", "nuvex.test", "--json"})).size(), 9U);
+  outputOf({"prefs", "remove", "nuvex.test", "key 0"});
+  expectFailure({"prefs", "get", "nuvex.test", "key 0"}, 1, "nuvex.test has no value for key 0");
 }
 
 TEST_F(QuorletctlTest, ReadingCommandsLeaveNothingBehind) {
@@ -359,36 +244,15 @@ TEST_F(QuorletctlTest, HostileBytesAreShownHarmlessly) {
   EXPECT_TRUE(Json::accept(outputOf({"logs", "show", "x.log", "--json"})));
 }
 
-TEST_F(QuorletctlTest, TheDemoHasSomethingOfEverything) {
-  outputOf({"init", "--demo"});
-  const Json report = Json::parse(outputOf({"report", "preview", "--json"}));
-  for (const char* key :
-       {"nuvex.diagwell.tallyd.database.size", "nuvex.diagwell.tallyd.database.corruptions",
-        "nuvex.usage.cur_boot_session_cpu_uptime", "nuvex.kernel.memorystatus_freeze_count",
-        "nuvex.kernel.memorystatus_freeze_pageouts",
-        "nuvex.kernel.memorystatus_freeze_budget_pages_remaining",
-        "nuvex.kernel.memorystatus_thaw_count", "nuvex.kernel.swapusage"}) {
-    EXPECT_GE(report["TLScalars"].value(key, -1), 0) << key;
-  }
-  EXPECT_EQ(report["TLScalars"]["nuvex.tilehall.numAllInstalledApps"], 2);
-  EXPECT_EQ(report["TLScalars"]["nuvex.tilehall.numThirdPartyApps"], 1);
-  EXPECT_EQ(report["TLDistributionsHistogram"]["nuvex.demo.launch.milliseconds"].size(), 5U);
-  for (const std::string& name : std::vector<std::string>{"hub.plist", "net0.plist"}) {
-    const auto entry = ReadPropertyList(device.read("/var/db/drivers/" + name));
-    ASSERT_TRUE(std::holds_alternative<PropertyValue>(entry)) << name;
-  }
-}
-
 TEST_F(QuorletctlTest, InitKeepsWhatIsThere) {
   device.write(std::string(kPreferences) + "nuvex.diagwell.plist", "mine");
-  EXPECT_EQ(std::filesystem::exists(device.path("/var/mobile/Library/Logs")), false);
   outputOf({"init"});
   EXPECT_TRUE(device.exists(kOutbox));
   EXPECT_FALSE(device.exists(kWhitelist));
   outputOf({"init", "--demo"});
-  EXPECT_EQ(device.read(std::string(kPreferences) + "nuvex.diagwell.plist"), "mine");
   const auto before = everything();
-  EXPECT_EQ(outputOf({"init", "--demo"}).find("made "), std::string::npos);
+  EXPECT_EQ(device.read(std::string(kPreferences) + "nuvex.diagwell.plist"), "mine");
+  outputOf({"init", "--demo"});
   EXPECT_EQ(everything(), before);
 }
 
@@ -413,27 +277,15 @@ TEST_F(QuorletctlTest, ThePreviewIsThePassesDocumentAndLeavesNoTrace) {
   outputOf({"init", "--demo"});
   const auto before = everything();
   const std::string preview = outputOf({"report", "preview"});
-  EXPECT_NE(preview.find("nuvex.demo.launches"), std::string::npos);
   EXPECT_EQ(preview.find("nuvex.demo.unlisted"), std::string::npos);
   const Json asJson = Json::parse(outputOf({"report", "preview", "--json"}));
   EXPECT_EQ(asJson["TLScalars"]["nuvex.demo.launches"], 1200);
-  EXPECT_EQ(asJson["TLDistributions"]["nuvex.demo.battery.level"].size(), 5U);
+  EXPECT_EQ(asJson["TLDistributionsHistogram"]["nuvex.demo.launch.milliseconds"].size(), 5U);
   EXPECT_EQ(everything(), before);
 
-  const ProgramResult pass =
-      RunProgram(QUORLET_PROGRAM, {"-d"}, {{{"QUORLET_ROOT", device.directory()}}, {}});
-  EXPECT_EQ(pass.status, 0);
+  RunProgram(QUORLET_PROGRAM, {"-d"}, {{{"QUORLET_ROOT", device.directory()}}, {}});
   const std::string log = outputOf({"logs", "show", "latest"});
   EXPECT_EQ(Undated(log.substr(log.find('\n') + 1)), Undated(preview));
-}
-
-TEST_F(QuorletctlTest, APreviewSaysThatSubmissionIsDisabled) {
-  outputOf({"init", "--demo"});
-  outputOf({"prefs", "remove", "nuvex.diagwell", "SubmissionEnabled"});
-  const ProgramResult result = run({"report", "preview"});
-  EXPECT_EQ(result.status, 0);
-  EXPECT_EQ(result.out.find("<?xml"), 0U);
-  EXPECT_NE(result.err.find("submission is disabled"), std::string::npos) << result.err;
 }
 
 TEST_F(QuorletctlTest, APreviewsMessagesStayOutOfTheDocument) {
@@ -445,11 +297,9 @@ TEST_F(QuorletctlTest, APreviewsMessagesStayOutOfTheDocument) {
   const ProgramResult result = run({"report", "preview", "--day", "100", "--json"});
   EXPECT_EQ(result.status, 0);
   EXPECT_EQ(Json::parse(result.out)["TLScalars"], Json::parse(R"({"good": 7})"));
-  EXPECT_EQ(Json::parse(result.out)["TLStartDate"], "1970-04-11T00:00:00Z");
   // One for each entry that was skipped, and the note on submission.
   EXPECT_EQ(std::ranges::count(result.err, '\n'), 3) << result.err;
   EXPECT_NE(result.err.find("bad\\nkey"), std::string::npos) << result.err;
-  expectFailure({"report", "preview", "--day", "101"}, 1, "nothing to report for day 101");
 }
 
 TEST_F(QuorletctlTest, LogsAreListedByAgeAndFoundByName) {
@@ -466,15 +316,9 @@ TEST_F(QuorletctlTest, LogsAreListedByAgeAndFoundByName) {
   std::vector<std::string> names;
   for (const Json& log : Json::parse(outputOf({"logs", "list", "--json"}))) {
     names.push_back(log["directory"].get<std::string>() + "/" + log["name"].get<std::string>());
-    EXPECT_EQ(log["type"], "193");
   }
   EXPECT_EQ(names, (std::vector<std::string>{"outbox/a.log", "pending/b.log", "outbox/c.log"}));
-  const std::string text = outputOf({"logs", "list"});
-  EXPECT_LT(text.find("pending  2026-03-02T00:00:00Z"), text.find("c.log"));
-
   EXPECT_EQ(outputOf({"logs", "show", "latest"}), device.read(std::string(kOutbox) + "c.log"));
-  EXPECT_EQ(outputOf({"logs", "show", device.path(kOutbox) + "a.log"}),
-            header("2026-03-01T00:00:00Z") + "oldest");
   const Json shown = Json::parse(outputOf({"logs", "show", "b.log", "--json"}));
   EXPECT_EQ(shown["header"]["created"], "2026-03-02T00:00:00Z");
   EXPECT_EQ(shown["body"], Json::parse(R"({"d": "2026-01-01T00:00:00Z"})"));
@@ -483,16 +327,8 @@ TEST_F(QuorletctlTest, LogsAreListedByAgeAndFoundByName) {
 
 TEST_F(QuorletctlTest, WhitelistCheckShowsWhatWorksAndWhatDoesNot) {
   outputOf({"init", "--demo"});
-  outputOf({"prefs", "set", "nuvex.da", "Network", "false"});
-  const std::string good = outputOf({"whitelist", "check"});
-  for (const char* line :
-       {"Applications: 4 scalar keys, 1 distribution key\n",
-        "  scalar key  nuvex.demo.launches  bucket_interval=100\n",
-        "  distribution prefix  nuvex.demo.battery.  intervals=[20,40,60,80]\n",
-        "Network (switched off on this device): ", "InternalTesting (switched off"}) {
-    EXPECT_NE(good.find(line), std::string::npos) << line << "not in\n" << good;
-  }
-
+  EXPECT_NE(outputOf({"whitelist", "check"}).find("InternalTesting (switched off"),
+            std::string::npos);
   const Dictionary damaged{
       {"Bad", Dictionary{{"ScalarKeys", Dictionary{{"minus", Dictionary{{"sig_fig", Int64(-1)}}},
                                                    {"text\x1b", "x"},
@@ -512,7 +348,6 @@ TEST_F(QuorletctlTest, WhitelistCheckShowsWhatWorksAndWhatDoesNot) {
   }
   std::ranges::sort(keys);
   EXPECT_EQ(keys, (std::vector<std::string>{"", "ScalarKey", "minus", "odd", "text\xef\xbf\xbd"}));
-  EXPECT_TRUE(json["groups"][0]["ScalarKeys"].contains("works"));
 }
 
 }  // namespace
