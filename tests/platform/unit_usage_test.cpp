@@ -6,103 +6,104 @@
 #include <sys/socket.h>
 #include <sys/un.h>
 
-#include <functional>
-#include <thread>
+#include <future>
 
 #include "fakes/temp_root.h"
-#include "platform/linux/bus_message.h"
 #include "platform/linux/descriptor.h"
 #include "platform/linux/network_links.h"
 
 namespace quorlet {
 namespace {
 
-// A number aligned to its size, little-endian.
-void Put(std::string& bytes, std::uint64_t value, std::size_t size) {
-  bytes.resize((bytes.size() + size - 1) / size * size);
-  for (std::size_t i = 0; i < size; ++i) bytes += static_cast<char>(value >> (8 * i));
+using namespace std::string_literals;
+
+// A unit of 94 bytes in the manager's list; `name` has three letters.
+std::string Unit(const std::string& name) {
+  return "\13\0\0\0"s + name + ".service\0\0\0\0\0\0\0\0\0\6\0\0\0loaded\0\0\6\0\0\0active\0\0"s +
+         std::string(16, '\0') + "\4\0\0\0/"s + name + std::string(16, '\0') + "\1\0\0\0/\0"s;
 }
 
-std::string Message(char type, std::uint32_t serial, const std::string& signature,
-                    const std::string& body) {
-  std::string bytes = {'l', type, 0, 1};
-  for (const std::size_t n : {body.size(), std::size_t{77}, 13 + signature.size()})
-    Put(bytes, n, 4);
-  Put(bytes.append("\5\1u", 4), serial, 4);
-  bytes += "\10\1g" + std::string(1, '\0') + static_cast<char>(signature.size()) + signature;
-  bytes.resize((bytes.size() + 8) / 8 * 8);
-  return bytes + body;
+// The reply to call 1, the unit list.
+std::string List(const std::string& body) {
+  return "l\2\0\1"s + static_cast<char>(body.size()) + "\0\0\0M\0\0\0C\0\0\0\5\1u\0\1\0\0\0"s +
+         "\7\1s\0\30\0\0\0org.freedesktop.systemd1\0\0\0\0\0\0\0\0"s +
+         "\10\1g\0\15a(ssssssouso)\0\0\0\0\0\0"s + body;
 }
 
-// The reply of a manager with one counted service among many.
-std::string Answer(const std::string& call) {
-  const auto asks = [&](std::string_view what) { return call.find(what) != call.npos; };
-  const auto serial = BusReader(std::string_view(call).substr(8)).number<std::uint32_t>();
-  if (asks("/gone")) return Message(3, serial, "v", "error");
-  std::string body("\1t\0", 3);
-  if (!asks("ListUnits")) {
-    Put(body, asks("/off") ? ~0ULL : asks("IPIngress") ? 5000 : asks("IPE") ? ~1ULL : 3999999, 8);
-    return Message(2, serial, "v", body);
-  }
-  std::string list(8, '\0');  // its length comes last
-  for (int i = 0; i < 200; ++i) {
-    const std::string name = i == 0 ? "web" : i == 1 ? "gone" : "off";
-    Put(list, 0, 8), list.resize(list.size() - 8);
-    for (const auto& text : {name + ".service", name, name, name, name, name, "/" + name, name}) {
-      Put(list, text.size(), 4), list += text + '\0';
-      if (text[0] == '/') Put(list, 0, 4);
-    }
-    Put(list, 0, 4), list += '\0';
-  }
-  std::string length;
-  Put(length, list.size() - 8, 4);
-  return Message(2, serial, "a(ssssssouso)", list.replace(0, 4, length));
+// The reply to a later call, a variant with eight bytes of a number.
+std::string Number(char serial, const std::string& bytes) {
+  return "l\2\0\1\20\0\0\0M\0\0\0\17\0\0\0\5\1u\0"s + serial +
+         "\0\0\0\10\1g\0\1v\0\0\1t\0\0\0\0\0\0"s + bytes;
 }
-
-using Distortion = std::function<std::string(std::string reply)>;
 
 class UnitUsage : public testing::Test {
  protected:
-  void has(const std::string& name, const std::string& event, const std::string& received) {
+  void has(const std::string& name, const std::string& type, const std::string& received,
+           const std::string& event) {
     const std::string directory = "/sys/class/net/" + name + "/";
-    root.write(directory + "uevent", "DEVTYPE=" + event + "\n");
-    root.write(directory + "type", "1\n");
-    root.write(directory + "device/x", "");
+    root.write(directory + "type", type + "\n");
+    root.write(directory + "uevent", event + "\nINTERFACE=" + name + "\n");
     root.write(directory + "statistics/rx_bytes", received + "\n");
     root.write(directory + "statistics/tx_bytes", "0\n");
   }
-  // What comes of a manager whose replies are distorted.
-  std::optional<Array> usage(int milliseconds, const Distortion& distort) {
-    root.write("/run/systemd/x", "");
+  // What comes of a manager that says `replies`.
+  std::optional<Array> usage(const std::string& replies) {
+    std::filesystem::create_directories(root.path("/run/systemd"));
+    std::filesystem::remove(root.path("/run/systemd/private"));
     sockaddr_un address = {.sun_family = AF_UNIX, .sun_path = {}};
     root.path("/run/systemd/private").copy(address.sun_path, sizeof address.sun_path - 1);
-    std::filesystem::remove(address.sun_path);
     const Descriptor listener(socket(AF_UNIX, SOCK_STREAM, 0));
     const auto* any = reinterpret_cast<const sockaddr*>(&address);
-    if (bind(listener.get(), any, sizeof address) != 0 || listen(listener.get(), 5) != 0) return {};
-    std::thread manager([&] {
-      const Descriptor peer(accept(listener.get(), nullptr, nullptr));
-      std::string received, replies = "OK 0123\r\n";
-      char chunk[65536];
-      for (ssize_t count; (count = recv(peer.get(), chunk, sizeof chunk, 0)) > 0; replies = "") {
-        received.append(chunk, static_cast<std::size_t>(count));
-        if (!replies.empty()) received.clear();  // the greeting
-        int open = 0;
-        for (std::size_t size; received.size() >= kBusHeaderBytes; received.erase(0, size)) {
-          if ((size = BusMessageLength(received, 1 << 20).value()) > received.size()) break;
-          EXPECT_LE(++open, 64) << "a bus allows 128 open calls";
-          replies += distort(Answer(received.substr(0, size)));
-        }
-        (void)!send(peer.get(), replies.data(), replies.size(), MSG_NOSIGNAL);
-      }
+    EXPECT_TRUE(bind(listener.get(), any, sizeof address) == 0 && listen(listener.get(), 1) == 0);
+    Descriptor peer;
+    const auto manager = std::async(std::launch::async, [&] {
+      peer = Descriptor(accept(listener.get(), nullptr, nullptr));
+      (void)!send(peer.get(), replies.data(), replies.size(), MSG_NOSIGNAL);
     });
-    auto records = ReadUnitUsage(root.root(), std::chrono::milliseconds(milliseconds));
-    shutdown(listener.get(), SHUT_RDWR);
-    manager.join();
-    return records;
+    return ReadUnitUsage(root.root(), std::chrono::seconds(2));
   }
 
   TempRoot root;
 };
+
+TEST_F(UnitUsage, TrafficHasAKindWhereEveryUsedInterfaceHasIt) {
+  const std::tuple<const char*, const char*, const char*, std::string, std::optional<LinkKind>>
+      steps[] = {
+          {"docker0", "1", "5", "DEVTYPE=bridge", std::nullopt},
+          {"rmnet0", "519", "7", "", LinkKind::kCellular},
+          {"wlan0", "1", "1", "DEVTYPE=wlan", std::nullopt},
+          {"rmnet0", "519", "0", "", LinkKind::kWifi},
+          {"ppp0", "512", "unreadable", "DEVTYPE=ppp", std::nullopt},
+          {"ppp0", "512", "0", "DEVTYPE=ppp", LinkKind::kWifi},
+      };
+  for (const auto& [name, type, received, event, kind] : steps) {
+    has(name, type, received, event);
+    EXPECT_EQ(SoleLinkKind(root.root()), kind) << name << " " << received;
+  }
+}
+
+TEST_F(UnitUsage, CountedServicesBecomeRecordsAndABadManagerGivesNone) {
+  has("wlan0", "1", "9", "DEVTYPE=wlan");
+  const std::string body = "\276\0\0\0\0\0\0\0"s + Unit("web") + "\0\0"s + Unit("off");
+  const std::string rest = Number(2, "\210\23\0\0\0\0\0\0"s) + Number(3, std::string(8, '\377')) +
+                           Number(4, "\376" + std::string(7, '\377')) +
+                           Number(5, "\377\10\75\0\0\0\0\0"s);  // 3.99... seconds
+  EXPECT_EQ(usage("OK 1\r\n" + List(body) + rest),
+            (Array{Dictionary{{"procName", "web"},
+                              {"since", Date{3}},
+                              {"wifiInBytes", Int64(5000)},
+                              {"wifiOutBytes", Int64(INT64_MAX)},
+                              {"wwanInBytes", Int64(0)},
+                              {"wwanOutBytes", Int64(0)}}}));
+  for (std::size_t length = 1; length < body.size(); ++length) {
+    EXPECT_EQ(usage("OK 1\r\n" + List(body.substr(0, length)) + rest), std::nullopt);
+  }
+  for (const auto& [position, byte] : std::map<std::size_t, char>{
+           {0, 'B'}, {3, 2}, {7, 1}, {15, -1}, {17, 2}, {18, 'x'}, {20, 99}}) {
+    const std::string damaged = List(body).replace(position, 1, 1, byte);
+    EXPECT_EQ(usage("OK 1\r\n" + damaged + rest), std::nullopt) << position;
+  }
+}
+
 }  // namespace
 }  // namespace quorlet

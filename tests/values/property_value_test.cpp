@@ -33,23 +33,6 @@ TEST(Number, ComparesByExactValueAcrossKinds) {
   }
 }
 
-TEST(Number, ConversionsTruncateAndSaturate) {
-  const std::tuple<PropertyValue, std::int64_t, std::uint64_t> cases[] = {
-      {Int8(-5), -5, 0},
-      {UInt64(kUMax), kMax, kUMax},
-      {Double(-2.9), -2, 0},
-      {Double(std::ldexp(1, 63)), kMax, std::uint64_t{1} << 63},
-      {Double(-std::ldexp(1, 63)), kMin, 0},
-      {Double(std::ldexp(1, 64)), kMax, kUMax},
-      {Double(kInfinity), kMax, kUMax},
-      {Double(NAN), 0, 0},
-  };
-  for (const auto& [value, asSigned, asUnsigned] : cases) {
-    EXPECT_EQ(value.asNumber()->toInt64(), asSigned) << value.description();
-    EXPECT_EQ(value.asNumber()->toUInt64(), asUnsigned) << value.description();
-  }
-}
-
 TEST(Containers, HandlesShareAndCopiesDoNot) {
   Dictionary inner{{"n", Int32(1)}};
   Array list{inner, "text"};
