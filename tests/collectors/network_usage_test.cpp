@@ -40,8 +40,7 @@ struct NetworkUsageTest : testing::Test {
     device.counterStore.scalars.clear();
     collectDataUsage(device.services);
     Counters added;
-    for (const auto& [row, value] : device.counterStore.scalars)
-      added[row.first.substr(10)] = value;
+    for (auto& [row, value] : device.counterStore.scalars) added[row.first.substr(10)] = value;
     return added;
   }
   void hasBaseline(const PropertyValue& value) {

@@ -2,8 +2,6 @@
 
 #include <gtest/gtest.h>
 
-#include <new>
-
 #include "fakes/fake_platform.h"
 
 namespace quorlet {
@@ -11,7 +9,6 @@ namespace {
 
 constexpr char kEvents[] = "kern.next_ecc_event";
 
-// Nothing but disk usage goes well.
 // Every byte of register i is 0xF0 + i.
 std::string Event(int count, std::size_t size = 72) {
   std::string bytes = {'\xFF', static_cast<char>(count), 7, 7, 7, 7, 7, 7};
