@@ -18,6 +18,8 @@ constexpr std::string_view kTaskingID = "TaskingID";
 constexpr std::string_view kTaskingOS = "TaskingOS";
 constexpr std::string_view kTaskingDigest = "TaskingDigest";
 constexpr std::string_view kTaskingPayload = "TaskingPayload";
+// What is being applied, with the keys above; there only while the other domains are being written.
+constexpr std::string_view kTaskingInProgress = "TaskingInProgress";
 
 std::optional<std::string> Text(const PropertyValue* value) {
   const std::string* text = value != nullptr ? value->asString() : nullptr;
@@ -26,10 +28,6 @@ std::optional<std::string> Text(const PropertyValue* value) {
 
 std::optional<PropertyValue> Optional(const PropertyValue* value) {
   return value != nullptr ? std::optional(*value) : std::nullopt;
-}
-
-std::optional<PropertyValue> Optional(const std::optional<std::string>& text) {
-  return text ? std::optional<PropertyValue>(*text) : std::nullopt;
 }
 
 // The low 32 bits, as the field is read.
@@ -46,17 +44,14 @@ class TaskingUpdate {
       build_ = Text(version->find("ProductBuildVersion"));
     }
     noteOSChange();
+    finishInterrupted();
     const auto scheduled =
         platform_.preferences.DGWPreferencesGetValue("ScheduledTasking", "nuvex.Ferryman");
     const Dictionary* tasking = scheduled ? scheduled->asDictionary() : nullptr;
     if (tasking == nullptr) return;
     const auto newID = Text(tasking->find(kTaskingID));
     if (!newID) return;
-    if (!isApplied(*newID)) {
-      apply(*tasking, *newID);
-      synchronize();
-      platform_.notifications.PostNotification("nuvex.da.tasking_changed");
-    }
+    if (!isApplied(*newID)) replaceApplied(recordOf(*tasking, *newID));
     submitAggressively();
   }
 
@@ -68,9 +63,8 @@ class TaskingUpdate {
     const auto value = own(key);
     return Text(value ? &*value : nullptr);
   }
-  void set(std::string_view key, std::optional<PropertyValue> value, std::string_view domain) {
-    platform_.preferences.DGWPreferencesSetValue(key, std::move(value), domain);
-    touched_.emplace(domain);
+  void set(std::string_view key, std::optional<PropertyValue> value) {
+    platform_.preferences.DGWPreferencesSetValue(key, std::move(value), kOwnDomain);
   }
 
   void noteOSChange() {
@@ -82,11 +76,10 @@ class TaskingUpdate {
     platform_.log.log("OS change since last run (%{public}@ -> %{public}@)", version, *build_);
     lastOS_ = Dictionary{{"version", *build_}, {"day", Int32(today_)}};
     // Written out with the rest of the domain, by this update or by the gate after the pass.
-    platform_.preferences.DGWPreferencesSetValue(kLastOSUpdate, PropertyValue(lastOS_), kOwnDomain);
+    set(kLastOSUpdate, PropertyValue(lastOS_));
   }
 
-  // Whether the tasking `newID` is in force under this OS build; otherwise what was applied before
-  // is removed.
+  // Whether the tasking `newID` is in force under this OS build.
   bool isApplied(const std::string& newID) {
     const auto currentID = ownText(kTaskingID);
     if (!currentID) return false;
@@ -94,31 +87,77 @@ class TaskingUpdate {
     if (currentID == newID && currentOS && currentOS == build_) return true;
     platform_.log.log("Tasking update (%{public}@ -> %{public}@, %{public}@ -> %{public}@)",
                       *currentID, newID, currentOS, build_);
-    removeApplied();
     return false;
   }
 
-  void removeApplied() {
-    const auto stored = own(kTaskingPayload);
-    const Array* payload = stored ? stored->asArray() : nullptr;
-    if (payload == nullptr) return;
-    forEachEntry(*payload, [this](const std::string& domain, const std::string& key,
-                                  const PropertyValue*) { set(key, std::nullopt, domain); });
-    for (const auto key : {kTaskingID, kTaskingDigest, kTaskingPayload}) {
-      set(key, std::nullopt, kOwnDomain);
+  // What is to be known of a tasking once it is applied; no payload where it has none.
+  Dictionary recordOf(const Dictionary& tasking, const std::string& newID) const {
+    Dictionary record{{kTaskingID, newID}};
+    if (build_) record[kTaskingOS] = *build_;
+    if (const PropertyValue* digest = tasking.find(kTaskingDigest)) {
+      record[kTaskingDigest] = *digest;
+    }
+    if (const Array* payload = ArrayEntry(tasking, kTaskingPayload)) {
+      record[kTaskingPayload] = *payload;
+    }
+    return record;
+  }
+
+  // A run that was cut short left domains half written, perhaps for a tasking that is no longer
+  // scheduled: brings it to its end first.
+  void finishInterrupted() {
+    const auto stored = own(kTaskingInProgress);
+    if (!stored) return;
+    const Dictionary* record = stored->asDictionary();
+    if (record != nullptr && Text(record->find(kTaskingID))) {
+      replaceApplied(*record);
+    } else {
+      set(kTaskingInProgress, std::nullopt);
     }
   }
 
-  void apply(const Dictionary& tasking, const std::string& newID) {
-    const Array* payload = ArrayEntry(tasking, kTaskingPayload);
-    if (payload == nullptr) return;
-    forEachEntry(*payload,
-                 [this](const std::string& domain, const std::string& key,
-                        const PropertyValue* value) { set(key, Optional(value), domain); });
-    set(kTaskingID, PropertyValue(newID), kOwnDomain);
-    set(kTaskingOS, Optional(build_), kOwnDomain);
-    set(kTaskingDigest, Optional(tasking.find(kTaskingDigest)), kOwnDomain);
-    set(kTaskingPayload, PropertyValue(*payload), kOwnDomain);
+  // Removes the applied tasking, writes the one that `record` tells of, and announces it.
+  void replaceApplied(const Dictionary& record) {
+    // What was applied is known by its identifier: without one, there is nothing to remove.
+    const auto stored = ownText(kTaskingID) ? own(kTaskingPayload) : std::nullopt;
+    const Array* old = stored ? stored->asArray() : nullptr;
+    const Array* payload = ArrayEntry(record, kTaskingPayload);
+    if (old != nullptr || payload != nullptr) {
+      set(kTaskingInProgress, PropertyValue(record));
+      platform_.preferences.DGWPreferencesSynchronize(kOwnDomain);
+      const bool isWritten = writeDomains(old, payload);
+      // While this is not durable, the next run does the same again.
+      const Dictionary& known = payload != nullptr ? record : Dictionary();
+      for (const auto key : {kTaskingID, kTaskingDigest, kTaskingPayload}) {
+        set(key, Optional(known.find(key)));
+      }
+      if (payload != nullptr) set(kTaskingOS, Optional(record.find(kTaskingOS)));
+      if (isWritten) set(kTaskingInProgress, std::nullopt);
+      platform_.preferences.DGWPreferencesSynchronize(kOwnDomain);
+    }
+    platform_.notifications.PostNotification("nuvex.da.tasking_changed");
+  }
+
+  // Writes the values themselves and makes them durable; false when that failed for some.
+  bool writeDomains(const Array* old, const Array* payload) {
+    std::set<std::string> touched;
+    const auto set = [&](const std::string& domain, const std::string& key,
+                         const PropertyValue* value) {
+      platform_.preferences.DGWPreferencesSetValue(key, Optional(value), domain);
+      touched.insert(domain);
+    };
+    if (old != nullptr) {
+      forEachEntry(*old, [&](const std::string& domain, const std::string& key,
+                             const PropertyValue*) { set(domain, key, nullptr); });
+    }
+    if (payload != nullptr) forEachEntry(*payload, set);
+    bool allWritten = true;
+    for (const std::string& domain : touched) {
+      // Our own one follows with the record, which must not be durable before the others.
+      if (domain == kOwnDomain) continue;
+      allWritten = platform_.preferences.DGWPreferencesSynchronize(domain) && allWritten;
+    }
+    return allWritten;
   }
 
   template <typename Use>
@@ -130,16 +169,6 @@ class TaskingUpdate {
       const std::string* key = StringEntry(*entry, "Key");
       if (domain != nullptr && key != nullptr) use(*domain, *key, entry->find("Value"));
     }
-  }
-
-  // Our own record goes last: while it still tells of the old tasking, a run that was cut short is
-  // made good by the next one with the same schedule.
-  void synchronize() {
-    const bool ownTouched = touched_.erase(std::string(kOwnDomain)) != 0;
-    for (const std::string& domain : touched_) {
-      platform_.preferences.DGWPreferencesSynchronize(domain);
-    }
-    if (ownTouched) platform_.preferences.DGWPreferencesSynchronize(kOwnDomain);
   }
 
   void submitAggressively() {
@@ -165,7 +194,6 @@ class TaskingUpdate {
   std::int32_t today_ = 0;
   std::optional<std::string> build_;
   Dictionary lastOS_;
-  std::set<std::string> touched_;
 };
 
 }  // namespace

@@ -26,9 +26,10 @@ class Preferences {
   virtual void DGWPreferencesSetValue(std::string_view key, std::optional<PropertyValue> value,
                                       std::string_view domain) = 0;
 
-  // Makes every pending change of the domain durable. A failure leaves one error line and keeps
-  // the changes pending.
-  virtual void DGWPreferencesSynchronize(std::string_view domain) = 0;
+  // Makes every pending change of the domain durable. False when that failed but may go well
+  // another time (a full disk, say): one error line says so, and the changes stay pending. What is
+  // refused for good, such as a value that no file can hold, does not count as a failure.
+  virtual bool DGWPreferencesSynchronize(std::string_view domain) = 0;
 
   // The value when it is a boolean, otherwise false; `found` says whether it is one.
   bool DGWPreferencesGetBoolValue(std::string_view key, std::string_view domain, bool& found);

@@ -2,6 +2,7 @@
 
 #include <gtest/gtest.h>
 
+#include <stdexcept>
 #include <tuple>
 
 #include "fakes/fake_platform.h"
@@ -16,9 +17,10 @@ PropertyValue Entry(const char* domain, const char* key, PropertyValue value) {
 }
 
 // The device runs build A1 on day 20000 and has noted that before.
-struct TaskingTest : testing::Test {
-  TaskingTest() {
+struct TaskedDevice {
+  TaskedDevice() {
     store(kOwn, "LastOSUpdate", Dictionary{{"version", "A1"}, {"day", Int32(20000)}});
+    device.preferences.DGWPreferencesSynchronize(kOwn);
   }
   void store(const char* domain, const char* key, std::optional<PropertyValue> value) {
     device.preferences.DGWPreferencesSetValue(key, std::move(value), domain);
@@ -31,6 +33,7 @@ struct TaskingTest : testing::Test {
     Dictionary tasking{{"TaskingID", id}, {"TaskingDigest", Int64(9)}};
     if (payload) tasking["TaskingPayload"] = *payload;
     store("nuvex.Ferryman", "ScheduledTasking", tasking);
+    device.preferences.DGWPreferencesSynchronize("nuvex.Ferryman");
   }
   // Runs an update; returns what it said, and whether it announced a change.
   std::vector<std::string> update() {
@@ -44,6 +47,7 @@ struct TaskingTest : testing::Test {
 
   FakePlatform device;
 };
+struct TaskingTest : testing::Test, TaskedDevice {};
 
 using Texts = std::vector<std::string>;
 const char kPosted[] = "posted nuvex.da.tasking_changed";
@@ -82,10 +86,51 @@ TEST_F(TaskingTest, WithoutABuildATaskingNeverMatches) {
   EXPECT_EQ(update(), (Texts{"Tasking update (one -> one, (null) -> (null))", kPosted}));
 }
 
-TEST_F(TaskingTest, OurOwnRecordIsWrittenLast) {
-  schedule("one", Array{Entry("zz", "a", "1"), Entry(kOwn, "k", "1"), Entry("aa", "a", "1")});
+// What is durable after tasking "one", a run with tasking "two" that dies before its n-th change,
+// and a run with tasking "three".
+FakePreferences::Disk AfterDeathBefore(int n, bool& died) {
+  TaskedDevice tasked;
+  tasked.schedule("one", Array{Entry("x", "a", "1"), Entry("y", "b", "1"), Entry(kOwn, "o", "1")});
+  tasked.update();
+  tasked.schedule("two", Array{Entry("x", "c", "2"), Entry("aa", "a", "2"), Entry("y", "b", "2")});
+  FakePreferences& preferences = tasked.device.preferences;
+  preferences.beforeChange = [&n] {
+    if (n-- == 0) throw std::runtime_error("killed");
+  };
+  died = false;
+  try {
+    tasked.update();
+  } catch (const std::runtime_error&) {
+    died = true;
+  }
+  preferences.beforeChange = nullptr;
+  preferences.crash();
+  tasked.schedule("three", Array{Entry("z", "d", "3")});
+  tasked.update();
+  preferences.crash();
+  auto disk = preferences.disk();
+  std::erase_if(disk, [](const auto& domain) { return domain.second.empty(); });
+  return disk;
+}
+
+TEST_F(TaskingTest, ARunThatDiedIsBroughtToItsEndByTheNext) {
+  bool died = true;
+  const auto three = AfterDeathBefore(-1, died);
+  for (int n = 0; died || n == 0; ++n) {
+    EXPECT_EQ(AfterDeathBefore(n, died), three) << "killed before change " << n;
+    ASSERT_LT(n, 100);
+  }
+}
+
+TEST_F(TaskingTest, ADomainThatCouldNotBeWrittenIsWrittenByTheNextRun) {
+  device.preferences.full.insert("x");
+  schedule("one", Array{Entry("x", "a", "1"), Entry("y", "b", "1")});
   update();
-  EXPECT_EQ(device.preferences.synchronized, (Texts{"aa", "zz", kOwn}));
+  device.preferences.crash();
+  device.preferences.full.clear();
+  update();
+  EXPECT_TRUE(stored("x", "a") == "1" && device.preferences.isDurable("a", "x"));
+  EXPECT_EQ(update(), Texts{});
 }
 
 TEST_F(TaskingTest, WrongShapesCountAsAbsent) {

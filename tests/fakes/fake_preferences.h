@@ -2,6 +2,7 @@
 #ifndef QUORLET_TESTS_FAKES_FAKE_PREFERENCES_H_
 #define QUORLET_TESTS_FAKES_FAKE_PREFERENCES_H_
 
+#include <functional>
 #include <map>
 #include <memory>
 #include <optional>
@@ -40,23 +41,33 @@ class FakePreferences : public Preferences {
 
   void DGWPreferencesSetValue(std::string_view key, std::optional<PropertyValue> value,
                               std::string_view domain) override {
+    if (beforeChange) beforeChange();
     if (isRefused(domain)) return;
     if (value) value = value->deepCopy();
     pending_[std::string(domain)].insert_or_assign(std::string(key), std::move(value));
   }
 
-  void DGWPreferencesSynchronize(std::string_view domain) override {
-    if (isRefused(domain)) return;
+  bool DGWPreferencesSynchronize(std::string_view domain) override {
+    if (beforeChange) beforeChange();
+    if (isRefused(domain)) return true;
     synchronized.emplace_back(domain);
+    if (full.contains(domain)) return false;
     flush(domain);
+    return true;
   }
+
+  // The process dies: what is not durable is gone.
+  void crash() { pending_.clear(); }
+  const Disk& disk() const { return *disk_; }
 
   // Whether the key reads the same after a crash as it does now.
   bool isDurable(std::string_view key, std::string_view domain) {
     return DGWPreferencesGetValue(key, domain) == durable(key, domain);
   }
 
-  std::vector<std::string> synchronized;  // every domain, in order
+  std::vector<std::string> synchronized;    // every domain, in order
+  std::function<void()> beforeChange;       // may throw: the change is not made
+  std::set<std::string, std::less<>> full;  // domains that cannot be written just now
 
  private:
   using Changes = std::map<std::string, std::optional<PropertyValue>, std::less<>>;

@@ -5,81 +5,18 @@
 #include <unistd.h>
 
 #include <csignal>
-#include <ctime>
 #include <filesystem>
 #include <string>
-#include <variant>
 #include <vector>
 
-#include "fakes/temp_root.h"
-#include "fakes/whitelist.h"
-#include "program/run_program.h"
-#include "values/property_list.h"
+#include "program/program_device.h"
 
 namespace quorlet {
 namespace {
 
 namespace fs = std::filesystem;
 
-constexpr char kPending[] = "/var/mobile/Library/Logs/Diagwell/pending";
-constexpr char kWhitelist[] = "/Library/Application Support/TallyLedger/Whitelist_Zed.plist";
-
-class DailyPassTest : public testing::Test {
- protected:
-  DailyPassTest() {
-    device.write(kWhitelist,
-                 Plist("<dict>" + Group("G", "ScalarKeyPrefixes", {{"s", "", ""}}) +
-                       Group("H", "DistributionKeyPrefixes", {{"d", "", ""}}) + "</dict>"));
-    ctl({"prefs", "set", "nuvex.diagwell", "SubmissionEnabled", "true"});
-    ctl({"tally", "set", "s", "7", "--day", yesterday()});
-    ctl({"tally", "record", "d", "1", "2", "--day", yesterday()});
-  }
-  static std::string yesterday() { return std::to_string(std::time(nullptr) / 86400 - 1); }
-  ProgramSetting setting() const { return {{{"QUORLET_ROOT", device.directory()}}, {}}; }
-  void ctl(std::vector<std::string> words) const {
-    const auto result = RunProgram(QUORLETCTL_PROGRAM, std::move(words), setting());
-    EXPECT_EQ(result.status, 0) << result.err;
-  }
-  // Runs quorlet, which must end with 0 and say nothing itself.
-  void quorlet(std::vector<std::string> words) const {
-    const auto result = RunProgram(QUORLET_PROGRAM, std::move(words), setting());
-    EXPECT_EQ(result.status, 0);
-    EXPECT_EQ(result.out + result.err, "");
-  }
-  // The names of the logs, hidden files included.
-  std::vector<std::string> logs() const { return device.list(kPending); }
-  // The texts of the system log's lines of one level.
-  std::vector<std::string> lines(const std::string& level) const {
-    std::vector<std::string> texts;
-    std::istringstream log(device.read("/var/log/quorlet.log"));
-    for (std::string line; std::getline(log, line);) {
-      const std::size_t at = line.find(' ');
-      if (at == std::string::npos || line.compare(at + 1, level.size(), level) != 0) continue;
-      texts.push_back(line.substr(line.find(": ") + 2));
-    }
-    return texts;
-  }
-  // The document of a log, which must be whole.
-  PropertyValue document(const std::string& name) const {
-    const std::string bytes = device.read(std::string(kPending) + "/" + name);
-    const auto parsed = ReadPropertyList(std::string_view(bytes).substr(bytes.find('\n') + 1));
-    EXPECT_TRUE(std::holds_alternative<PropertyValue>(parsed)) << name;
-    const auto* value = std::get_if<PropertyValue>(&parsed);
-    return value != nullptr ? *value : PropertyValue("broken");
-  }
-  // Starts quorlet without waiting for it.
-  pid_t start(const char* argument) const {
-    const pid_t child = fork();
-    if (child == 0) {
-      setenv("QUORLET_ROOT", device.directory().c_str(), 1);
-      execl(QUORLET_PROGRAM, "quorlet", argument, nullptr);
-      _exit(127);
-    }
-    return child;
-  }
-
-  TempRoot device;
-};
+class DailyPassTest : public testing::Test, public ProgramDevice {};
 
 using Lines = std::vector<std::string>;
 
@@ -129,8 +66,8 @@ TEST_F(DailyPassTest, APassKilledAtAnyMomentLeavesWholeFiles) {
   EXPECT_EQ(lines("error"), Lines{});
   ASSERT_FALSE(logs().empty());
   EXPECT_FALSE(logs().front().starts_with(".")) << "the last pass tidied up: " << logs().front();
-  const PropertyValue log = document(logs().back());
-  EXPECT_EQ(*log.asDictionary()->find("TLScalars")->asDictionary()->find("s"), Int64(7));
+  const Dictionary log = document(logs().back());
+  EXPECT_EQ(*log.find("TLScalars")->asDictionary()->find("s"), Int64(7));
   const auto dump =
       RunProgram(QUORLETCTL_PROGRAM, {"tally", "dump", "--day", yesterday()}, setting());
   EXPECT_NE(dump.out.find("scalar\t" + yesterday() + "\ts\t7\n"), std::string::npos) << dump.out;

@@ -140,9 +140,10 @@ class LinuxPreferences : public Preferences {
     found->pending.insert_or_assign(StorableKey(key), std::move(value));
   }
 
-  void DGWPreferencesSynchronize(std::string_view domain) override {
+  bool DGWPreferencesSynchronize(std::string_view domain) override {
     const std::lock_guard lock(mutex_);
-    if (Domain* found = findDomain(domain)) synchronize(domain, *found);
+    Domain* found = findDomain(domain);
+    return found == nullptr || synchronize(domain, *found);
   }
 
  private:
@@ -198,15 +199,16 @@ class LinuxPreferences : public Preferences {
                std::get<std::string>(read));
   }
 
-  void synchronize(std::string_view name, Domain& domain) {
-    if (access_ == Access::kReadOnly) return;
-    if (isSettled(name, domain)) return;  // nothing to write: no lock file either
+  // As DGWPreferencesSynchronize.
+  bool synchronize(std::string_view name, Domain& domain) {
+    if (access_ == Access::kReadOnly) return true;
+    if (isSettled(name, domain)) return true;  // nothing to write: no lock file either
     const FileLock lock(directory_ + "/." + std::string(name) + ".lock");
     if (lock.error() != 0) {
       log_.error("Cannot lock the preferences %@: %@", path(name), ErrnoText(lock.error()));
-      return;
+      return false;
     }
-    if (!isSettled(name, domain)) writeMerged(name, domain);
+    return isSettled(name, domain) || writeMerged(name, domain);
   }
 
   // Drops the pending changes when the file already holds them all.
@@ -251,24 +253,25 @@ class LinuxPreferences : public Preferences {
   }
 
   // Replaces the file by what it holds with the pending changes merged in. With the lock held.
-  void writeMerged(std::string_view name, Domain& domain) {
+  bool writeMerged(std::string_view name, Domain& domain) {
     Changes refused;
     auto document = Document(merge(domain, refused));
     if (std::holds_alternative<PropertyListError>(document)) {
       refused = findUnwritable(name, domain);
-      if (refused.size() == domain.pending.size()) return;
+      if (refused.size() == domain.pending.size()) return true;
       if (!refused.empty()) document = Document(merge(domain, refused));
     }
     if (const auto* error = std::get_if<PropertyListError>(&document)) {
       log_.error("Cannot write the preferences %@: %@", path(name), error->description);
-      return;
+      return true;
     }
     if (const int error = replaceFile(name, domain.damaged, std::get<std::string>(document))) {
       log_.error("Cannot write the preferences %@: %@", path(name), ErrnoText(error));
-      return;
+      return false;
     }
     domain.pending = std::move(refused);
     domain.version.reset();  // values read back as the file holds them
+    return true;
   }
 
   int replaceFile(std::string_view name, bool keepDamaged, const std::string& document) {
