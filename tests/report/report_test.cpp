@@ -220,6 +220,16 @@ TEST_F(ReportTest, TheLogHoldsWhatTheWhitelistAllows) {
   EXPECT_EQ(device.diagnostics.logs[0].name, "log-aggregated");
 }
 
+TEST_F(ReportTest, AppInfoThatCannotBeWrittenIsLeftOut) {
+  allowScalars({{"s", "", ""}});
+  device.counterStore.hasScalar("s", 19999, 1);
+  Array deep;
+  for (std::size_t i = 0; i < kMaxPropertyListDepth; ++i) deep = Array{deep};
+  writeLog(deep);
+  EXPECT_FALSE(document().contains("TLActivatedAppInfo"));
+  EXPECT_EQ(device.log.errors().size(), 1u);
+}
+
 TEST_F(ReportTest, NothingToReportLeavesNoTrace) {
   allowScalars({{"s", "", ""}, {"nuvex.kernel.swapusage", "", ""}});
   device.counterStore.hasScalar("other", 19999, 1);

@@ -160,7 +160,8 @@ bool LinuxNamedService::handleOneMessage() {
     --connection->waiting;
     const auto frame = connection->frames.take();
     if (!frame || !connection->handler) continue;
-    const auto message = ReadPropertyList(*frame);
+    PropertyListResult message = PropertyListError{"it could not be read"};
+    guarded([&] { message = ReadPropertyList(*frame); });
     if (const auto* error = std::get_if<PropertyListError>(&message)) {
       log_.error("Closing a connection: its message is not a property list: %@",
                  error->description);
