@@ -15,6 +15,7 @@
 #include <string>
 #include <string_view>
 #include <utility>
+#include <vector>
 
 #include "platform/run_step.h"
 #include "values/property_list.h"
@@ -40,6 +41,7 @@ constexpr std::size_t kBaselineBytes = kMaxPropertyListBytes - std::size_t{1024}
 
 struct UsageRecord {
   std::string_view name;
+  std::string row;  // the name as the stored baseline can tell it
   std::string_view prefix;
   Date since;  // as the stored baseline can tell it
   std::array<Number, kFields.size()> counts;
@@ -62,6 +64,7 @@ std::optional<UsageRecord> ReadRecord(const Dictionary& record) {
                           std::ranges::find(counts, nullptr) == std::end(counts);
   if (!isComplete) return std::nullopt;
   return UsageRecord{*name,
+                     name->size() > kLongestName ? "" : AsWritten(*name),
                      isBundle ? "" : "nuvex.",
                      AsWritten(*since->asDate()),
                      {*counts[0], *counts[1], *counts[2], *counts[3]}};
@@ -92,22 +95,19 @@ class UsageComparison {
   UsageComparison(Dictionary baseline, std::int64_t yesterday, CounterBatch& counters)
       : old_(std::move(baseline)), yesterday_(yesterday), counters_(counters) {}
 
-  void add(const UsageRecord& record) {
-    const std::optional<std::string> name = reserveRow(record.name);
-    if (!name) {
-      ++leftOut_;
-      return;
+  // Rows and records are gone through together, in the order of the rows' names.
+  void add(std::vector<UsageRecord> records) {
+    std::ranges::stable_sort(records, std::ranges::less(), &UsageRecord::row);
+    auto previous = old_.begin();
+    for (const UsageRecord& record : records) {
+      if (!reserveRow(record)) {
+        ++leftOut_;
+        continue;
+      }
+      while (previous != old_.end() && previous->first < record.row) ++previous;
+      const bool isKnown = previous != old_.end() && previous->first == record.row;
+      add(record, isKnown ? previous->second.asArray() : nullptr);
     }
-    const auto& counts = record.counts;
-    const Array* previous = ArrayEntry(old_, *name);
-    const Date* start =
-        previous != nullptr && !previous->empty() ? (*previous)[0].asDate() : nullptr;
-    if (start != nullptr && AsWritten(*start) == record.since) {
-      addGrowth(record, *previous);
-    } else {
-      addFirstCounts(record);
-    }
-    new_[*name] = Array{record.since, counts[0], counts[1], counts[2], counts[3]};
   }
 
   const Dictionary& baseline() const { return new_; }
@@ -115,14 +115,24 @@ class UsageComparison {
   std::uint64_t leftOut() const { return leftOut_; }
 
  private:
-  // The name under which the row is stored, or nothing when it would be too large.
-  std::optional<std::string> reserveRow(std::string_view name) {
-    if (name.size() > kLongestName) return std::nullopt;
-    std::string stored = AsWritten(name);
-    const std::size_t size = RowBytes(stored);
-    if (size > room_) return std::nullopt;
+  bool reserveRow(const UsageRecord& record) {
+    if (record.name.size() > kLongestName) return false;
+    const std::size_t size = RowBytes(record.row);
+    if (size > room_) return false;
     room_ -= size;
-    return stored;
+    return true;
+  }
+
+  void add(const UsageRecord& record, const Array* previous) {
+    const Date* start =
+        previous != nullptr && !previous->empty() ? (*previous)[0].asDate() : nullptr;
+    if (start != nullptr && AsWritten(*start) == record.since) {
+      addGrowth(record, *previous);
+    } else {
+      addFirstCounts(record);
+    }
+    const auto& counts = record.counts;
+    new_[record.row] = Array{record.since, counts[0], counts[1], counts[2], counts[3]};
   }
 
   void addGrowth(const UsageRecord& record, const Array& previous) {
@@ -179,11 +189,13 @@ void processDataUsageReply(const Array& records, CounterStore& counterStore,
   const Dictionary* baseline = stored ? stored->asDictionary() : nullptr;
   CounterBatch counters(counterStore);
   UsageComparison comparison(baseline != nullptr ? *baseline : Dictionary(), yesterday, counters);
+  std::vector<UsageRecord> complete;
   for (const PropertyValue& value : records) {
     const Dictionary* dictionary = value.asDictionary();
     if (dictionary == nullptr) continue;
-    if (const auto record = ReadRecord(*dictionary)) comparison.add(*record);
+    if (auto record = ReadRecord(*dictionary)) complete.push_back(*std::move(record));
   }
+  comparison.add(std::move(complete));
   if (comparison.leftOut() != 0) {
     log.error("Left out %llu network usage records whose names are too long or that are too many",
               comparison.leftOut());

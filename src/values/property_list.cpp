@@ -1,4 +1,4 @@
-// Property-list documents to and from value trees: libplist between the check and the conversion.
+// Binary documents to value trees, and value trees to XML documents, with libplist.
 #include "values/property_list.h"
 
 #include <plist/plist.h>
@@ -18,6 +18,7 @@
 #include "values/byte_reader.h"
 #include "values/property_list_check.h"
 #include "values/property_list_scalars.h"
+#include "values/property_list_xml.h"
 #include "values/text.h"
 
 namespace quorlet {
@@ -41,15 +42,12 @@ struct MemoryFree {
 template <typename T>
 using Allocated = std::unique_ptr<T, MemoryFree>;
 
-Node ParseXml(std::string_view document) {
+// A node of a kind that libplist makes only by parsing.
+Node ParseScalar(std::string_view element, const std::string& text) {
+  const std::string document = FormatText("<plist><%s>%s</%s></plist>", element, text, element);
   plist_t node = nullptr;
   plist_from_xml(document.data(), static_cast<std::uint32_t>(document.size()), &node);
   return Node(node);
-}
-
-// A node of a kind that libplist makes only by parsing.
-Node ParseScalar(std::string_view element, const std::string& text) {
-  return ParseXml(FormatText("<plist><%s>%s</%s></plist>", element, text, element));
 }
 
 // --- Reading: the depth was checked before the nodes were made ----------------------------------
@@ -83,6 +81,12 @@ PropertyValue DateFromNode(plist_t node) {
   return Date{std::bit_cast<double>(reader.big(8)) + kEpoch2001};
 }
 
+bool BooleanFromNode(plist_t node) {
+  std::uint8_t boolean = 0;
+  plist_get_bool_val(node, &boolean);
+  return boolean != 0;
+}
+
 PropertyValue DataFromNode(plist_t node) {
   std::uint64_t size = 0;
   const char* bytes = plist_get_data_ptr(node, &size);
@@ -96,107 +100,70 @@ std::string TextOf(plist_t node) {
   return RepairUtf8({text, text == nullptr ? 0 : static_cast<std::size_t>(size)});
 }
 
-std::vector<plist_t> ElementsOf(plist_t array) {
-  std::vector<plist_t> elements;
+// nullopt for a node that is not what the check let pass.
+std::optional<PropertyValue> ValueOf(plist_t node);
+
+std::optional<PropertyValue> ArrayOf(plist_t node) {
+  Array array;
+  array.reserve(plist_array_get_size(node));
   plist_array_iter position = nullptr;
-  plist_array_new_iter(array, &position);
+  plist_array_new_iter(node, &position);
   const Allocated<void> owner(position);
   while (true) {
     plist_t item = nullptr;
-    plist_array_next_item(array, position, &item);
-    if (item == nullptr) return elements;
-    elements.push_back(item);
+    plist_array_next_item(node, position, &item);
+    if (item == nullptr) return array;
+    auto element = ValueOf(item);
+    if (!element) return std::nullopt;
+    array.push_back(*std::move(element));
   }
 }
 
-class TreeReader {
- public:
-  // `isPlain`: the nodes come from the plain form of an XML document, without dictionaries.
-  explicit TreeReader(bool isPlain) : isPlain_(isPlain) {}
+std::optional<PropertyValue> DictionaryOf(plist_t node) {
+  plist_dict_iter position = nullptr;
+  plist_dict_new_iter(node, &position);
+  const Allocated<void> owner(position);
+  Dictionary dictionary;
+  while (true) {
+    char* key = nullptr;
+    plist_t item = nullptr;
+    plist_dict_next_item(node, position, &key, &item);
+    const Allocated<char> keyOwner(key);
+    if (item == nullptr) return dictionary;
+    auto element = ValueOf(item);
+    if (!element || key == nullptr) return std::nullopt;
+    dictionary[RepairUtf8(key)] = *std::move(element);
+  }
+}
 
-  // nullopt for a node that is not what the check let pass.
-  std::optional<PropertyValue> value(plist_t node) const {
-    switch (plist_get_node_type(node)) {
-      case PLIST_BOOLEAN:
-        return isTrue(node);
-      case PLIST_UINT:
-        return IntegerFromNode(node);
-      case PLIST_REAL: {
-        double real = 0;
-        plist_get_real_val(node, &real);
-        return Double(real);
-      }
-      case PLIST_STRING:
-        return TextOf(node);
-      case PLIST_DATA:
-        return DataFromNode(node);
-      case PLIST_DATE:
-        return DateFromNode(node);
-      case PLIST_ARRAY:
-        return container(ElementsOf(node));
-      case PLIST_DICT:
-        return dictionary(node);
-      case PLIST_KEY:
-      case PLIST_UID:
-      case PLIST_NONE:
-        break;
+std::optional<PropertyValue> ValueOf(plist_t node) {
+  switch (plist_get_node_type(node)) {
+    case PLIST_BOOLEAN:
+      return BooleanFromNode(node);
+    case PLIST_UINT:
+      return IntegerFromNode(node);
+    case PLIST_REAL: {
+      double real = 0;
+      plist_get_real_val(node, &real);
+      return Double(real);
     }
-    return std::nullopt;
+    case PLIST_STRING:
+      return TextOf(node);
+    case PLIST_DATA:
+      return DataFromNode(node);
+    case PLIST_DATE:
+      return DateFromNode(node);
+    case PLIST_ARRAY:
+      return ArrayOf(node);
+    case PLIST_DICT:
+      return DictionaryOf(node);
+    case PLIST_KEY:
+    case PLIST_UID:
+    case PLIST_NONE:
+      break;
   }
-
- private:
-  static bool isTrue(plist_t node) {
-    std::uint8_t boolean = 0;
-    plist_get_bool_val(node, &boolean);
-    return boolean != 0;
-  }
-
-  std::optional<PropertyValue> container(std::span<const plist_t> elements) const {
-    if (!isPlain_) return array(elements);
-    if (elements.empty()) return std::nullopt;
-    return isTrue(elements[0]) ? pairs(elements.subspan(1)) : array(elements.subspan(1));
-  }
-
-  std::optional<PropertyValue> array(std::span<const plist_t> elements) const {
-    Array array;
-    for (const plist_t item : elements) {
-      auto element = value(item);
-      if (!element) return std::nullopt;
-      array.push_back(*std::move(element));
-    }
-    return array;
-  }
-
-  // Keys and values in turn, from a plain form.
-  std::optional<PropertyValue> pairs(std::span<const plist_t> elements) const {
-    Dictionary dictionary;
-    for (; elements.size() >= 2; elements = elements.subspan(2)) {
-      auto element = value(elements[1]);
-      if (!element) return std::nullopt;
-      dictionary[TextOf(elements[0])] = *std::move(element);
-    }
-    return dictionary;
-  }
-
-  std::optional<PropertyValue> dictionary(plist_t node) const {
-    plist_dict_iter position = nullptr;
-    plist_dict_new_iter(node, &position);
-    const Allocated<void> owner(position);
-    Dictionary dictionary;
-    while (true) {
-      char* key = nullptr;
-      plist_t item = nullptr;
-      plist_dict_next_item(node, position, &key, &item);
-      const Allocated<char> keyOwner(key);
-      if (item == nullptr) return dictionary;
-      auto element = value(item);
-      if (!element || key == nullptr) return std::nullopt;
-      dictionary[RepairUtf8(key)] = *std::move(element);
-    }
-  }
-
-  const bool isPlain_;
-};
+  return std::nullopt;
+}
 
 // --- Writing ------------------------------------------------------------------------------------
 
@@ -302,20 +269,14 @@ std::string TooLarge() {
 PropertyListResult ReadPropertyList(std::string_view bytes) {
   if (bytes.empty()) return PropertyListError{"the document is empty"};
   if (bytes.size() > kMaxPropertyListBytes) return PropertyListError{TooLarge()};
-  const bool isBinary = bytes.starts_with(kBinaryMagic);
-  Node node;
-  if (isBinary) {
-    const auto wrong = CheckBinaryPropertyList(std::as_bytes(std::span(bytes)));
-    if (wrong) return PropertyListError{*wrong};
-    plist_t parsed = nullptr;
-    plist_from_bin(bytes.data(), static_cast<std::uint32_t>(bytes.size()), &parsed);
-    node.reset(parsed);
-  } else {
-    std::string plain;
-    if (const auto wrong = CheckXmlPropertyList(bytes, &plain)) return PropertyListError{*wrong};
-    node = ParseXml(plain);
+  if (!bytes.starts_with(kBinaryMagic)) return ReadXmlPropertyList(bytes);
+  if (const auto wrong = CheckBinaryPropertyList(std::as_bytes(std::span(bytes)))) {
+    return PropertyListError{*wrong};
   }
-  auto value = node == nullptr ? std::nullopt : TreeReader(!isBinary).value(node.get());
+  plist_t parsed = nullptr;
+  plist_from_bin(bytes.data(), static_cast<std::uint32_t>(bytes.size()), &parsed);
+  const Node node(parsed);
+  auto value = node == nullptr ? std::nullopt : ValueOf(node.get());
   if (!value) return PropertyListError{"the document cannot be parsed"};
   return *std::move(value);
 }

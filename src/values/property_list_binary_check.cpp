@@ -235,6 +235,16 @@ class BinaryChecker {
 
 }  // namespace
 
+std::string TooDeeplyNested() {
+  return FormatText("nested more than %llu deep", kMaxPropertyListDepth);
+}
+
+std::string TooManyValues() { return FormatText("more than %llu values", kMaxPropertyListValues); }
+
+std::string TooMuchContent() {
+  return FormatText("more than %llu bytes of content", kMaxPropertyListContentBytes);
+}
+
 std::optional<std::string> CheckBinaryPropertyList(std::span<const std::byte> document) {
   return BinaryChecker(document).check();
 }

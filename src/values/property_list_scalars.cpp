@@ -6,6 +6,8 @@
 #include <charconv>
 #include <chrono>
 #include <cstdint>
+#include <limits>
+#include <utility>
 
 #include "values/text.h"
 
@@ -14,7 +16,6 @@ namespace {
 
 bool IsBlank(char c) { return kXmlBlanks.find(c) != std::string_view::npos; }
 bool IsBetween(char c, char first, char last) { return c >= first && c <= last; }
-bool IsLetter(char c) { return IsBetween(c, 'a', 'z') || IsBetween(c, 'A', 'Z'); }
 bool IsDigit(char c) { return IsBetween(c, '0', '9'); }
 
 // A number of `least` to `most` digits at the front of `text`, which loses them.
@@ -45,6 +46,19 @@ void AppendUtf8(std::string& out, std::uint32_t c) {
   for (unsigned i = more; i-- > 0;) put(0x80 | (c >> (6 * i) & 0x3F));
 }
 
+PropertyValue NumberFromBits(std::uint64_t number) {
+  return std::in_range<std::int64_t>(number) ? Int64(static_cast<std::int64_t>(number))
+                                             : UInt64(number);
+}
+
+// The six bits that a base64 digit stands for, or 64.
+std::uint32_t Base64Bits(char c) {
+  constexpr std::string_view kDigits =
+      "ABCDEFGHIJKLMNOPQRSTUVWXYZabcdefghijklmnopqrstuvwxyz0123456789+/";
+  const std::size_t found = kDigits.find(c);
+  return found == std::string_view::npos ? 64 : static_cast<std::uint32_t>(found);
+}
+
 }  // namespace
 
 std::string_view Trimmed(std::string_view text) {
@@ -59,7 +73,7 @@ std::string Lowered(std::string_view text) {
   return out;
 }
 
-std::optional<std::string> PlainInteger(std::string_view text) {
+std::optional<PropertyValue> IntegerFromText(std::string_view text) {
   const bool negative = text.starts_with('-');
   if (negative || text.starts_with('+')) text.remove_prefix(1);
   const bool hexadecimal = text.starts_with("0x") || text.starts_with("0X");
@@ -69,28 +83,28 @@ std::optional<std::string> PlainInteger(std::string_view text) {
   const auto [stopped, error] = std::from_chars(text.data(), end, magnitude, hexadecimal ? 16 : 10);
   if (error != std::errc() || stopped != end) return std::nullopt;
   if (negative && magnitude > std::uint64_t{1} << 63) return std::nullopt;
-  return FormatText("%s%llu", negative ? "-" : "", magnitude);
+  if (!negative) return NumberFromBits(magnitude);
+  return Int64(static_cast<std::int64_t>(-magnitude));
 }
 
-std::optional<std::string> PlainReal(std::string_view text) {
+std::optional<PropertyValue> RealFromText(std::string_view text) {
   const bool negative = text.starts_with('-');
-  const std::string sign = negative ? "-" : "";
   if (negative || text.starts_with('+')) text.remove_prefix(1);
-  const std::string word = Lowered(text);
-  if (word == "nan") return "nan";
-  if (word == "inf" || word == "infinity") return negative ? "-infinity" : "+infinity";
-  if (text.empty() || !(IsDigit(text[0]) || text[0] == '.')) return std::nullopt;
   double value = 0;
-  const char* const end = text.data() + text.size();
-  const auto [stopped, error] = std::from_chars(text.data(), end, value);
-  if (error != std::errc() || stopped != end) return std::nullopt;
-  std::array<char, 32> digits{};
-  const auto printed = std::to_chars(digits.begin(), digits.end(), value);
-  return sign + std::string(digits.begin(), printed.ptr);
+  if (const std::string word = Lowered(text); word == "nan") {
+    value = std::numeric_limits<double>::quiet_NaN();
+  } else if (word == "inf" || word == "infinity") {
+    value = std::numeric_limits<double>::infinity();
+  } else {
+    if (text.empty() || !(IsDigit(text[0]) || text[0] == '.')) return std::nullopt;
+    const char* const end = text.data() + text.size();
+    const auto [stopped, error] = std::from_chars(text.data(), end, value);
+    if (error != std::errc() || stopped != end) return std::nullopt;
+  }
+  return Double(negative ? -value : value);
 }
 
-std::optional<std::string> PlainDate(std::string_view text) {
-  const std::string_view whole = text;
+std::optional<PropertyValue> DateFromText(std::string_view text) {
   std::array<unsigned, 6> fields{};
   constexpr std::string_view kSeparators = "--T::Z";
   for (std::size_t i = 0; i < fields.size(); ++i) {
@@ -104,38 +118,33 @@ std::optional<std::string> PlainDate(std::string_view text) {
                                           std::chrono::month(month), std::chrono::day(day));
   if (!text.empty() || year == 0 || !civil.ok()) return std::nullopt;
   if (hour > 23 || minute > 59 || second > 59) return std::nullopt;
-  return std::string(whole);
+  const auto days = std::chrono::sys_days(civil).time_since_epoch();
+  const auto time = std::chrono::hours(hour) + std::chrono::minutes(minute);
+  const auto seconds = std::chrono::seconds(days) + time + std::chrono::seconds(second);
+  return Date{static_cast<double>(seconds.count())};
 }
 
-std::optional<std::string> PlainBase64(std::string_view text) {
-  std::string plain;
+std::optional<PropertyValue> DataFromBase64(std::string_view text) {
+  Data data;
+  data.reserve(text.size() / 4 * 3);
+  std::uint32_t bits = 0;  // of the group of four digits
+  std::size_t digits = 0;
+  std::size_t padding = 0;
   for (const char c : text) {
-    if (!IsBlank(c)) plain += c;
+    if (IsBlank(c)) continue;
+    const bool isPadding = c == '=' && digits % 4 >= 2;
+    const std::uint32_t value = isPadding ? 0 : Base64Bits(c);
+    if (value > 63 || padding > (isPadding ? 1 : 0) || (padding == 1 && !isPadding)) {
+      return std::nullopt;
+    }
+    if (isPadding) ++padding;
+    bits = bits << 6 | value;
+    if (++digits % 4 != 0) continue;
+    for (const unsigned shift : {16U, 8U, 0U}) data.push_back(std::byte(bits >> shift & 0xFF));
   }
-  std::string_view digits = plain;
-  if (digits.size() % 4 != 0) return std::nullopt;
-  for (int padding = 0; padding < 2 && digits.ends_with('='); ++padding) digits.remove_suffix(1);
-  const bool good = std::ranges::all_of(
-      digits, [](char c) { return IsLetter(c) || IsDigit(c) || c == '+' || c == '/'; });
-  return good ? std::optional(plain) : std::nullopt;
-}
-
-std::string SectionedXml(std::string_view text) {
-  constexpr std::string_view kBegin = "<![CDATA[";
-  constexpr std::string_view kEnd = "]]>";
-  if (text.find_first_of("&<") == std::string_view::npos) return std::string(text);
-  std::string out(kBegin);
-  std::string_view rest = text;
-  for (std::size_t end; (end = rest.find(kEnd)) != std::string_view::npos;) {
-    // The text's own "]]>" is cut in two, in two sections.
-    out += rest.substr(0, end + 2);
-    out += kEnd;
-    out += kBegin;
-    rest.remove_prefix(end + 2);
-  }
-  out += rest;
-  out += kEnd;
-  return out;
+  if (digits % 4 != 0) return std::nullopt;
+  data.resize(data.size() - padding);
+  return data;
 }
 
 std::optional<std::string> XmlReference(std::string_view name) {

@@ -7,6 +7,8 @@
 #include <string>
 #include <string_view>
 
+#include "values/property_value.h"
+
 namespace quorlet {
 
 inline constexpr std::string_view kXmlBlanks = " \t\r\n";
@@ -16,19 +18,15 @@ std::string_view Trimmed(std::string_view text);
 // `text` in lower case, as far as it is ASCII.
 std::string Lowered(std::string_view text);
 
-// Each of these gives a trimmed text in its one plain spelling, nullopt when it is not such a text.
+// Each of these gives the value of a trimmed text, nullopt when it is not such a text.
 // Integers: decimal or 0x hexadecimal, -2^63 to 2^64 - 1.
-std::optional<std::string> PlainInteger(std::string_view text);
+std::optional<PropertyValue> IntegerFromText(std::string_view text);
 // Decimal numbers within the range of a double, "nan", "inf" and "infinity" in any case.
-std::optional<std::string> PlainReal(std::string_view text);
+std::optional<PropertyValue> RealFromText(std::string_view text);
 // "2026-03-04T05:06:07Z", years 1 to 9999 with or without leading zeros.
-std::optional<std::string> PlainDate(std::string_view text);
-// Padded base64; blanks are dropped.
-std::optional<std::string> PlainBase64(std::string_view text);
-
-// `text` as an element's content, in a CDATA section if it needs one. Entities would be as good,
-// but libplist takes time that grows with the square of their number.
-std::string SectionedXml(std::string_view text);
+std::optional<PropertyValue> DateFromText(std::string_view text);
+// Padded base64; blanks are skipped.
+std::optional<PropertyValue> DataFromBase64(std::string_view text);
 
 // The character that "amp" or "#x41" names, in UTF-8; nullopt for an unknown name and for one that
 // XML does not allow.

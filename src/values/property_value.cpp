@@ -184,6 +184,7 @@ std::size_t Array::size() const { return elements_->size(); }
 PropertyValue& Array::operator[](std::size_t index) { return (*elements_)[index]; }
 const PropertyValue& Array::operator[](std::size_t index) const { return (*elements_)[index]; }
 void Array::push_back(PropertyValue value) { elements_->push_back(std::move(value)); }
+void Array::reserve(std::size_t count) { elements_->reserve(count); }
 Array::Elements::const_iterator Array::begin() const { return elements_->cbegin(); }
 Array::Elements::const_iterator Array::end() const { return elements_->cend(); }
 
@@ -195,7 +196,7 @@ Array Array::shallowCopy() const {
 
 Array Array::deepCopy() const {
   Array copy;
-  copy.elements_->reserve(size());
+  copy.reserve(size());
   for (const PropertyValue& element : *this) copy.push_back(element.deepCopy());
   return copy;
 }

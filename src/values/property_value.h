@@ -74,6 +74,8 @@ class Array {
   PropertyValue& operator[](std::size_t index);
   const PropertyValue& operator[](std::size_t index) const;
   void push_back(PropertyValue value);
+  // Makes room for `count` elements in all.
+  void reserve(std::size_t count);
   Elements::const_iterator begin() const;
   Elements::const_iterator end() const;
 

@@ -124,11 +124,11 @@ class LinuxPreferences : public Preferences {
     if (found == nullptr) return std::nullopt;
     const std::string stored = StorableKey(key);
     if (const auto change = found->pending.find(stored); change != found->pending.end()) {
-      return change->second ? std::optional(change->second->deepCopy()) : std::nullopt;
+      return change->second;
     }
     refresh(domain, *found);
     const PropertyValue* value = found->stored.find(stored);
-    return value != nullptr ? std::optional(value->deepCopy()) : std::nullopt;
+    return value != nullptr ? std::optional(*value) : std::nullopt;
   }
 
   void DGWPreferencesSetValue(std::string_view key, std::optional<PropertyValue> value,
@@ -136,7 +136,6 @@ class LinuxPreferences : public Preferences {
     const std::lock_guard lock(mutex_);
     Domain* found = findDomain(domain);
     if (found == nullptr) return;
-    if (value) value = value->deepCopy();
     found->pending.insert_or_assign(StorableKey(key), std::move(value));
   }
 

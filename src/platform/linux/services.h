@@ -36,7 +36,7 @@ std::unique_ptr<SystemLog> MakeLinuxSystemLog(const Root& root, Access access, C
 std::unique_ptr<SystemLog> MakeStandardErrorLog();
 
 // Property lists in /var/mobile/Library/Preferences. The destructor makes pending changes durable.
-// What is set is copied and what is handed out is a copy. Safe to use from any thread. In keys,
+// Safe to use from any thread. In keys,
 // what a property list cannot hold becomes U+FFFD, when reading too.
 std::unique_ptr<Preferences> MakeLinuxPreferences(const Root& root, Access access, SystemLog& log);
 

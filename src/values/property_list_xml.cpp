@@ -1,14 +1,19 @@
-// The check of XML documents, a scanner over
+// XML property lists are read here and not by libplist, which accepts much that is broken without a
+// word, takes quadratic time for chosen keys and entities, and drops what does not fit its dates.
 //   [BOM] [<?xml …?>] [document type] <plist> value </plist>
 // with comments, processing instructions and blanks between elements.
-#include "values/property_list_check.h"
+#include "values/property_list_xml.h"
 
 #include <algorithm>
 #include <array>
 #include <cstdint>
+#include <iterator>
+#include <optional>
+#include <string>
+#include <utility>
 #include <vector>
 
-#include "values/property_list.h"
+#include "values/property_list_check.h"
 #include "values/property_list_scalars.h"
 #include "values/text.h"
 
@@ -26,7 +31,7 @@ enum class Role : std::uint8_t { kRoot, kDictionary, kArray, kKey, kText, kFlag,
 struct Element {
   std::string_view name;
   Role role;
-  std::optional<std::string> (*plain)(std::string_view) = nullptr;
+  std::optional<PropertyValue> (*read)(std::string_view) = nullptr;
   std::string_view expected = {};
 };
 
@@ -39,21 +44,21 @@ constexpr auto kElements = std::to_array<Element>({
     {"string",  Role::kText},
     {"true",    Role::kFlag},
     {"false",   Role::kFlag},
-    {"integer", Role::kScalar, PlainInteger, "a 64-bit integer"},
-    {"real",    Role::kScalar, PlainReal,    "a real number"},
-    {"date",    Role::kScalar, PlainDate,    "a date such as 2026-03-04T05:06:07Z"},
-    {"data",    Role::kScalar, PlainBase64,  "base64"},
+    {"integer", Role::kScalar, IntegerFromText, "a 64-bit integer"},
+    {"real",    Role::kScalar, RealFromText,    "a real number"},
+    {"date",    Role::kScalar, DateFromText,    "a date such as 2026-03-04T05:06:07Z"},
+    {"data",    Role::kScalar, DataFromBase64,  "base64"},
 });
 // clang-format on
 
 // Every step gives false once something is wrong, and `error` says what.
-class XmlChecker {
+class XmlReader {
  public:
-  XmlChecker(std::string_view document, std::string& plain) : text_(document), plain_(plain) {}
+  explicit XmlReader(std::string_view document) : text_(document) {}
 
-  std::optional<std::string> check() {
-    if (!checkCharacters() || !readDocument()) return error_;
-    return std::nullopt;
+  PropertyListResult read() {
+    if (!checkCharacters() || !readDocument()) return PropertyListError{error_};
+    return std::move(root_);
   }
 
  private:
@@ -65,8 +70,10 @@ class XmlChecker {
   };
   struct Open {
     const Element* element;
-    std::size_t values = 0;
-    bool keyPending = false;
+    std::size_t firstElement = 0;  // of an array, in elements_
+    Dictionary entries = {};
+    std::optional<std::string> key = std::nullopt;  // read, and its value not yet
+    bool isEmpty = true;
   };
 
   bool fail(std::size_t at, std::string_view what) {
@@ -225,12 +232,12 @@ class XmlChecker {
   // Whether a value or key of this kind may come next in `parent`.
   bool checkPlace(const Open& parent, const Element& element, std::size_t at) {
     if (element.role == Role::kRoot) return fail(at, "<plist> inside <plist>");
-    const bool keyExpected = parent.element->role == Role::kDictionary && !parent.keyPending;
+    const bool keyExpected = parent.element->role == Role::kDictionary && !parent.key;
     if (keyExpected != (element.role == Role::kKey)) {
       return fail(
           at, FormatText("<%s> where %s belongs", element.name, keyExpected ? "<key>" : "a value"));
     }
-    if (parent.element->role == Role::kRoot && parent.values > 0) {
+    if (parent.element->role == Role::kRoot && !parent.isEmpty) {
       return fail(at, FormatText("<%s>: a second value inside <plist>", element.name));
     }
     return true;
@@ -244,25 +251,33 @@ class XmlChecker {
       return fail(at, FormatText("<%s> holds %s, which is not %s", element.name,
                                  QuotedExcerpt(content), expected));
     };
-    if (element.role == Role::kFlag) {
-      plain_ += FormatText("<%s/>", element.name);
-      return Trimmed(content).empty() || refuse("empty");
+    if (element.role == Role::kFlag && !Trimmed(content).empty()) return refuse("empty");
+    if (element.role == Role::kKey) {
+      open_.back().key = std::move(content);
+    } else if (element.role == Role::kFlag) {
+      add(element.name == "true");
+    } else if (element.role == Role::kText) {
+      add(std::move(content));
+    } else if (auto value = element.read(Trimmed(content))) {
+      add(*std::move(value));
+    } else {
+      return refuse(element.expected);
     }
-    const bool isText = element.plain == nullptr;
-    const auto plain = isText ? SectionedXml(content) : element.plain(Trimmed(content));
-    if (!plain) return refuse(element.expected);
-    emit(element.role == Role::kKey ? "string" : element.name, *plain);
     return true;
   }
 
-  void emit(std::string_view name, const std::string& content) {
-    plain_ += '<';
-    plain_ += name;
-    plain_ += '>';
-    plain_ += content;
-    plain_ += "</";
-    plain_ += name;
-    plain_ += '>';
+  // Puts a value where it belongs in what is open.
+  void add(PropertyValue&& value) {
+    Open& parent = open_.back();
+    parent.isEmpty = false;
+    if (parent.element->role == Role::kRoot) {
+      root_ = std::move(value);
+    } else if (parent.element->role == Role::kArray) {
+      elements_.push_back(std::move(value));
+    } else {
+      parent.entries[*parent.key] = std::move(value);
+      parent.key.reset();
+    }
   }
 
   bool openElement(const Tag& tag, std::size_t at) {
@@ -272,23 +287,35 @@ class XmlChecker {
     if (tag.hasAttributes) return fail(at, FormatText("<%s> has attributes", tag.name));
     Open& parent = open_.back();
     if (!checkPlace(parent, *element, at)) return false;
-    parent.keyPending = element->role == Role::kKey;
-    if (!parent.keyPending) {
-      ++parent.values;
-      if (++values_ > kMaxPropertyListValues) return fail(at, TooManyValues());
+    if (element->role != Role::kKey && ++values_ > kMaxPropertyListValues) {
+      return fail(at, TooManyValues());
     }
     if (element->role != Role::kDictionary && element->role != Role::kArray) {
       return readLeaf(*element, tag, at);
     }
     // <plist> is open beside the containers.
     if (open_.size() > kMaxPropertyListDepth) return fail(at, TooDeeplyNested());
-    plain_ += element->role == Role::kDictionary ? "<array><true/>" : "<array><false/>";
-    if (tag.isEmpty) {
-      plain_ += "</array>";
-    } else {
-      open_.push_back({element});
-    }
+    open_.push_back({element, elements_.size()});
+    if (tag.isEmpty) closeContainer();
     return true;
+  }
+
+  // Makes a value of the innermost container, which is complete.
+  void closeContainer() {
+    const Open closed = std::move(open_.back());
+    open_.pop_back();
+    if (closed.element->role == Role::kDictionary) {
+      add(closed.entries);
+      return;
+    }
+    const auto first = elements_.begin() + static_cast<std::ptrdiff_t>(closed.firstElement);
+    Array array;
+    array.reserve(elements_.size() - closed.firstElement);
+    for (auto element = first; element != elements_.end(); ++element) {
+      array.push_back(std::move(*element));
+    }
+    elements_.erase(first, elements_.end());
+    add(array);
   }
 
   bool closeElement(const Tag& tag, std::size_t at) {
@@ -296,12 +323,15 @@ class XmlChecker {
     if (tag.name != open.element->name || tag.hasAttributes) {
       return fail(at, FormatText("</%s> inside <%s>", tag.name, open.element->name));
     }
-    if (open.keyPending) return fail(at, "the last <key> of <dict> has no value");
-    if (open.element->role == Role::kRoot && open.values == 0) {
+    if (open.key) return fail(at, "the last <key> of <dict> has no value");
+    if (open.element->role == Role::kRoot && open.isEmpty) {
       return fail(at, "<plist> holds no value");
     }
-    plain_ += open.element->role == Role::kRoot ? "</plist>" : "</array>";
-    open_.pop_back();
+    if (open.element->role == Role::kRoot) {
+      open_.pop_back();
+    } else {
+      closeContainer();
+    }
     return true;
   }
 
@@ -317,7 +347,6 @@ class XmlChecker {
     if (!readTag(root)) return false;
     if (root.name != "plist" || root.closes) return fail(start, "no <plist> element");
     if (root.isEmpty) return fail(start, "<plist> holds no value");
-    plain_ += "<plist>";
     open_.push_back({kElements.begin()});
     while (!open_.empty()) {
       if (!readNextTag()) return false;
@@ -337,28 +366,18 @@ class XmlChecker {
   }
 
   std::string_view text_;
-  std::string& plain_;
   std::size_t at_ = 0;
   std::vector<Open> open_;
+  std::vector<PropertyValue> elements_;  // of all open arrays, the innermost one's last
+  PropertyValue root_;
   std::size_t values_ = 0;
   std::string error_;
 };
 
 }  // namespace
 
-std::string TooDeeplyNested() {
-  return FormatText("nested more than %llu deep", kMaxPropertyListDepth);
-}
-
-std::string TooManyValues() { return FormatText("more than %llu values", kMaxPropertyListValues); }
-
-std::string TooMuchContent() {
-  return FormatText("more than %llu bytes of content", kMaxPropertyListContentBytes);
-}
-
-std::optional<std::string> CheckXmlPropertyList(std::string_view document, std::string* plain) {
-  std::string unwanted;
-  return XmlChecker(document, plain == nullptr ? unwanted : *plain).check();
+PropertyListResult ReadXmlPropertyList(std::string_view document) {
+  return XmlReader(document).read();
 }
 
 }  // namespace quorlet
