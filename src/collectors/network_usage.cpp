@@ -32,8 +32,7 @@ constexpr std::array<std::string_view, 4> kFields{"wifiInBytes", "wifiOutBytes",
                                                   "wwanOutBytes"};
 constexpr std::string_view kFieldSuffix = "Bytes";
 
-// A longer name is no name of a process, and its keys might be refused by the store, which would
-// then drop the other counters with them.
+// A longer name is no name of a process.
 constexpr std::size_t kLongestName = 1024;
 // A baseline that is larger than a document may be could not be stored, and the next run would add
 // everything again. The rest is left to the domain's other keys.

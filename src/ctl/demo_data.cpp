@@ -4,36 +4,13 @@
 #include <array>
 #include <span>
 #include <string_view>
-#include <utility>
-#include <variant>
 
+#include "ctl/demo_bytes.h"
+#include "ctl/demo_drivers.h"
 #include "report/config.h"
-#include "values/property_list.h"
 
 namespace quorlet {
 namespace {
-
-// Category bit 8, one element, format simple: what the daily pass collects.
-constexpr std::int64_t kSimpleChannel = 0x0000'0001'0100'0001;
-constexpr std::int64_t kUnitBytes = 0x0900'8200'0000'0000;
-constexpr std::int64_t kHubId = 0x100;
-constexpr std::int64_t kNetworkId = 0x1001;
-
-std::string Document(const PropertyValue& root) {
-  auto document = WriteXmlPropertyList(root);
-  std::string* text = std::get_if<std::string>(&document);
-  return text != nullptr ? std::move(*text) : std::string();
-}
-
-void AppendLittle(std::uint64_t number, std::size_t width, std::string& bytes) {
-  for (std::size_t i = 0; i < width; ++i) bytes += static_cast<char>((number >> (8 * i)) & 0xFF);
-}
-
-std::string Little(std::uint64_t number, std::size_t width) {
-  std::string bytes;
-  AppendLittle(number, width, bytes);
-  return bytes;
-}
 
 Array Bounds(std::span<const std::int64_t> bounds) {
   Array array;
@@ -88,50 +65,6 @@ Dictionary Whitelist() {
           {"System", Dictionary{{"ScalarKeys", SystemMetricKeys()}}}};
 }
 
-struct DemoChannel {
-  std::int64_t id;
-  const char* name;
-  std::uint64_t value;
-};
-constexpr std::array<DemoChannel, 3> kNetworkChannels = {
-    {{1, "net0 received", 7'340'032}, {2, "net0 sent", 1'048'576}, {3, "net0 dropped", 4096}}};
-
-// A network driver that publishes a legend, and what the hub delivers for its channels.
-Dictionary NetworkDriver() {
-  Array legendEntries;
-  Array channels;
-  for (const DemoChannel& channel : kNetworkChannels) {
-    legendEntries.push_back(Array{Int64(channel.id), Int64(kSimpleChannel), channel.name});
-    std::string element;
-    AppendLittle(static_cast<std::uint64_t>(kNetworkId), 8, element);
-    AppendLittle(static_cast<std::uint64_t>(channel.id), 8, element);
-    AppendLittle(static_cast<std::uint64_t>(kSimpleChannel), 8, element);
-    AppendLittle(1, 8, element);  // time stamp
-    AppendLittle(channel.value, 8, element);
-    element.resize(64);  // the other values of a simple element stay 0
-    const auto bytes = std::as_bytes(std::span(element));
-    channels.push_back(Dictionary{{"ChannelID", Int64(channel.id)},
-                                  {"Elements", Data(bytes.begin(), bytes.end())}});
-  }
-  const Dictionary legendGroup{
-      {"DrvReportGroupName", "Network"},
-      {"DrvReportChannelInfo", Dictionary{{"DrvReportChannelUnit", Int64(kUnitBytes)}}},
-      {"DrvReportChannels", legendEntries}};
-  return {{"EntryID", Int64(kNetworkId)},
-          {"EntryName", "net0"},
-          {"ClassName", "DemoNetworkController"},
-          {"Properties",
-           Dictionary{{"DrvReportLegendPublic", true}, {"DrvReportLegend", Array{legendGroup}}}},
-          {"Channels", channels}};
-}
-
-Dictionary Hub() {
-  return {{"EntryID", Int64(kHubId)},
-          {"EntryName", "DrvReportHub"},
-          {"ClassName", "DrvReportHub"},
-          {"Properties", Dictionary()}};
-}
-
 Array UsageRecords(Date since) {
   const auto counts = [since](const char* nameKey, const char* name, std::int64_t wifiIn,
                               std::int64_t wifiOut, std::int64_t wwanIn, std::int64_t wwanOut) {
@@ -151,6 +84,19 @@ std::string DesktopFile(std::string_view name) {
   return std::string("[Desktop Entry]\nType=Application\nName=")
       .append(name)
       .append("\nExec=true\n");
+}
+
+// One process with the thread that writes compressed memory to flash.
+std::string DemoTaskSnapshot() {
+  enum Item : std::uint64_t { kBegin = 0x13, kEnd = 0x14, kIO = 0x901, kName = 0x909 };
+  constexpr std::uint64_t kBufferEnd = 0xF19158ED;
+  LittleEndian items;
+  items.u32(kBegin).u32(4).u64(1).u32(1);
+  items.u32(kBegin).u32(4).u64(2).u32(2);
+  items.u32(kName).u32(16).u64(0).text("VM_swapout", 16);
+  items.u32(kIO).u32(32).u64(0).u64(811).u64(26'574'848).u64(9402).u64(616'169'472);
+  items.u32(kEnd).u32(0).u64(2).u32(kEnd).u32(0).u64(1).u32(kBufferEnd).u32(0).u64(0);
+  return items.bytes();
 }
 
 struct DemoScalar {
@@ -197,13 +143,16 @@ std::vector<DemoFile> MakeDemoFiles(Date startOfToday) {
       {std::string(kWhitelistPath), Document(Whitelist())},
       {"/var/mobile/Library/Preferences/nuvex.diagwell.plist",
        Document(Dictionary{{"SubmissionEnabled", true}})},
-      {"/var/db/drivers/hub.plist", Document(Hub())},
-      {"/var/db/drivers/net0.plist", Document(NetworkDriver())},
+      {"/var/db/drivers/hub.plist", Document(DemoHub())},
+      {"/var/db/drivers/net0.plist", Document(DemoNetworkDriver())},
+      {"/var/db/drivers/storage0.plist", Document(DemoStorageDriver())},
       {"/var/db/vigil/usage.plist", Document(UsageRecords(startOfToday))},
-      {"/var/db/kernel/kern.memorystatus_freeze_count", Little(17, 4)},
-      {"/var/db/kernel/kern.memorystatus_freeze_pageouts", Little(52'311, 8)},
-      {"/var/db/kernel/kern.memorystatus_freeze_budget_pages_remaining", Little(20'480, 8)},
-      {"/var/db/kernel/kern.memorystatus_thaw_count", Little(5, 4)},
+      {"/var/db/kernel/kern.memorystatus_freeze_count", LittleEndian().u32(17).bytes()},
+      {"/var/db/kernel/kern.memorystatus_freeze_pageouts", LittleEndian().u64(52'311).bytes()},
+      {"/var/db/kernel/kern.memorystatus_freeze_budget_pages_remaining",
+       LittleEndian().u64(20'480).bytes()},
+      {"/var/db/kernel/kern.memorystatus_thaw_count", LittleEndian().u32(5).bytes()},
+      {"/var/db/kernel/task-snapshot", DemoTaskSnapshot()},
       {"/etc/os-release", "NAME=\"Demo OS\"\nVERSION_ID=1.0\nBUILD_ID=1A1\n"},
       {"/etc/machine-id", "00000000000000000000000000000de0\n"},
       {"/usr/share/applications/org.example.clock.desktop", DesktopFile("Clock")},

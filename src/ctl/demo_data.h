@@ -17,7 +17,7 @@ struct DemoFile {
 };
 
 // A whitelist, preferences, drivers, usage records since the start of `today`, kernel parameters,
-// an OS release, a machine id and two applications.
+// a task snapshot, an OS release, a machine id and two applications.
 std::vector<DemoFile> MakeDemoFiles(Date startOfToday);
 
 // Counters of the day: scalars and distributions. False after an error line.

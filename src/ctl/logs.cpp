@@ -28,6 +28,8 @@ constexpr std::array<std::string_view, 2> kStages = {"pending", "outbox"};
 constexpr std::size_t kMaxLogBytes = 64 << 20;
 constexpr std::size_t kMaxHeaderBytes = 1 << 20;
 constexpr std::string_view kLatest = "latest";
+// Of the logs that one pass writes, this one is the last.
+constexpr std::string_view kAggregatedType = "193";
 
 struct LogsArguments {
   std::string file;
@@ -108,7 +110,8 @@ std::vector<StoredLog> FindLogs() {
     }
   }
   std::ranges::sort(logs, {}, [](const StoredLog& log) {
-    return std::tuple(log.created, log.modified.tv_sec, log.modified.tv_nsec, log.name);
+    return std::tuple(log.created, log.type == kAggregatedType, log.modified.tv_sec,
+                      log.modified.tv_nsec, log.name);
   });
   return logs;
 }

@@ -55,28 +55,6 @@ class CapturingDiagnostics final : public Diagnostics {
   std::optional<std::string> body_;
 };
 
-Platform WithDiagnostics(const Platform& services, Diagnostics& diagnostics) {
-  return {.log = services.log,
-          .clock = services.clock,
-          .preferences = services.preferences,
-          .counterStore = services.counterStore,
-          .diagnostics = diagnostics,
-          .crashSupport = services.crashSupport,
-          .supportLibrary = services.supportLibrary,
-          .deviceInfo = services.deviceInfo,
-          .osVersion = services.osVersion,
-          .kernelParameters = services.kernelParameters,
-          .environment = services.environment,
-          .queries = services.queries,
-          .applications = services.applications,
-          .locale = services.locale,
-          .passLock = services.passLock,
-          .namedService = services.namedService,
-          .notifications = services.notifications,
-          .networkUsage = services.networkUsage,
-          .semaphores = services.semaphores};
-}
-
 // Says why there is no document as well as it can be known: the first complaint of the layers
 // below is the likely cause.
 std::string NothingToReport(std::int32_t day, const Messages& messages) {
@@ -88,7 +66,7 @@ std::string NothingToReport(std::int32_t day, const Messages& messages) {
 void Preview(Session& session, const PreviewArguments& arguments) {
   const auto platform = session.open(Access::kReadOnly);
   CapturingDiagnostics diagnostics(platform->services().diagnostics);
-  Platform services = WithDiagnostics(platform->services(), diagnostics);
+  Platform services = platform->services().with({.diagnostics = &diagnostics});
   const std::int32_t day =
       arguments.day ? *arguments.day : services.counterStore.TLDaysSince1970() - 1;
 

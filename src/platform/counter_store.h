@@ -97,7 +97,8 @@ class CounterStore {
   virtual void TLClientCheckpoint() = 0;
 
   // Makes all changes in order and at once: in one short transaction, where the store has them. A
-  // failure leaves one error line, and none of them is made: false.
+  // failure leaves one error line, and none of them is made: false. A change whose key the store
+  // cannot take (longer than 64 KiB, say) is left out, with an error line of its own.
   [[nodiscard]] virtual bool writeScalars(std::span<const ScalarChange> changes) = 0;
 
   // Sets, or adds to (saturating), today's value of one key.

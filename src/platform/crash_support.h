@@ -3,6 +3,7 @@
 #define QUORLET_PLATFORM_CRASH_SUPPORT_H_
 
 #include <cstdint>
+#include <string>
 
 #include "values/property_value.h"
 
@@ -20,6 +21,13 @@ class CrashSupport {
 
   // Rotates the support service's logs.
   virtual void rollCarewellLogs() = 0;
+
+  // Texts that a log's header tells the device and the log by; "unknown" where there is none.
+  virtual std::string GetSysIDWithDescription() = 0;
+  virtual std::string GetHardwareModel() = 0;
+  virtual std::string GetSystemVersion() = 0;
+  // A new one for each call: a random UUID, upper case.
+  virtual std::string GetIncidentID() = 0;
 };
 
 }  // namespace quorlet

@@ -8,6 +8,7 @@
 #include "platform/crash_support.h"
 #include "platform/device_info.h"
 #include "platform/diagnostics.h"
+#include "platform/driver_registry.h"
 #include "platform/environment.h"
 #include "platform/environment_queries.h"
 #include "platform/kernel_parameters.h"
@@ -19,8 +20,10 @@
 #include "platform/pass_lock.h"
 #include "platform/preferences.h"
 #include "platform/semaphores.h"
+#include "platform/standard_error.h"
 #include "platform/support_library.h"
 #include "platform/system_log.h"
+#include "platform/task_snapshot.h"
 
 namespace quorlet {
 
@@ -45,6 +48,17 @@ struct Platform {
   Notifications& notifications;
   NetworkUsage& networkUsage;
   Semaphores& semaphores;
+  DriverRegistry& driverRegistry;
+  TaskSnapshot& taskSnapshot;
+  StandardError& standardError;
+
+  struct Others {
+    Diagnostics* diagnostics = nullptr;
+    CrashSupport* crashSupport = nullptr;
+    StandardError* standardError = nullptr;
+  };
+  // The same services, but for those given.
+  Platform with(const Others& others) const;
 };
 
 }  // namespace quorlet

@@ -80,7 +80,7 @@ TEST_F(RunDriverTest, AStepThatThrowsEndsNeitherThePassNorTheLock) {
   struct Failing : FakeCrashSupport {
     void FSDumpAllOldStructuredDataLogs() override { throw std::bad_alloc(); }
   } failing;
-  Platform platform = device.bundle(failing);
+  Platform platform = device.services.with({.crashSupport = &failing});
   RunDriver(platform).runDailyTasksIfNewDay(std::nullopt);
   EXPECT_EQ(device.log.errors().size(), 1u);
   EXPECT_EQ(failing.rolls, 1);

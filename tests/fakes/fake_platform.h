@@ -16,6 +16,7 @@
 
 #include "fakes/fake_clock.h"
 #include "fakes/fake_counter_store.h"
+#include "fakes/fake_driver_registry.h"
 #include "fakes/fake_preferences.h"
 #include "fakes/fake_system_log.h"
 #include "platform/platform.h"
@@ -68,7 +69,12 @@ class FakeCrashSupport : public CrashSupport {
   }
   void FSDumpAllOldStructuredDataLogs() override { ++dumps; }
   void rollCarewellLogs() override { ++rolls; }
+  std::string GetSysIDWithDescription() override { return "system-1"; }
+  std::string GetHardwareModel() override { return "Model 9"; }
+  std::string GetSystemVersion() override { return "TestOS 1 (A1)"; }
+  std::string GetIncidentID() override { return "INCIDENT-" + std::to_string(++incidents); }
   std::vector<std::pair<std::int32_t, Dictionary>> entries;
+  int incidents = 0;
   int dumps = 0;
   int rolls = 0;
 };
@@ -308,6 +314,20 @@ class FakeSemaphores : public Semaphores {
   };
 };
 
+class FakeTaskSnapshot : public TaskSnapshot {
+ public:
+  std::optional<Data> CaptureTaskSnapshot(std::uint32_t flags) override {
+    return flags == kTaskSnapshotTaggedItems ? buffer : std::nullopt;
+  }
+  std::optional<Data> buffer;
+};
+
+class FakeStandardError : public StandardError {
+ public:
+  void write(std::string_view written) override { text += written; }
+  std::string text;
+};
+
 // The services, bundled. The clock starts at noon of day 20000.
 struct FakePlatform {
   FakeSystemLog log;
@@ -329,30 +349,14 @@ struct FakePlatform {
   FakeNotifications notifications;
   FakeNetworkUsage networkUsage;
   FakeSemaphores semaphores;
-  Platform services = bundle(crashSupport);
-
-  // The same services, but for the crash support.
-  Platform bundle(CrashSupport& otherCrashSupport) {
-    return {log,
-            clock,
-            preferences,
-            counterStore,
-            diagnostics,
-            otherCrashSupport,
-            supportLibrary,
-            deviceInfo,
-            osVersion,
-            kernelParameters,
-            environment,
-            queries,
-            applications,
-            locale,
-            passLock,
-            namedService,
-            notifications,
-            networkUsage,
-            semaphores};
-  }
+  FakeDriverRegistry driverRegistry;
+  FakeTaskSnapshot taskSnapshot;
+  FakeStandardError standardError;
+  Platform services{log,          clock,          preferences,  counterStore, diagnostics,
+                    crashSupport, supportLibrary, deviceInfo,   osVersion,    kernelParameters,
+                    environment,  queries,        applications, locale,       passLock,
+                    namedService, notifications,  networkUsage, semaphores,   driverRegistry,
+                    taskSnapshot, standardError};
 };
 
 }  // namespace quorlet

@@ -160,7 +160,7 @@ TEST_F(LinuxServices, OldStructuredLinesMoveOnce) {
   const auto line = [](const std::string& day, int n) {
     return "{\"type\":172,\"time\":\"" + day + "T23:59:59Z\",\"data\":" + std::to_string(n) + "}\n";
   };
-  const auto crash = MakeLinuxCrashSupport(root.root(), Access::kReadWrite, clock, log);
+  const auto crash = MakeLinuxCrashSupport(root.root(), Access::kReadWrite, clock, osVersion, log);
   const std::string kept = "lost\n" + line("2024-10-04", 4) + "{\"time\":\"2024-10-0\n" +
                            line("2024-10-05", 5) + line("2024-13-01", 7);
   root.write(directory + "structured.jsonl",

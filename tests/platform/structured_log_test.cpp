@@ -20,8 +20,9 @@ class StructuredLogTest : public testing::Test {
   TempRoot root;
   FakeSystemLog log;
   FakeClock clock;  // 2024-10-04T12:00:00Z
+  FakeOSVersion osVersion;
   const std::unique_ptr<CrashSupport> support =
-      MakeLinuxCrashSupport(root.root(), Access::kReadWrite, clock, log);
+      MakeLinuxCrashSupport(root.root(), Access::kReadWrite, clock, osVersion, log);
 };
 
 TEST_F(StructuredLogTest, EveryEntryIsALineOrNothing) {
@@ -47,7 +48,8 @@ TEST_F(StructuredLogTest, EveryEntryIsALineOrNothing) {
 TEST_F(StructuredLogTest, NoLineIsLostWhileOldDaysAreMoved) {
   FakeClock tomorrow;
   tomorrow.seconds += 86400;
-  const auto mover = MakeLinuxCrashSupport(root.root(), Access::kReadWrite, tomorrow, log);
+  const auto mover =
+      MakeLinuxCrashSupport(root.root(), Access::kReadWrite, tomorrow, osVersion, log);
   std::thread moves([&] {
     for (int i = 0; i < 30; ++i) mover->FSDumpAllOldStructuredDataLogs();
   });

@@ -37,7 +37,9 @@ class LinuxCounterStore : public CounterStore {
     // changes of one key stay in their order.
     std::vector<const ScalarChange*> sorted;
     sorted.reserve(changes.size());
-    for (const ScalarChange& change : changes) sorted.push_back(&change);
+    for (const ScalarChange& change : changes) {
+      if (ledger_.takesKey(change.key)) sorted.push_back(&change);
+    }
     std::ranges::stable_sort(
         sorted, std::ranges::less(),
         [](const ScalarChange* change) -> const std::string& { return change->key; });

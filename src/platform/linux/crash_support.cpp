@@ -1,10 +1,15 @@
 #include "platform/crash_support.h"
 
+#include <sys/random.h>
 #include <sys/stat.h>
+#include <sys/utsname.h>
 
+#include <array>
 #include <cerrno>
 #include <cstdio>
+#include <span>
 
+#include "platform/linux/descriptor.h"
 #include "platform/linux/property_json.h"
 #include "platform/linux/services.h"
 #include "platform/linux/structured_log.h"
@@ -15,7 +20,11 @@ namespace {
 
 constexpr char kStructuredLogs[] = "/var/mobile/Library/Logs/FaultScribe";
 constexpr char kSupportLogs[] = "/var/mobile/Library/Logs/Carewell";
+constexpr char kMachineId[] = "/etc/machine-id";
+constexpr char kProductName[] = "/sys/devices/virtual/dmi/id/product_name";
+constexpr char kUnknown[] = "unknown";
 constexpr int kOldestLog = 5;
+constexpr std::size_t kMaxTextBytes = 4096;
 
 // Only the owner of a log writes it; a link is not followed to somebody else's file.
 bool IsFile(const std::string& path, bool mayBeEmpty) {
@@ -38,13 +47,37 @@ int Rotate(const std::string& log) {
   return 0;
 }
 
+// The first line of a small file; empty when there is none.
+std::string FirstLine(const std::string& path) {
+  const auto bytes = ReadWholeFile(path, kMaxTextBytes);
+  const auto* text = std::get_if<std::string>(&bytes);
+  return text != nullptr ? text->substr(0, text->find('\n')) : std::string();
+}
+
+// 16 random bytes that say of themselves that they are random: version 4, variant 1.
+std::array<unsigned char, 16> RandomUuid() {
+  std::array<unsigned char, 16> uuid = {};
+  std::span<unsigned char> rest = uuid;
+  while (!rest.empty()) {
+    const ssize_t count = Uninterrupted([&] { return getrandom(rest.data(), rest.size(), 0); });
+    if (count <= 0) break;  // not on a kernel that has the call
+    rest = rest.subspan(static_cast<std::size_t>(count));
+  }
+  uuid[6] = static_cast<unsigned char>((uuid[6] & 0x0F) | 0x40);
+  uuid[8] = static_cast<unsigned char>((uuid[8] & 0x3F) | 0x80);
+  return uuid;
+}
+
 class LinuxCrashSupport : public CrashSupport {
  public:
-  LinuxCrashSupport(const Root& root, Access access, Clock& clock, SystemLog& log)
-      : structuredLog_(root.path(kStructuredLogs)),
+  LinuxCrashSupport(const Root& root, Access access, Clock& clock, OSVersion& osVersion,
+                    SystemLog& log)
+      : root_(root),
+        structuredLog_(root.path(kStructuredLogs)),
         supportLogs_(root.path(kSupportLogs)),
         access_(access),
         clock_(clock),
+        osVersion_(osVersion),
         log_(log) {}
 
   void FSLogStructuredData(std::int32_t type, const Dictionary& entry) override {
@@ -75,19 +108,47 @@ class LinuxCrashSupport : public CrashSupport {
     }
   }
 
+  std::string GetSysIDWithDescription() override {
+    const std::string id = FirstLine(root_.path(kMachineId));
+    return id.empty() ? kUnknown : id;
+  }
+
+  std::string GetHardwareModel() override {
+    const std::string product = FirstLine(root_.kernelPath(kProductName));
+    if (!product.empty()) return product;
+    utsname machine = {};
+    return uname(&machine) == 0 ? machine.machine : kUnknown;
+  }
+
+  std::string GetSystemVersion() override { return OSVersionText(osVersion_); }
+
+  std::string GetIncidentID() override {
+    std::string text;
+    for (const unsigned char byte : RandomUuid()) {
+      if (text.size() == 8 || text.size() == 13 || text.size() == 18 || text.size() == 23) {
+        text += '-';
+      }
+      text += "0123456789ABCDEF"[byte >> 4];
+      text += "0123456789ABCDEF"[byte & 15];
+    }
+    return text;
+  }
+
  private:
+  const Root root_;
   StructuredLog structuredLog_;
   const std::string supportLogs_;
   const Access access_;
   Clock& clock_;
+  OSVersion& osVersion_;
   SystemLog& log_;
 };
 
 }  // namespace
 
 std::unique_ptr<CrashSupport> MakeLinuxCrashSupport(const Root& root, Access access, Clock& clock,
-                                                    SystemLog& log) {
-  return std::make_unique<LinuxCrashSupport>(root, access, clock, log);
+                                                    OSVersion& osVersion, SystemLog& log) {
+  return std::make_unique<LinuxCrashSupport>(root, access, clock, osVersion, log);
 }
 
 }  // namespace quorlet

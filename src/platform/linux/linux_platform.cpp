@@ -3,14 +3,29 @@
 #include <stdlib.h>
 
 #include <utility>
+#include <vector>
 
 #include "platform/linux/counter_store.h"
+#include "platform/linux/driver_files.h"
 #include "platform/linux/named_service.h"
 #include "platform/linux/network_usage.h"
+#include "platform/linux/nvme_health_page.h"
+#include "platform/linux/nvme_source.h"
 #include "platform/linux/semaphores.h"
 #include "platform/linux/services.h"
 
 namespace quorlet {
+namespace {
+
+// The driver files first: what they describe comes before what the machine has.
+std::vector<std::unique_ptr<EntrySource>> EntrySources(const Root& root, SystemLog& log) {
+  std::vector<std::unique_ptr<EntrySource>> sources;
+  sources.push_back(MakeDriverFiles(root, log));
+  sources.push_back(MakeNvmeSource(root, ReadNvmeHealthPage));
+  return sources;
+}
+
+}  // namespace
 
 // Every service comes after those that it borrows, so destruction in reverse order is safe.
 struct LinuxPlatform::Services {
@@ -25,7 +40,7 @@ struct LinuxPlatform::Services {
         counterStore(MakeLinuxCounterStore(*ledger, *clock)),
         osVersion(MakeLinuxOSVersion(root, *log)),
         diagnostics(MakeLinuxDiagnostics(root, access, *clock, *preferences, *osVersion, *log)),
-        crashSupport(MakeLinuxCrashSupport(root, access, *clock, *log)),
+        crashSupport(MakeLinuxCrashSupport(root, access, *clock, *osVersion, *log)),
         supportLibrary(MakeLinuxSupportLibrary()),
         kernelParameters(MakeLinuxKernelParameters(root, access, *log)),
         applications(MakeLinuxApplications(root)),
@@ -33,6 +48,8 @@ struct LinuxPlatform::Services {
         passLock(MakeLinuxPassLock(root, access, *log)),
         namedService(MakeLinuxNamedService(root, *log)),
         notifications(MakeLinuxNotifications(root, *log)),
+        driverRegistry(MakeLinuxDriverRegistry(EntrySources(root, *log))),
+        taskSnapshot(MakeLinuxTaskSnapshot(root, *log)),
         networkUsage(MakeLinuxNetworkUsage(root, *log)) {}
 
   const Root root;
@@ -55,6 +72,9 @@ struct LinuxPlatform::Services {
   const std::unique_ptr<NamedService> namedService;
   const std::unique_ptr<Notifications> notifications;
   const std::unique_ptr<Semaphores> semaphores = MakeLinuxSemaphores();
+  const std::unique_ptr<DriverRegistry> driverRegistry;
+  const std::unique_ptr<TaskSnapshot> taskSnapshot;
+  const std::unique_ptr<StandardError> standardError = MakeLinuxStandardError();
   // Last, so that it goes first: it waits for a reply that is being processed, which uses the rest.
   const std::unique_ptr<NetworkUsage> networkUsage;
   Platform bundle{.log = *log,
@@ -75,7 +95,10 @@ struct LinuxPlatform::Services {
                   .namedService = *namedService,
                   .notifications = *notifications,
                   .networkUsage = *networkUsage,
-                  .semaphores = *semaphores};
+                  .semaphores = *semaphores,
+                  .driverRegistry = *driverRegistry,
+                  .taskSnapshot = *taskSnapshot,
+                  .standardError = *standardError};
 };
 
 LinuxPlatform::LinuxPlatform(Root root, Access access, std::unique_ptr<SystemLog> log)

@@ -6,22 +6,27 @@
 #include <functional>
 #include <memory>
 #include <string>
+#include <vector>
 
 #include "platform/applications.h"
 #include "platform/clock.h"
 #include "platform/crash_support.h"
 #include "platform/device_info.h"
 #include "platform/diagnostics.h"
+#include "platform/driver_registry.h"
 #include "platform/environment.h"
 #include "platform/kernel_parameters.h"
 #include "platform/linux/access.h"
 #include "platform/linux/files.h"
+#include "platform/linux/registry_entry.h"
 #include "platform/locale.h"
 #include "platform/os_version.h"
 #include "platform/pass_lock.h"
 #include "platform/preferences.h"
+#include "platform/standard_error.h"
 #include "platform/support_library.h"
 #include "platform/system_log.h"
+#include "platform/task_snapshot.h"
 
 namespace quorlet {
 
@@ -53,7 +58,7 @@ std::unique_ptr<Diagnostics> MakeLinuxDiagnostics(const Root& root, Access acces
                                                   SystemLog& log);
 
 std::unique_ptr<CrashSupport> MakeLinuxCrashSupport(const Root& root, Access access, Clock& clock,
-                                                    SystemLog& log);
+                                                    OSVersion& osVersion, SystemLog& log);
 
 // The program itself is the library: the functions are part of it and exported by name.
 std::unique_ptr<SupportLibrary> MakeLinuxSupportLibrary();
@@ -64,6 +69,18 @@ std::unique_ptr<DeviceInfo> MakeLinuxDeviceInfo(const Root& root, SystemLog& log
 // With read-only access reading a queue leaves its files.
 std::unique_ptr<KernelParameters> MakeLinuxKernelParameters(const Root& root, Access access,
                                                             SystemLog& log);
+
+// The entries of all sources, by entry ID; of two with one ID the earlier source's counts. The
+// first source, the driver files, is asked anew for each look-up of services; the others on first
+// use, and again for each visit after the first. Where a later source publishes channels and no
+// entry is a hub, a hub is added.
+std::unique_ptr<DriverRegistry> MakeLinuxDriverRegistry(
+    std::vector<std::unique_ptr<EntrySource>> sources);
+
+// /var/db/kernel/task-snapshot, otherwise what /proc says.
+std::unique_ptr<TaskSnapshot> MakeLinuxTaskSnapshot(const Root& root, SystemLog& log);
+
+std::unique_ptr<StandardError> MakeLinuxStandardError();
 
 std::unique_ptr<Environment> MakeLinuxEnvironment(const Root& root, DeviceInfo& deviceInfo,
                                                   SystemLog& log);

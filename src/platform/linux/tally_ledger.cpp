@@ -27,6 +27,12 @@ class LinuxTallyLedger final : public TallyLedger {
                    Preferences& preferences, SystemLog& log)
       : root_(root), access_(access), queries_(queries), preferences_(preferences), log_(log) {}
 
+  bool takesKey(std::string_view key) override {
+    if (key.size() <= kLongestTallyKey) return true;
+    log_.error("A counter's key of %llu bytes is too long", key.size());
+    return false;
+  }
+
   bool setScalar(std::string_view key, std::int32_t day, std::int64_t value) override {
     return write(key, [&] { return writer_.setScalar(key, day, value); });
   }
@@ -106,10 +112,7 @@ int LinuxTallyLedger::begin() {
 
 bool LinuxTallyLedger::write(std::string_view key, const Work& work) {
   const std::lock_guard lock(mutex_);
-  if (key.size() > kLongestTallyKey) {
-    log_.error("A counter's key of %llu bytes is too long", key.size());
-    return false;
-  }
+  if (!takesKey(key)) return false;
   if (inTransaction_) return writeJoined(work);
   if (!mayWrite()) return false;
   for (const bool mayTryAgain : {true, false}) {

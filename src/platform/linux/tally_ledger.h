@@ -29,6 +29,9 @@ class TallyLedger {
  public:
   virtual ~TallyLedger() = default;
 
+  // Whether a key is short enough for the database; one error line when it is not.
+  [[nodiscard]] virtual bool takesKey(std::string_view key) = 0;
+
   // Each returns false after one error line when the database could not be written.
   [[nodiscard]] virtual bool setScalar(std::string_view key, std::int32_t day,
                                        std::int64_t value) = 0;

@@ -1,0 +1,320 @@
+#include "platform/linux/driver_files.h"
+
+#include <algorithm>
+#include <array>
+#include <cerrno>
+#include <cstring>
+#include <map>
+#include <optional>
+#include <string>
+#include <string_view>
+#include <utility>
+#include <variant>
+#include <vector>
+
+#include "values/byte_reader.h"
+#include "values/property_list.h"
+
+namespace quorlet {
+namespace {
+
+constexpr char kDirectory[] = "/var/db/drivers";
+constexpr std::size_t kMaxFiles = 4096;
+// Of all files together.
+constexpr std::size_t kMaxBytes = std::size_t{64} << 20;
+constexpr std::size_t kRecordBytes = 64;
+
+constexpr std::size_t kRequestBytes = 24;
+constexpr unsigned kSizeOnly = 1;
+
+// An integer as the 64 bits that drivers see: IDs may be written signed or unsigned.
+std::optional<std::uint64_t> Bits(const PropertyValue* value) {
+  const Number* number = value != nullptr ? value->asNumber() : nullptr;
+  if (number == nullptr || number->isReal()) return std::nullopt;
+  return number->kind() == NumberKind::kUInt64 ? number->toUInt64()
+                                               : static_cast<std::uint64_t>(number->toInt64());
+}
+std::optional<std::uint64_t> BitsEntry(const Dictionary& dictionary, std::string_view key) {
+  return Bits(dictionary.find(key));
+}
+
+KernelReturn StatusEntry(const Dictionary& dictionary, std::string_view key) {
+  return static_cast<KernelReturn>(BitsEntry(dictionary, key).value_or(kKernelSuccess));
+}
+
+std::string TextEntry(const Dictionary& dictionary, std::string_view key) {
+  const std::string* text = StringEntry(dictionary, key);
+  return text != nullptr ? *text : std::string();
+}
+
+std::span<const std::byte> BytesEntry(const Dictionary& dictionary, std::string_view key) {
+  const Data* data = DataEntry(dictionary, key);
+  return data != nullptr ? std::span<const std::byte>(*data) : std::span<const std::byte>();
+}
+
+// The driver cuts what is longer than the caller's buffer.
+void Answer(std::span<const std::byte> bytes, DriverCall& call) {
+  call.bytesWritten = std::min(bytes.size(), call.structOutput.size());
+  if (call.bytesWritten != 0) {
+    std::memcpy(call.structOutput.data(), bytes.data(), call.bytesWritten);
+  }
+}
+
+// Scalars are little-endian; the last one may be short.
+void AnswerScalars(std::span<const std::byte> bytes, DriverCall& call) {
+  while (!bytes.empty() && call.scalarsWritten < call.scalarOutput.size()) {
+    const std::size_t length = std::min<std::size_t>(bytes.size(), 8);
+    std::uint64_t scalar = 0;
+    for (std::size_t i = length; i-- > 0;) {
+      scalar = (scalar << 8) | std::to_integer<std::uint64_t>(bytes[i]);
+    }
+    call.scalarOutput[call.scalarsWritten++] = scalar;
+    bytes = bytes.subspan(length);
+  }
+}
+
+// Answers as the dictionary of the file says.
+class FileDriver : public EntryDriver {
+ public:
+  explicit FileDriver(Dictionary description) : description_(std::move(description)) {}
+
+  KernelReturn open(std::uint32_t) override { return StatusEntry(description_, "OpenStatus"); }
+  KernelReturn close() override { return StatusEntry(description_, "CloseStatus"); }
+
+  bool hasMethod(std::uint32_t method) const override {
+    return isExportMethod(method) || findMethod(method) != nullptr;
+  }
+
+  KernelReturn call(std::uint32_t method, DriverCall& call) override {
+    if (isExportMethod(method)) return callExport(call);
+    const Dictionary* answer = findMethod(method);
+    if (answer == nullptr) return kKernelUnsupported;
+    const KernelReturn status = StatusEntry(*answer, "Status");
+    if (status != kKernelSuccess) return status;
+    const auto output = BytesEntry(*answer, "Output");
+    Answer(output, call);
+    if (call.structOutput.empty()) AnswerScalars(output, call);
+    return kKernelSuccess;
+  }
+
+ private:
+  bool isExportMethod(std::uint32_t method) const {
+    const Array* methods = ArrayEntry(description_, "ExportMethods");
+    return methods != nullptr && std::any_of(methods->begin(), methods->end(),
+                                             [&](const auto& m) { return Bits(&m) == method; });
+  }
+
+  const Dictionary* findMethod(std::uint32_t method) const {
+    const Dictionary* methods = DictionaryEntry(description_, "Methods");
+    return methods != nullptr ? DictionaryEntry(*methods, std::to_string(method)) : nullptr;
+  }
+
+  const Dictionary* findExport(std::uint32_t selector, std::uint32_t listIndex) const {
+    const Array* exports = ArrayEntry(description_, "Exports");
+    if (exports == nullptr) return nullptr;
+    for (const PropertyValue& item : *exports) {
+      const Dictionary* candidate = item.asDictionary();
+      if (candidate != nullptr && BitsEntry(*candidate, "Selector") == selector &&
+          BitsEntry(*candidate, "ListIndex").value_or(0) == listIndex) {
+        return candidate;
+      }
+    }
+    return nullptr;
+  }
+
+  // The request: u32 selector, u16 flags (bit 0: the size only, bits 2 to 9: the list index), and
+  // 18 bytes that say nothing.
+  KernelReturn callExport(DriverCall& call) const {
+    ByteReader request(call.structInput);
+    const auto selector = request.little<std::uint32_t>();
+    const auto flags = request.little<std::uint16_t>();
+    if (call.structInput.size() != kRequestBytes) return kKernelBadArgument;
+    const Dictionary* found = findExport(selector, (flags >> 2) & 0xFFu);
+    if (found == nullptr) return kKernelNotFound;
+    const auto data = BytesEntry(*found, "Data");
+    if ((flags & kSizeOnly) == 0) {
+      const KernelReturn status = StatusEntry(*found, "FetchStatus");
+      if (status == kKernelSuccess) Answer(data, call);
+      return status;
+    }
+    const KernelReturn status = StatusEntry(*found, "SizeStatus");
+    if (status != kKernelSuccess) return status;
+    const auto size = static_cast<std::uint32_t>(BitsEntry(*found, "Size").value_or(data.size()));
+    std::array<std::byte, sizeof size> bytes;
+    for (std::size_t i = 0; i < bytes.size(); ++i) {
+      bytes[i] = static_cast<std::byte>((size >> (8 * i)) & 0xFF);
+    }
+    if (call.structOutput.size() < bytes.size()) return kKernelBadArgument;
+    Answer(bytes, call);
+    return kKernelSuccess;
+  }
+
+  const Dictionary description_;
+};
+
+struct DriverFile {
+  std::string text;
+  std::string problem;  // why there is no entry
+  std::optional<RegistryEntry> entry;
+  Dictionary description;
+};
+
+DriverFile ReadDescription(std::string text) {
+  DriverFile file;
+  file.text = std::move(text);
+  const auto document = ReadPropertyList(std::string_view(file.text));
+  if (const auto* error = std::get_if<PropertyListError>(&document)) {
+    file.problem = error->description;
+    return file;
+  }
+  const Dictionary* description = std::get<PropertyValue>(document).asDictionary();
+  if (description == nullptr) {
+    file.problem = "it holds no dictionary";
+    return file;
+  }
+  const auto id = BitsEntry(*description, "EntryID");
+  if (!id) {
+    file.problem = "it has no EntryID";
+    return file;
+  }
+  const Dictionary* properties = DictionaryEntry(*description, "Properties");
+  file.description = *description;
+  file.entry = RegistryEntry{.id = *id,
+                             .name = TextEntry(*description, "EntryName"),
+                             .className = TextEntry(*description, "ClassName"),
+                             .parentID = BitsEntry(*description, "ParentID"),
+                             .properties = properties != nullptr ? *properties : Dictionary(),
+                             .driver = std::make_shared<FileDriver>(*description),
+                             .standsInFor = {}};
+  return file;
+}
+
+class DriverFiles : public EntrySource {
+ public:
+  DriverFiles(const Root& root, SystemLog& log) : directory_(root.path(kDirectory)), log_(log) {}
+
+  std::vector<RegistryEntry> entries() override {
+    read();
+    std::vector<RegistryEntry> entries;
+    for (const auto& [name, file] : files_) {
+      if (file.entry) entries.push_back(*file.entry);
+    }
+    return entries;
+  }
+
+  std::string entrySet() override {
+    std::string set;
+    for (const std::string& name : names()) set.append(name).append("/");
+    return set;
+  }
+
+  void refreshElements() override { read(); }
+
+  std::span<const std::byte> elements(std::uint64_t driverID, std::uint64_t channelID) override {
+    const auto found = runs_.find({driverID, channelID});
+    return found != runs_.end() ? found->second : std::span<const std::byte>();
+  }
+
+ private:
+  std::vector<std::string> names() const {
+    std::vector<std::string> names = ListDirectory(directory_);
+    std::erase_if(names, [](const std::string& name) {
+      return name.starts_with('.') || !name.ends_with(".plist");
+    });
+    return names;
+  }
+
+  // Reads every file; those whose bytes are the same are not parsed again.
+  void read() {
+    std::map<std::string, DriverFile> files;
+    bool isSame = true;
+    std::size_t room = kMaxBytes;
+    for (const std::string& name : names()) {
+      if (files.size() == kMaxFiles) {
+        files[name].problem = "there are too many";
+        isSame = false;
+        break;
+      }
+      auto bytes = ReadWholeFile(JoinPath(directory_, name), std::min(room, kMaxPropertyListBytes));
+      if (const int* error = std::get_if<int>(&bytes)) {
+        if (*error == ENOENT) continue;  // it has just gone
+        files[name].problem = ErrnoText(*error);
+        isSame = false;
+        continue;
+      }
+      auto& text = std::get<std::string>(bytes);
+      room -= text.size();
+      const auto known = files_.find(name);
+      if (known != files_.end() && !known->second.text.empty() && known->second.text == text) {
+        files.insert(files_.extract(known));
+      } else {
+        files.emplace(name, ReadDescription(std::move(text)));
+        isSame = false;
+      }
+    }
+    // What was not taken over has gone.
+    if (isSame && files_.empty()) {
+      files_ = std::move(files);
+      return;
+    }
+    files_ = std::move(files);
+    dropDuplicates();
+    report();
+    indexRuns();
+  }
+
+  void dropDuplicates() {
+    std::map<std::uint64_t, std::string_view> owners;
+    for (auto& [name, file] : files_) {
+      if (!file.entry) continue;
+      const auto [owner, isFirst] = owners.try_emplace(file.entry->id, name);
+      if (isFirst) continue;
+      file.problem = FormatText("its EntryID is that of %@", owner->second);
+      file.entry.reset();
+      file.text.clear();  // it counts as soon as the other one has gone
+    }
+  }
+
+  void report() {
+    std::map<std::string, std::string> problems;
+    for (const auto& [name, file] : files_) {
+      if (file.problem.empty()) continue;
+      const auto reported = reported_.find(name);
+      if (reported == reported_.end() || reported->second != file.problem) {
+        log_.error("Skipped the driver file %@: %@", JoinPath(directory_, name), file.problem);
+      }
+      problems.emplace(name, file.problem);
+    }
+    reported_ = std::move(problems);
+  }
+
+  void indexRuns() {
+    runs_.clear();
+    for (const auto& [name, file] : files_) {
+      const Array* channels = file.entry ? ArrayEntry(file.description, "Channels") : nullptr;
+      if (channels == nullptr) continue;
+      for (const PropertyValue& item : *channels) {
+        const Dictionary* channel = item.asDictionary();
+        const auto id = channel != nullptr ? BitsEntry(*channel, "ChannelID") : std::nullopt;
+        if (!id) continue;
+        const auto bytes = BytesEntry(*channel, "Elements");
+        const auto records = bytes.first(bytes.size() - bytes.size() % kRecordBytes);
+        runs_.try_emplace({file.entry->id, *id}, records);
+      }
+    }
+  }
+
+  const std::string directory_;
+  SystemLog& log_;
+  std::map<std::string, DriverFile> files_;  // by name
+  std::map<std::string, std::string> reported_;
+  std::map<std::pair<std::uint64_t, std::uint64_t>, std::span<const std::byte>> runs_;
+};
+
+}  // namespace
+
+std::unique_ptr<EntrySource> MakeDriverFiles(const Root& root, SystemLog& log) {
+  return std::make_unique<DriverFiles>(root, log);
+}
+
+}  // namespace quorlet

@@ -1,0 +1,178 @@
+#include "platform/linux/nvme_source.h"
+
+#include <gtest/gtest.h>
+
+#include <map>
+
+#include "fakes/temp_root.h"
+#include "platform/linux/nvme_health_page.h"
+#include "platform/linux/nvme_statistics.h"
+#include "values/byte_reader.h"
+
+namespace quorlet {
+namespace {
+
+using Statistics = std::map<std::uint32_t, std::uint64_t>;
+
+Statistics Read(std::span<const std::byte> bytes) {
+  Statistics statistics;
+  ByteReader reader(bytes);
+  while (reader.remaining() != 0) {
+    const auto key = reader.little<std::uint32_t>();
+    EXPECT_EQ(reader.little<std::uint32_t>(), 1u);
+    EXPECT_TRUE(statistics.emplace(key, reader.little<std::uint64_t>()).second) << key;
+  }
+  EXPECT_TRUE(reader.ok());
+  return statistics;
+}
+
+// A page as a drive gives it, full of what is not read: 35 °C, 100 % spare, 3 % used.
+Data HealthPage() {
+  Data page(kNvmeHealthPageBytes, std::byte{0xEE});
+  const auto put = [&](std::size_t at, std::size_t width, std::uint64_t value) {
+    for (std::size_t i = 0; i < width; ++i) {
+      page[at + i] = static_cast<std::byte>(i < 8 ? value >> (8 * i) & 0xFF : 0);
+    }
+  };
+  put(0, 6, 0x03'0A'64'01'34'04);
+  const std::uint64_t counters[] = {18'446'744, 29'000'001, 512'000'000, 733'000'000, 1234,
+                                    815,        9001,       42,          7,           99};
+  for (std::size_t i = 0; i < std::size(counters); ++i) put(32 + 16 * i, 16, counters[i]);
+  return page;
+}
+const Statistics kOfPage = {{53, 0x20002},
+                            {36, 4},
+                            {7, 18'446'744 * 125ULL},
+                            {4, 3'625'000'125},
+                            {3, 512'000'000},
+                            {2, 733'000'000},
+                            {10, 815},
+                            {34, 9001},
+                            {11, 42},
+                            {172, 7}};
+
+TEST(NvmeStatistics, ThePageIsReadInItsUnits) {
+  NvmeFacts facts;
+  Data page = HealthPage();
+  facts.healthPage = page;
+  EXPECT_EQ(Read(*EncodeNvmeStatistics(facts)), kOfPage);
+  facts.usedBytes = 3 * 4096 + 4095;
+  facts.counters = {.discards = 5,
+                    .discardedSectors = 8 * 70 + 7,
+                    .discardMilliseconds = 6,
+                    .flushes = 8,
+                    .flushMilliseconds = 9};
+  Statistics all = kOfPage;
+  all.insert({{8, 3}, {37, 8}, {38, 5}, {39, 70}, {59, 9000}, {60, 6000}});
+  EXPECT_EQ(Read(*EncodeNvmeStatistics(facts)), all);
+
+  page[32 + 15] = std::byte{1};    // beyond 64 bits
+  page[48 + 7] = std::byte{0x80};  // beyond 64 bits once it is in sectors
+  const Statistics saturated = Read(*EncodeNvmeStatistics(facts));
+  EXPECT_EQ(saturated.at(7), UINT64_MAX);
+  EXPECT_EQ(saturated.at(4), UINT64_MAX);
+  for (const std::size_t size : {0u, 1u, 511u}) {
+    facts.healthPage = std::span(page).first(size);
+    EXPECT_FALSE(EncodeNvmeStatistics(facts)) << size;
+  }
+}
+
+// A machine with one controller and two namespaces, whose page comes from the test.
+struct NvmeSource : testing::Test {
+  NvmeSource() {
+    root.write("/dev/nvme0", "");
+    root.write("/sys/class/nvme/nvme0/model", "Example Drive 1T \n");
+    root.write("/sys/class/nvme/nvme0/serial", "SECRET");
+    root.write("/sys/block/nvme0n1/stat", kStat);
+    root.write("/sys/block/nvme0n2/stat", kStat);
+    root.write("/sys/block/nvme01n1/stat", kStat);
+    root.write("/sys/block/sda/stat", kStat);
+    for (const char* other : {"nvme1", "nvme00", "nvme", "nvme-fabrics", "nvme0x"}) {
+      root.write(std::string("/sys/class/nvme/") + other + "/model", "x");
+    }
+    root.write("/dev/nvme00", "");
+  }
+  // What a driver answers to an export request, as text when it fails.
+  std::string ask(EntryDriver& driver, std::uint8_t selector, std::uint8_t flags, Data& answer) {
+    Data request(24);
+    request[0] = std::byte{selector};
+    request[4] = std::byte{flags};
+    DriverCall call;
+    call.structInput = request;
+    call.structOutput = answer;
+    const KernelReturn status = driver.call(9, call);
+    answer.resize(call.bytesWritten);
+    return status == 0 ? "" : std::to_string(status);
+  }
+  Statistics statistics() {
+    const auto entries = source->entries();
+    EXPECT_EQ(entries.size(), 1u);
+    Data size(4), answer(4096);
+    if (!ask(*entries.at(0).driver, 13, 1, size).empty()) return {};
+    EXPECT_EQ(ask(*entries[0].driver, 13, 0, answer), "");
+    EXPECT_EQ(ByteReader(size).little<std::uint32_t>(), answer.size());
+    return Read(answer);
+  }
+
+  static constexpr char kStat[] = " 1 2 3 4 5 6 7 8 9 10 11 12 13 16 15 16 17\n";
+  TempRoot root;
+  int asked = 0;
+  std::optional<Data> page = HealthPage();
+  std::unique_ptr<EntrySource> source =
+      MakeNvmeSource(root.root(), [this](const std::string& device, auto limit) {
+        ++asked;
+        EXPECT_EQ(device, root.path("/dev/nvme0"));
+        EXPECT_EQ(limit, std::chrono::seconds(2));
+        return page;
+      });
+};
+
+TEST_F(NvmeSource, ADriveIsAskedOnceForItsStatistics) {
+  Statistics all = kOfPage;
+  all.insert({{37, 32}, {38, 24}, {39, 4}, {59, 34'000}, {60, 30'000}});
+  EXPECT_EQ(statistics(), all);
+  EXPECT_EQ(statistics(), all);
+  EXPECT_EQ(asked, 1);
+  const auto entries = source->entries();
+  EXPECT_EQ(entries[0].className, "NuvexEmbeddedNVMeController");
+  EXPECT_EQ(entries[0].properties,
+            (Dictionary{{"Controller Characteristics",
+                         Dictionary{{"model", "Example Drive 1T"}, {"num-bus", Int32(0)}}}}));
+  Data size(4), list(16), tooSmall(3);
+  EXPECT_EQ(ask(*entries[0].driver, 17, 1, size), "");
+  EXPECT_EQ(size, Data(4)) << "other exports are empty";
+  EXPECT_EQ(ask(*entries[0].driver, 15, 0, list), "");
+  EXPECT_EQ(list, Data());
+  EXPECT_NE(ask(*entries[0].driver, 13, 1, tooSmall), "");
+}
+
+TEST_F(NvmeSource, WhatOneNamespaceLacksHasNoTotal) {
+  for (const char* line :
+       {"", "1 2 3 4 5 6 7 8 9 10 11", "1 2 3 4 5 6 7 8 9 10 11 12 13 14 15 x 17",
+        "1 2 3 4 5 6 7 8 9 10 11 12 13 14 15 16 99999999999999999999"}) {
+    root.write("/sys/block/nvme0n2/stat", line);
+    source = MakeNvmeSource(root.root(), [this](auto&&...) { return page; });
+    EXPECT_EQ(statistics(), kOfPage) << line;
+  }
+  root.write("/sys/block/nvme0n1/nuse", "1000\n");
+  root.write("/sys/block/nvme0n1/queue/logical_block_size", "512\n");
+  root.write("/sys/block/nvme0n2/nuse", "9\n");
+  root.write("/sys/block/nvme0n2/queue/logical_block_size", "4096\n");
+  source = MakeNvmeSource(root.root(), [this](auto&&...) { return page; });
+  EXPECT_EQ(statistics().at(8), 134u);
+}
+
+TEST_F(NvmeSource, ADriveThatSleepsOrDoesNotAnswerHasNoStatistics) {
+  root.write("/sys/class/nvme/nvme0/device/power/runtime_status", "suspended\n");
+  EXPECT_EQ(statistics(), Statistics());
+  EXPECT_EQ(asked, 0);
+  root.write("/sys/class/nvme/nvme0/device/power/runtime_status", "active\n");
+  source = MakeNvmeSource(root.root(), [](auto&&...) { return Data(511); });
+  EXPECT_EQ(statistics(), Statistics());
+  // The file that stands for the device knows no such command.
+  source = MakeNvmeSource(root.root(), ReadNvmeHealthPage);
+  EXPECT_EQ(statistics(), Statistics());
+}
+
+}  // namespace
+}  // namespace quorlet
