@@ -5,6 +5,7 @@
 #include "collectors/ecc_events.h"
 #include "collectors/network_usage.h"
 #include "platform/run_step.h"
+#include "storage/daily_push.h"
 
 namespace quorlet {
 namespace {
@@ -15,8 +16,7 @@ std::int64_t Mebibytes(const Dictionary& usage, std::string_view entry) {
   return bytes ? *bytes >> 20 : -1;
 }
 
-void CollectDiskUsage(DeviceInfo& deviceInfo, CounterStore& counterStore) {
-  CounterBatch counters(counterStore);
+void CollectDiskUsage(DeviceInfo& deviceInfo, CounterBatch& counters) {
   const auto answer = deviceInfo.DQCopyAnswer("DiskUsage");
   const Dictionary* dictionary = answer ? answer->asDictionary() : nullptr;
   const Dictionary usage = dictionary != nullptr ? *dictionary : Dictionary();
@@ -24,16 +24,19 @@ void CollectDiskUsage(DeviceInfo& deviceInfo, CounterStore& counterStore) {
                                         Mebibytes(usage, "kDQQDiskUsageTotalDiskCapacity"));
   counters.TLClientSetValueForScalarKey("nuvex.tilehall.DiskUsageUserBlocksFree",
                                         Mebibytes(usage, "kDQQDiskUsageTotalDataAvailable"));
-  counters.commit();
 }
 
 }  // namespace
 
 void collectPlatformStatistics(Platform& platform) {
   SystemLog& log = platform.log;
-  RunStep(log, "disk usage", [&] { CollectDiskUsage(platform.deviceInfo, platform.counterStore); });
+  // Written at the end in one go: a pass that is killed before makes them anew.
+  CounterBatch counters(platform.counterStore);
+  RunStep(log, "disk usage", [&] { CollectDiskUsage(platform.deviceInfo, counters); });
+  RunStep(log, "storage", [&] { PushNANDInfoScalars(platform, counters); });
   RunStep(log, "ECC events", [&] { logECCEvents(platform); });
   RunStep(log, "network usage", [&] { collectDataUsage(platform); });
+  RunStep(log, "counters", [&] { counters.commit(); });
 }
 
 }  // namespace quorlet

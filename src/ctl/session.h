@@ -36,6 +36,7 @@ void AddPrefsCommands(CLI::App& app, Session& session);
 void AddReportCommands(CLI::App& app, Session& session);
 void AddLogsCommands(CLI::App& app, Session& session);
 void AddSendCommands(CLI::App& app, Session& session);
+void AddStorageCommands(CLI::App& app, Session& session);
 void AddWhitelistCommands(CLI::App& app, Session& session);
 
 }  // namespace quorlet

@@ -1,0 +1,202 @@
+// quorletctl storage: what the flash-storage controller tells.
+#include <CLI/CLI.hpp>
+#include <algorithm>
+#include <memory>
+#include <variant>
+
+#include "ctl/json_value.h"
+#include "ctl/options.h"
+#include "ctl/session.h"
+#include "storage/exporters.h"
+#include "storage/nand_info.h"
+#include "storage/snapshot.h"
+#include "storage/vm_freezer.h"
+
+namespace quorlet {
+namespace {
+
+constexpr std::size_t kSmallestTextBytes = std::size_t{1} << 20;
+constexpr std::size_t kLargestTextBytes = std::size_t{256} << 20;
+
+struct StorageArguments {
+  std::string file;
+  std::string header;
+  bool json = false;
+};
+
+// What the layers below say on standard error, kept until it is known whether the command failed.
+class KeptErrors final : public StandardError {
+ public:
+  void write(std::string_view text) override { text_ += text; }
+  // The first line, or `otherwise`.
+  std::string firstLineOr(std::string_view otherwise) const {
+    const std::string line = text_.substr(0, text_.find('\n'));
+    return line.empty() ? std::string(otherwise) : line;
+  }
+  bool empty() const { return text_.empty(); }
+
+ private:
+  std::string text_;
+};
+
+// The services of the root, with standard error kept apart.
+struct StorageServices {
+  explicit StorageServices(Session& session)
+      : linux(session.open(Access::kReadOnly)),
+        platform(linux->services().with({.standardError = &errors})) {}
+
+  KeptErrors errors;
+  std::unique_ptr<LinuxPlatform> linux;
+  Platform platform;
+};
+
+void PrintDictionary(Session& session, const Dictionary& dictionary, bool json) {
+  if (json) {
+    session.out.line(JsonText(dictionary, JsonForm::kPlain));
+    return;
+  }
+  for (const auto& [key, value] : dictionary) {
+    session.out.line(Escape(key) + "\t" + Escape(value.description()));
+  }
+}
+
+void PrintInfo(Session& session, const StorageArguments& arguments) {
+  StorageServices services(session);
+  const Dictionary info = CopyNANDInfo(services.platform);
+  if (info.contains(kNANDInfoErrorKey)) {
+    const std::string* message = StringEntry(info, kNANDInfoErrorMessageKey);
+    throw Failure(services.errors.firstLineOr(message != nullptr ? *message : "no information"));
+  }
+  PrintDictionary(session, info, arguments.json);
+}
+
+void PrintVMFreezer(Session& session, const StorageArguments& arguments) {
+  StorageServices services(session);
+  const Dictionary info = CopyVMFreezerNANDInfo(services.platform);
+  if (const std::string* message = StringEntry(info, kNANDInfoVMFreezerErrorMessageKey)) {
+    throw Failure(*message);
+  }
+  PrintDictionary(session, info, arguments.json);
+}
+
+void PrintAdvice(Session& session, const StorageArguments& arguments) {
+  StorageServices services(session);
+  const bool advice = NandRecommendsContentDeletion(services.platform);
+  if (!advice && !services.errors.empty()) throw Failure(services.errors.firstLineOr(""));
+  if (arguments.json) {
+    session.out.line(JsonText(Dictionary{{"recommendsContentDeletion", advice}}, JsonForm::kPlain));
+  } else {
+    session.out.line(advice ? "yes" : "no");
+  }
+}
+
+Data ReadExportFile(const std::string& path) {
+  const auto bytes = ReadWholeFile(path, kMaxExportBytes);
+  if (const int* error = std::get_if<int>(&bytes)) {
+    throw Failure("cannot read " + path + ": " + ErrnoText(*error));
+  }
+  const auto content = std::as_bytes(std::span(std::get<std::string>(bytes)));
+  return {content.begin(), content.end()};
+}
+
+// One export of the controller, or nothing when it has none.
+std::optional<Data> FetchExport(ExporterConnection& exporter, const SelectorPair* selectors) {
+  std::uint32_t size = 0;
+  if (selectors == nullptr || selectors->sizeQuery == kNoSelector ||
+      exporter.querySize(selectors, ExportFlags(false, 0), size) != kKernelSuccess || size == 0) {
+    return std::nullopt;
+  }
+  const auto buffer = ExportBuffer::Allocate(size);
+  std::size_t written = 0;
+  if (!buffer || exporter.fetch(selectors, ExportFlags(false, 0), buffer->bytes(), written) !=
+                     kKernelSuccess) {
+    return std::nullopt;
+  }
+  const auto content = buffer->bytes().first(std::min(written, buffer->bytes().size()));
+  return Data(content.begin(), content.end());
+}
+
+struct Snapshot {
+  Data records;
+  std::optional<Data> header;
+};
+
+Snapshot FetchSnapshot(Session& session) {
+  StorageServices services(session);
+  const StorageExporter* row = nullptr;
+  const RegistryHandle service = findNandExporter(services.platform.driverRegistry, row);
+  if (service == 0) throw Failure("there is no storage driver");
+  ExporterConnection exporter(services.platform, service, *row);
+  if (!exporter) throw Failure(services.errors.firstLineOr("the driver refuses a connection"));
+  auto records = FetchExport(exporter, row->getSnapshotSelectors());
+  if (!records) throw Failure("the driver has no snapshot");
+  return {*std::move(records), FetchExport(exporter, row->getSnapshotHeaderSelectors())};
+}
+
+// The text as long as it needs to be; renderers only tell that a buffer was too small for it.
+std::string Render(const Snapshot& snapshot) {
+  for (std::size_t size = kSmallestTextBytes; size <= kLargestTextBytes; size *= 4) {
+    std::string text(size, '\0');
+    const auto length = snapshot.header ? FSPParseSnapshotBufferWithInplaceParser(
+                                              snapshot.records, text, *snapshot.header)
+                                        : FSPParseSnapshotBuffer(snapshot.records, text);
+    if (!length) continue;
+    text.resize(*length);
+    return text;
+  }
+  throw Failure("the snapshot cannot be rendered");
+}
+
+void PrintSnapshot(Session& session, const StorageArguments& arguments) {
+  if (arguments.file.empty() && !arguments.header.empty()) {
+    throw Failure("--header needs --file");
+  }
+  Snapshot snapshot;
+  if (arguments.file.empty()) {
+    snapshot = FetchSnapshot(session);
+  } else {
+    snapshot.records = ReadExportFile(arguments.file);
+    if (!arguments.header.empty()) snapshot.header = ReadExportFile(arguments.header);
+  }
+  const std::string text = Render(snapshot);
+  if (arguments.json) {
+    session.out.line(JsonText(Dictionary{{"text", text}}, JsonForm::kPlain));
+    return;
+  }
+  // The legend and the formats are the device's: nothing of them controls a terminal.
+  for (std::string_view rest = text; !rest.empty();) {
+    const std::string_view line = rest.substr(0, rest.find('\n'));
+    session.out.line(Escape(line));
+    rest.remove_prefix(std::min(rest.size(), line.size() + 1));
+  }
+}
+
+}  // namespace
+
+void AddStorageCommands(CLI::App& app, Session& session) {
+  CLI::App* storage = AddFamily(app, "storage", "Flash storage", "quorletctl storage info");
+  const auto arguments = std::make_shared<StorageArguments>();
+  const auto add = [&](const std::string& name, const std::string& description,
+                       const std::string& notes, const std::string& example,
+                       void (*run)(Session&, const StorageArguments&)) {
+    CLI::App* command = AddCommand(*storage, name, description, notes, example);
+    AddJsonFlag(*command, arguments->json);
+    command->callback([&session, arguments, run] {
+      session.command = [&session, arguments, run] { run(session, *arguments); };
+    });
+    return command;
+  };
+  add("info", "Print the NAND dictionary", "One key and its value a line.",
+      "quorletctl storage info --json", PrintInfo);
+  CLI::App* snapshot = add("snapshot", "Print the controller's snapshot as text",
+                           "Without --file, the snapshot of the driver.",
+                           "quorletctl storage snapshot --file snapshot.bin", PrintSnapshot);
+  snapshot->add_option("--file", arguments->file, "Snapshot export to render");
+  snapshot->add_option("--header", arguments->header, "Snapshot header that describes the file");
+  add("vmfreezer", "Print how much the memory freezer has written", "",
+      "quorletctl storage vmfreezer", PrintVMFreezer);
+  add("advice", "Print whether the drive recommends deleting content", "\"yes\" or \"no\".",
+      "quorletctl storage advice", PrintAdvice);
+}
+
+}  // namespace quorlet

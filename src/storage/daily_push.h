@@ -1,0 +1,15 @@
+// The storage step of the daily pass.
+#ifndef QUORLET_STORAGE_DAILY_PUSH_H_
+#define QUORLET_STORAGE_DAILY_PUSH_H_
+
+#include "platform/platform.h"
+
+namespace quorlet {
+
+// Writes the storage structured log, then puts the counter of each number of the NAND information
+// dictionary into `counters`. When there is none, one line in the system log says so.
+void PushNANDInfoScalars(Platform& platform, CounterBatch& counters);
+
+}  // namespace quorlet
+
+#endif  // QUORLET_STORAGE_DAILY_PUSH_H_

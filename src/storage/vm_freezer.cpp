@@ -1,0 +1,136 @@
+// A snapshot is a sequence of items, little-endian: a 16-byte header, then the payload.
+//   0  u32  type
+//   4  u32  size of the payload
+//   8  u64  flags; a container's identifier, at its begin and at its end
+#include "storage/vm_freezer.h"
+
+#include <algorithm>
+#include <cstdint>
+
+#include "storage/nand_info.h"
+#include "values/byte_reader.h"
+
+namespace quorlet {
+namespace {
+
+enum ItemType : std::uint32_t {
+  kContainerBegin = 0x13,
+  kContainerEnd = 0x14,
+  kIOStatistics = 0x901,
+  kThreadName = 0x909,
+  kBufferEnd = 0xF19158ED,
+};
+
+constexpr char kFreezerThread[] = "VM_swapout";
+constexpr std::size_t kLongestThreadName = 64;
+constexpr std::size_t kBytesWrittenCounter = 3;
+// The kernel nests containers three deep.
+constexpr int kDeepestContainer = 64;
+
+struct SnapshotItem {
+  std::uint32_t type = 0;
+  std::uint64_t flags = 0;
+  std::span<const std::byte> payload;
+
+  bool isContainer() const { return type == kContainerBegin && payload.size() >= 4; }
+};
+
+// Visits the items of a snapshot up to the end of the buffer, or to an item that claims more than
+// the buffer holds.
+class ItemWalk {
+ public:
+  explicit ItemWalk(std::span<const std::byte> items) : reader_(items) {}
+
+  std::optional<SnapshotItem> next() {
+    SnapshotItem item;
+    item.type = reader_.little<std::uint32_t>();
+    const auto size = reader_.little<std::uint32_t>();
+    item.flags = reader_.little<std::uint64_t>();
+    item.payload = reader_.take(size);
+    if (!reader_.ok() || item.type == kBufferEnd) stop();
+    return stopped_ ? std::nullopt : std::optional(item);
+  }
+  // There are no items any more.
+  void stop() { stopped_ = true; }
+
+ private:
+  ByteReader reader_;
+  bool stopped_ = false;
+};
+
+// As far as the text in the item goes, which need not be terminated. An empty one names nothing.
+bool IsNamed(std::span<const std::byte> text, std::string_view name) {
+  const std::string_view stored(reinterpret_cast<const char*>(text.data()), text.size());
+  const std::string_view shown = stored.substr(0, kLongestThreadName);
+  const std::size_t end = shown.find('\0');
+  if (shown.empty()) return false;
+  return end != std::string_view::npos ? shown.substr(0, end) == name : name.starts_with(shown);
+}
+
+// Searches one container, whose begin the walk has just passed; the walk ends up behind it.
+bool getIOStatsWithThreadnameFromSnapItemsHelper(ItemWalk& walk, const SnapshotItem& container,
+                                                 int depth, std::string_view threadName,
+                                                 std::optional<IOStats>& ioStats) {
+  if (depth > kDeepestContainer) {
+    walk.stop();
+    return false;
+  }
+  std::optional<std::span<const std::byte>> name;
+  std::optional<IOStats> ownStats;
+  while (const auto item = walk.next()) {
+    if (item->isContainer()) {
+      if (getIOStatsWithThreadnameFromSnapItemsHelper(walk, *item, depth + 1, threadName,
+                                                      ioStats)) {
+        return true;
+      }
+    } else if (item->type == kContainerEnd && item->flags == container.flags) {
+      break;
+    } else if (item->type == kThreadName) {
+      name = item->payload;
+    } else if (item->type == kIOStatistics) {
+      ownStats = item->payload;
+    }
+  }
+  if (!name || !IsNamed(*name, threadName)) return false;
+  ioStats = ownStats;
+  return true;
+}
+
+std::uint64_t BytesWritten(IOStats ioStats) {
+  ByteReader reader(ioStats);
+  reader.skip(kBytesWrittenCounter * sizeof(std::uint64_t));
+  return reader.little<std::uint64_t>();
+}
+
+}  // namespace
+
+bool getIOStatsWithThreadnameFromSnapItems(std::span<const std::byte> items,
+                                           std::string_view threadName,
+                                           std::optional<IOStats>& ioStats) {
+  if (threadName.empty()) return false;
+  ItemWalk walk(items);
+  while (const auto item = walk.next()) {
+    if (item->isContainer() &&
+        getIOStatsWithThreadnameFromSnapItemsHelper(walk, *item, 1, threadName, ioStats)) {
+      return true;
+    }
+  }
+  return false;
+}
+
+Dictionary CopyVMFreezerNANDInfo(Platform& platform) {
+  Dictionary info;
+  const auto snapshot = platform.taskSnapshot.CaptureTaskSnapshot(kTaskSnapshotTaggedItems);
+  std::optional<IOStats> ioStats;
+  if (snapshot && getIOStatsWithThreadnameFromSnapItems(*snapshot, kFreezerThread, ioStats)) {
+    const std::uint64_t written = ioStats ? BytesWritten(*ioStats) : 0;
+    SetNumberValue(platform.standardError, info, kNANDInfoVMFreezerNumPhysicalWritesKey,
+                   static_cast<std::int64_t>(written));
+  } else {
+    info[kNANDInfoVMFreezerErrorKey] = "1";
+    info[kNANDInfoVMFreezerErrorMessageKey] = "Unable parse snapshot for VMFreezer NAND writes.";
+  }
+  return info;
+}
+
+}  // namespace quorlet
