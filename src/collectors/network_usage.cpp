@@ -91,8 +91,8 @@ std::size_t RowBytes(std::string_view name) {
 // Compares the records of one reply with the baseline.
 class UsageComparison {
  public:
-  UsageComparison(Dictionary baseline, std::int64_t yesterday, CounterBatch& counters)
-      : old_(std::move(baseline)), yesterday_(yesterday), counters_(counters) {}
+  UsageComparison(Dictionary baseline, std::int64_t yesterday)
+      : old_(std::move(baseline)), yesterday_(yesterday) {}
 
   // Rows and records are gone through together, in the order of the rows' names.
   void add(std::vector<UsageRecord> records) {
@@ -109,7 +109,7 @@ class UsageComparison {
     }
   }
 
-  const Dictionary& baseline() const { return new_; }
+  UsageGrowth take() { return {std::move(changes_), new_}; }
   // How many records were refused for their size.
   std::uint64_t leftOut() const { return leftOut_; }
 
@@ -163,31 +163,25 @@ class UsageComparison {
   }
 
   void addToKey(std::string_view kind, const UsageRecord& record, std::int64_t value) {
-    key_.assign("datausage.").append(kind).append(record.prefix).append(record.name);
-    counters_.TLClientAddValueForScalarKey(key_, value);
+    std::string key("datausage.");
+    key.append(kind).append(record.prefix).append(record.name);
+    changes_.push_back({ScalarChange::Kind::kAdd, std::move(key), value});
   }
 
   const Dictionary old_;
   const std::int64_t yesterday_;
-  CounterBatch& counters_;
+  std::vector<ScalarChange> changes_;
   Dictionary new_;
   std::size_t room_ = kBaselineBytes;
   std::uint64_t leftOut_ = 0;
-  std::string key_;
 };
 
-}  // namespace
-
-void processDataUsageReply(const Array& records, CounterStore& counterStore,
-                           Preferences& preferences, SystemLog& log) {
-  // A late reply may meet the one of the next pass, and both would add the same growth.
-  static std::mutex oneAtATime;
-  const std::lock_guard hold(oneAtATime);
+UsageGrowth CompareWithBaseline(const Array& records, CounterStore& counterStore,
+                                Preferences& preferences, SystemLog& log) {
   const std::int64_t yesterday = std::int64_t{counterStore.TLDaysSince1970()} - 1;
   const auto stored = preferences.DGWPreferencesGetValue(kBaseline, kDomain);
   const Dictionary* baseline = stored ? stored->asDictionary() : nullptr;
-  CounterBatch counters(counterStore);
-  UsageComparison comparison(baseline != nullptr ? *baseline : Dictionary(), yesterday, counters);
+  UsageComparison comparison(baseline != nullptr ? *baseline : Dictionary(), yesterday);
   std::vector<UsageRecord> complete;
   for (const PropertyValue& value : records) {
     const Dictionary* dictionary = value.asDictionary();
@@ -199,28 +193,54 @@ void processDataUsageReply(const Array& records, CounterStore& counterStore,
     log.error("Left out %llu network usage records whose names are too long or that are too many",
               comparison.leftOut());
   }
-  // The two stores cannot be changed at once. This way round, a run that is killed in between loses
-  // no traffic: the next one adds the same growth again.
-  // For the same reason the baseline stays when the counters could not be written.
-  if (!counters.commit()) return;
-  preferences.DGWPreferencesSetValue(kBaseline, comparison.baseline(), kDomain);
+  return comparison.take();
+}
+
+}  // namespace
+
+void storeBaseline(const Dictionary& baseline, Preferences& preferences) {
+  preferences.DGWPreferencesSetValue(kBaseline, baseline, kDomain);
   preferences.DGWPreferencesSynchronize(kDomain);
 }
 
-void collectDataUsage(Platform& platform) {
+void processDataUsageReply(const Array& records, CounterStore& counterStore,
+                           Preferences& preferences, SystemLog& log) {
+  const UsageGrowth growth = CompareWithBaseline(records, counterStore, preferences, log);
+  if (growth.changes.empty() || counterStore.writeScalars(growth.changes)) {
+    storeBaseline(growth.baseline, preferences);
+  }
+}
+
+std::optional<UsageGrowth> collectDataUsage(Platform& platform) {
   // Shared with the reply, which may come when nobody waits any more.
+  struct Waiting {
+    std::mutex mutex;
+    bool hasGivenUp = false;
+    std::optional<UsageGrowth> growth;
+  };
+  const auto waiting = std::make_shared<Waiting>();
   const std::shared_ptr<Semaphore> replied = platform.semaphores.create();
   platform.networkUsage.QueryProcessDataUsage(
       {}, UsageNameKind::kProcessName,
-      [replied, &counterStore = platform.counterStore, &preferences = platform.preferences,
+      [replied, waiting, &counterStore = platform.counterStore, &preferences = platform.preferences,
        &log = platform.log](const Array& records) {
-        RunStep(log, "network usage reply",
-                [&] { processDataUsageReply(records, counterStore, preferences, log); });
+        RunStep(log, "network usage reply", [&] {
+          const std::lock_guard hold(waiting->mutex);
+          if (waiting->hasGivenUp) {
+            processDataUsageReply(records, counterStore, preferences, log);
+          } else {
+            waiting->growth = CompareWithBaseline(records, counterStore, preferences, log);
+          }
+        });
         replied->signal();
       });
-  if (!replied->wait(kReplyLimit)) {
+  const bool isInTime = replied->wait(kReplyLimit);
+  const std::lock_guard hold(waiting->mutex);
+  if (!isInTime && !waiting->growth) {
     platform.log.log("Vigil timed out, no datausage available");
   }
+  waiting->hasGivenUp = true;
+  return std::move(waiting->growth);
 }
 
 }  // namespace quorlet

@@ -2,6 +2,9 @@
 #ifndef QUORLET_COLLECTORS_NETWORK_USAGE_H_
 #define QUORLET_COLLECTORS_NETWORK_USAGE_H_
 
+#include <optional>
+#include <vector>
+
 #include "platform/counter_store.h"
 #include "platform/platform.h"
 #include "platform/preferences.h"
@@ -10,11 +13,21 @@
 
 namespace quorlet {
 
+// What a reply of the network-usage service comes to.
+struct UsageGrowth {
+  std::vector<ScalarChange> changes;
+  Dictionary baseline;  // what the next reply is compared with, once the changes are written
+};
+
 // Asks the network-usage service for the counts of all processes and waits for its reply for at
-// most 10 seconds. A reply that comes later is processed all the same, beside whatever the caller
-// does by then; the log, the preferences, the clock and the counter store must be safe to use from
-// the service's thread.
-void collectDataUsage(Platform& platform);
+// most 10 seconds. What the reply comes to is the caller's to write: the changes, then, if that
+// went well, the baseline. A reply that comes later is processed in full all the same, beside
+// whatever the caller does by then; the log, the preferences, the clock and the counter store must
+// be safe to use from the service's thread.
+std::optional<UsageGrowth> collectDataUsage(Platform& platform);
+
+// Makes the baseline durable in place of the last one.
+void storeBaseline(const Dictionary& baseline, Preferences& preferences);
 
 // Adds, for each usage record (see platform/network_usage.h), what its counts have grown by since
 // the last reply to today's counters of its process, in KB:

@@ -1,6 +1,8 @@
 #include "collectors/platform_statistics.h"
 
 #include <cstdint>
+#include <optional>
+#include <utility>
 
 #include "collectors/ecc_events.h"
 #include "collectors/network_usage.h"
@@ -35,8 +37,14 @@ void collectPlatformStatistics(Platform& platform) {
   RunStep(log, "disk usage", [&] { CollectDiskUsage(platform.deviceInfo, counters); });
   RunStep(log, "storage", [&] { PushNANDInfoScalars(platform, counters); });
   RunStep(log, "ECC events", [&] { logECCEvents(platform); });
-  RunStep(log, "network usage", [&] { collectDataUsage(platform); });
-  RunStep(log, "counters", [&] { counters.commit(); });
+  std::optional<UsageGrowth> usage;
+  RunStep(log, "network usage", [&] { usage = collectDataUsage(platform); });
+  RunStep(log, "counters", [&] {
+    if (usage) counters.add(std::move(usage->changes));
+    // The two stores cannot be changed at once. This way round, a pass that is killed in between,
+    // or that cannot write its counters, loses no traffic: the next one adds the same growth again.
+    if (counters.commit() && usage) storeBaseline(usage->baseline, platform.preferences);
+  });
 }
 
 }  // namespace quorlet

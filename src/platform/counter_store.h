@@ -7,6 +7,7 @@
 
 #include <cstdint>
 #include <functional>
+#include <iterator>
 #include <memory>
 #include <span>
 #include <string>
@@ -130,6 +131,10 @@ class CounterBatch {
   }
   void TLClientAddValueForScalarKey(std::string_view key, std::int64_t value) {
     changes_.push_back({ScalarChange::Kind::kAdd, std::string(key), value});
+  }
+  void add(std::vector<ScalarChange> changes) {
+    changes_.insert(changes_.end(), std::make_move_iterator(changes.begin()),
+                    std::make_move_iterator(changes.end()));
   }
   // Writes what was collected; the batch is empty afterwards. False when none of it was written.
   bool commit() {

@@ -1,4 +1,4 @@
-#include "collectors/network_usage.h"
+#include "collectors/platform_statistics.h"
 
 #include <gtest/gtest.h>
 
@@ -36,9 +36,11 @@ struct NetworkUsageTest : testing::Test {
     }
     device.networkUsage.records = records;
     device.counterStore.scalars.clear();
-    collectDataUsage(device.services);
+    collectPlatformStatistics(device.services);
     Counters added;
-    for (auto& [row, value] : device.counterStore.scalars) added[row.first.substr(10)] = value;
+    for (auto& [row, value] : device.counterStore.scalars) {
+      if (row.first.starts_with("datausage.")) added[row.first.substr(10)] = value;
+    }
     return added;
   }
   void hasBaseline(const PropertyValue& value) {

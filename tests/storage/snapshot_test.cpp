@@ -44,9 +44,7 @@ TEST(Snapshot, FixedRecords) {
   EXPECT_TRUE(legend.ends_with("priority0/priority1/...\n\n\n"));
   Words two(126);
   std::iota(two.begin(), two.begin() + 63, 100);
-  two[0] = 7;
-  two[39] = 1234567;
-  two[52] = 4294967295;
+  two[0] = 7, two[39] = 1234567, two[52] = 4294967295;
   std::copy_n(two.begin(), 63, two.begin() + 63);
   const std::string line =
       "T=0007 E=126 HR= 127 HW= 128 NR= 129 NW= 130 TH=    1234.56 GC= 131 W=133 BI=136 BU=137 "

@@ -24,13 +24,11 @@ TEST(StatusLog, WholeLog) {
   // clang-format off
   const Dictionary values{
       {"UserWamp", Double(1.234)}, {"Single", Single(0.5F)}, {"nuvex.NumFlushes", Int64(42)},
-      {"Infinite", Double(INFINITY)},
-      {"ValidityList[2]", Array{Int32(3), "x", Double(5.5)}}, {"NoNumbers", Array{"3"}},
-      {"Text", "3"}, {"Boolean", true}};
+      {"Infinite", Double(INFINITY)}, {"ValidityList[2]", Array{Int32(3), "x", Double(5.5)}},
+      {"NoNumbers", Array{"3"}}, {"Text", "3"}, {"Boolean", true}};
   // clang-format on
   NLW_WriteLog(device.services, "165", &values);
-  ASSERT_EQ(device.diagnostics.logs.size(), 1U);
-  const SubmittedLog& log = device.diagnostics.logs[0];
+  const SubmittedLog& log = device.diagnostics.logs.at(0);
   EXPECT_EQ(log.typeCode + " " + log.name, "165 StorageStatus");
   EXPECT_EQ(log.body,
             "System ID: system-1\nHardware Model: Model 9\nOS Version: TestOS 1 (A1)\n"

@@ -105,7 +105,6 @@ TEST(StructuredLog, Failures) {
     std::size_t entries;
   } cases[] = {
       {[](auto& d) { d.controller().className = "x"; }, false, "for exporting classes\n", 0},
-      {[](auto& d) { d.controller().openStatus = 1; }, false, "connection to service\n", 0},
       {[](auto& d) { d.controller().properties = {}; }, false, "failed to create dictionary", 0},
       {[](auto& d) { d.failing = 17 << 10 | 5; }, true,
        "CallDriverStruct failed with status 0x2bc on selector index 2\n", 4},
