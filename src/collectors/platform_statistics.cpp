@@ -6,6 +6,7 @@
 
 #include "collectors/ecc_events.h"
 #include "collectors/network_usage.h"
+#include "collectors/reporting_channels.h"
 #include "platform/run_step.h"
 #include "storage/daily_push.h"
 
@@ -39,6 +40,8 @@ void collectPlatformStatistics(Platform& platform) {
   RunStep(log, "ECC events", [&] { logECCEvents(platform); });
   std::optional<UsageGrowth> usage;
   RunStep(log, "network usage", [&] { usage = collectDataUsage(platform); });
+  RunStep(log, "reporting channels",
+          [&] { collectReportingChannelMetrics(platform.driverRegistry, counters); });
   RunStep(log, "counters", [&] {
     if (usage) counters.add(std::move(usage->changes));
     // The two stores cannot be changed at once. This way round, a pass that is killed in between,

@@ -38,6 +38,7 @@ void AddCommands(CLI::App& app, Session& session) {
   AddReportCommands(app, session);
   AddLogsCommands(app, session);
   AddWhitelistCommands(app, session);
+  AddChannelsCommands(app, session);
   AddStorageCommands(app, session);
   AddSendCommands(app, session);
 }

@@ -31,6 +31,7 @@ struct Session {
 // Each adds one command family to the command line. Parsing sets `session.command`; the session
 // outlives the application.
 void AddInitCommand(CLI::App& app, Session& session);
+void AddChannelsCommands(CLI::App& app, Session& session);
 void AddTallyCommands(CLI::App& app, Session& session);
 void AddPrefsCommands(CLI::App& app, Session& session);
 void AddReportCommands(CLI::App& app, Session& session);

@@ -9,9 +9,9 @@ static_assert(std::ranges::adjacent_find(internal::kStatisticsKeysByName, {}, []
               }) == internal::kStatisticsKeysByName.end());
 static_assert(std::ranges::none_of(kStatisticsKeys, [](const StatisticsKey& key) {
   const std::size_t digits = key.name.size() - (key.name.find_last_not_of("0123456789") + 1);
-  const auto* array =
-      internal::FindStatisticsKeyByName(key.name.substr(0, key.name.size() - digits));
-  return digits != 0 && array != nullptr && array->cap > 1;
+  const auto array =
+      internal::FindStatisticsRowByName(key.name.substr(0, key.name.size() - digits));
+  return digits != 0 && array && kStatisticsKeys[*array].cap > 1;
 }));
 // Names are kept whole up to 98 characters.
 static_assert(std::ranges::all_of(kStatisticsKeys, [](const StatisticsKey& key) {

@@ -409,11 +409,12 @@ inline constexpr auto kStatisticsKeysByName = [] {
   return indexes;
 }();
 
-constexpr const StatisticsKey* FindStatisticsKeyByName(std::string_view name) {
+// The row, not a pointer to it: g++ with UBSan takes no null test of a pointer for a constant.
+constexpr std::optional<std::size_t> FindStatisticsRowByName(std::string_view name) {
   const auto nameOf = [](std::uint16_t i) { return kStatisticsKeys[i].name; };
   const auto found = std::ranges::lower_bound(kStatisticsKeysByName, name, {}, nameOf);
-  if (found == kStatisticsKeysByName.end() || nameOf(*found) != name) return nullptr;
-  return &kStatisticsKeys[*found];
+  if (found == kStatisticsKeysByName.end() || nameOf(*found) != name) return std::nullopt;
+  return *found;
 }
 
 }  // namespace internal
@@ -437,16 +438,17 @@ constexpr StatisticsSlot SlotOf(const StatisticsKey& key, std::size_t index) {
 
 // The slot of a counter name, or nothing when no key gives that name.
 constexpr std::optional<StatisticsSlot> FindStatisticsSlot(std::string_view name) {
-  if (const StatisticsKey* key = internal::FindStatisticsKeyByName(name)) return SlotOf(*key);
+  if (const auto row = internal::FindStatisticsRowByName(name)) return internal::kFirstSlot[*row];
   const std::size_t digits = name.size() - (name.find_last_not_of("0123456789") + 1);
   const std::string_view number = name.substr(name.size() - digits);
   if (digits == 0 || digits > 3 || (digits > 1 && number[0] == '0')) return std::nullopt;
   std::size_t index = 0;
   for (const char digit : number) index = index * 10 + static_cast<std::size_t>(digit - '0');
   name.remove_suffix(digits);
-  const StatisticsKey* key = internal::FindStatisticsKeyByName(name);
-  if (key == nullptr || key->cap == 1 || index >= key->cap) return std::nullopt;
-  return SlotOf(*key, index);
+  const auto row = internal::FindStatisticsRowByName(name);
+  if (!row) return std::nullopt;
+  const StatisticsKey& key = kStatisticsKeys[*row];
+  return key.cap != 1 && index < key.cap ? std::optional(SlotOf(key, index)) : std::nullopt;
 }
 
 // The slot of a counter name that is known to exist.

@@ -185,6 +185,9 @@ PropertyValue& Array::operator[](std::size_t index) { return (*elements_)[index]
 const PropertyValue& Array::operator[](std::size_t index) const { return (*elements_)[index]; }
 void Array::push_back(PropertyValue value) { elements_->push_back(std::move(value)); }
 void Array::reserve(std::size_t count) { elements_->reserve(count); }
+void Array::truncate(std::size_t count) {
+  elements_->erase(elements_->begin() + static_cast<std::ptrdiff_t>(count), elements_->end());
+}
 Array::Elements::const_iterator Array::begin() const { return elements_->cbegin(); }
 Array::Elements::const_iterator Array::end() const { return elements_->cend(); }
 

@@ -76,6 +76,8 @@ class Array {
   void push_back(PropertyValue value);
   // Makes room for `count` elements in all.
   void reserve(std::size_t count);
+  // Drops the elements from the one at `count` on; there must be so many.
+  void truncate(std::size_t count);
   Elements::const_iterator begin() const;
   Elements::const_iterator end() const;
 

@@ -7,6 +7,7 @@
 
 #include "platform/linux/counter_store.h"
 #include "platform/linux/driver_files.h"
+#include "platform/linux/live/live_source.h"
 #include "platform/linux/named_service.h"
 #include "platform/linux/network_usage.h"
 #include "platform/linux/nvme_health_page.h"
@@ -22,6 +23,7 @@ std::vector<std::unique_ptr<EntrySource>> EntrySources(const Root& root, SystemL
   std::vector<std::unique_ptr<EntrySource>> sources;
   sources.push_back(MakeDriverFiles(root, log));
   sources.push_back(MakeNvmeSource(root, ReadNvmeHealthPage));
+  sources.push_back(MakeLiveChannels(root));
   return sources;
 }
 

@@ -1,0 +1,112 @@
+#include "ctl/terminal.h"
+
+#include <signal.h>
+#include <sys/ioctl.h>
+#include <unistd.h>
+
+#include <algorithm>
+#include <cmath>
+#include <cstdlib>
+
+namespace quorlet {
+namespace {
+
+constexpr std::size_t kMostColumns = 1000;
+
+volatile sig_atomic_t g_isStopRequested = 0;
+
+void RequestStop(int) { g_isStopRequested = 1; }
+
+sigset_t StopSignals() {
+  sigset_t signals;
+  sigemptyset(&signals);
+  sigaddset(&signals, SIGINT);
+  sigaddset(&signals, SIGTERM);
+  return signals;
+}
+
+void HandleStopSignals(void (*handler)(int)) {
+  struct sigaction action = {};
+  action.sa_handler = handler;  // without SA_RESTART: a write that blocks ends, too
+  for (const int signal : {SIGINT, SIGTERM}) sigaction(signal, &action, nullptr);
+}
+
+bool IsContinuation(char c) { return (static_cast<unsigned char>(c) & 0xC0) == 0x80; }
+
+std::size_t Columns(std::string_view text) {
+  return text.size() - static_cast<std::size_t>(std::ranges::count_if(text, IsContinuation));
+}
+
+}  // namespace
+
+bool IsTerminal() {
+  const char* type = std::getenv("TERM");
+  return isatty(STDOUT_FILENO) == 1 && type != nullptr && *type != '\0' &&
+         std::string_view(type) != "dumb";
+}
+
+TerminalSize GetTerminalSize() {
+  TerminalSize size;
+  winsize window = {};
+  if (ioctl(STDOUT_FILENO, TIOCGWINSZ, &window) != 0) return size;
+  if (window.ws_col != 0) size.columns = std::min<std::size_t>(window.ws_col, kMostColumns);
+  if (window.ws_row != 0) size.rows = window.ws_row;
+  return size;
+}
+
+std::string_view FitColumns(std::string_view text, std::size_t columns) {
+  std::size_t end = 0;
+  while (end < text.size()) {
+    if (!IsContinuation(text[end]) && columns-- == 0) break;
+    ++end;
+  }
+  return text.substr(0, end);
+}
+
+std::string LeftAligned(std::string_view text, std::size_t columns) {
+  std::string aligned(FitColumns(text, columns));
+  return aligned.append(columns - Columns(aligned), ' ');
+}
+
+std::string RightAligned(std::string_view text, std::size_t columns) {
+  const std::string_view fit = FitColumns(text, columns);
+  return std::string(columns - Columns(fit), ' ').append(fit);
+}
+
+std::string Bar(double share, std::size_t width) {
+  const double filled = std::isfinite(share) ? std::clamp(share, 0.0, 1.0) : 0.0;
+  const auto marks = static_cast<std::size_t>(std::lround(filled * static_cast<double>(width)));
+  return "[" + std::string(marks, '#') + std::string(width - marks, '.') + "]";
+}
+
+Interruption::Interruption() {
+  g_isStopRequested = 0;
+  HandleStopSignals(RequestStop);
+}
+
+Interruption::~Interruption() { HandleStopSignals(SIG_DFL); }
+
+bool Interruption::isRequested() const { return g_isStopRequested != 0; }
+
+bool Interruption::waitUntil(std::chrono::steady_clock::time_point end) {
+  // Blocked from the question to the wait: a signal in between is not lost.
+  const sigset_t signals = StopSignals();
+  sigset_t before;
+  sigprocmask(SIG_BLOCK, &signals, &before);
+  bool isStopped = isRequested();
+  while (!isStopped) {
+    const auto left = end - std::chrono::steady_clock::now();
+    if (left <= left.zero()) break;
+    const auto seconds = std::chrono::floor<std::chrono::seconds>(left);
+    timespec timeout = {};
+    timeout.tv_sec = seconds.count();
+    timeout.tv_nsec = static_cast<long>(
+        std::chrono::duration_cast<std::chrono::nanoseconds>(left - seconds).count());
+    isStopped = sigtimedwait(&signals, nullptr, &timeout) > 0;
+  }
+  sigprocmask(SIG_SETMASK, &before, nullptr);
+  if (isStopped) g_isStopRequested = 1;
+  return !isStopped;
+}
+
+}  // namespace quorlet

@@ -1,0 +1,24 @@
+// The publishers of kernel data; docs/live-channels.md lists their channels. Each reads below the
+// root, and nothing before it is asked.
+#ifndef QUORLET_PLATFORM_LINUX_LIVE_PUBLISHERS_H_
+#define QUORLET_PLATFORM_LINUX_LIVE_PUBLISHERS_H_
+
+#include <memory>
+
+#include "platform/linux/files.h"
+#include "platform/linux/live/live_publisher.h"
+
+namespace quorlet {
+
+std::unique_ptr<LivePublisher> MakeCpuIdlePublisher(const Root& root);
+std::unique_ptr<LivePublisher> MakeCpuFrequencyPublisher(const Root& root);
+std::unique_ptr<LivePublisher> MakeBlockDevicesPublisher(const Root& root);
+std::unique_ptr<LivePublisher> MakeTemperaturesPublisher(const Root& root);
+std::unique_ptr<LivePublisher> MakeEnergyPublisher(const Root& root);
+std::unique_ptr<LivePublisher> MakePressurePublisher(const Root& root);
+std::unique_ptr<LivePublisher> MakeMemoryActivityPublisher(const Root& root);
+std::unique_ptr<LivePublisher> MakeRunQueuePublisher(const Root& root);
+
+}  // namespace quorlet
+
+#endif  // QUORLET_PLATFORM_LINUX_LIVE_PUBLISHERS_H_
