@@ -169,7 +169,7 @@ std::string Amount(double amount, std::string_view unit) {
 constexpr std::size_t kDetailWidth = 22;
 constexpr std::size_t kChangeWidth = 14;
 constexpr std::size_t kRateWidth = 14;
-constexpr std::size_t kNowWidth = 14;
+constexpr std::size_t kNowWidth = 16;
 constexpr std::size_t kSmallestTitleWidth = 12;
 
 std::string Row(std::size_t columns, std::string_view title, std::string_view detail,
@@ -207,7 +207,7 @@ std::vector<std::string> SimpleRow(Dictionary& sample, Dictionary& delta, double
   const std::int64_t change = DrvReportSimpleGetIntegerValue(delta);
   const std::string unit = Escape(TextOr(DrvReportChannelGetUnitLabel(sample), ""));
   const auto number = static_cast<double>(change);
-  const std::string suffix = unit == "B" || unit.empty() ? "" : " " + unit;
+  const std::string suffix = unit == "events" || unit.empty() ? "" : " " + unit;
   return {Row(columns, Escape(Title(sample)),
               Escape(TextOr(DrvReportChannelGetSubGroup(sample), "")),
               unit == "B" ? Amount(number, unit) : std::to_string(change) + suffix,

@@ -56,7 +56,8 @@ TEST(ValueAccessorsTest, BucketBounds) {
         {4, {{kLarge, 1, 2}}, {0xFFFFFFFF, 0xFFFFFFFE00000001}},
         {4, {{1LL << 31, 1, 3}}, {}},
         {4, {{1LL << 31, 0, 2}}, {}},
-        {0xFFFF, {{1, 0, kMany}}, {}},
+        {4, {{1, 0, kMany}}, {}},
+        {4, {{1, 1, 2}}, {}},
         {4, {}, {}}}) {
     Data config;
     for (const auto& [base, mode, buckets] : segments) {
