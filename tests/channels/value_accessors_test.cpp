@@ -54,9 +54,9 @@ TEST(ValueAccessorsTest, BucketBounds) {
        {std::tuple(4u, Segments{{10, 0, 3}}, Bounds{10, 20, 30}),
         {5, {{2, 7, 3}, {5, 0, kNegative}, {9, 0, 2}}, {2, 4, 8, 9, 18}},
         {4, {{kLarge, 1, 2}}, {0xFFFFFFFF, 0xFFFFFFFE00000001}},
-        {4, {{1LL << 31, 1, 3}}, {}},
+        {4, {{1LL << 31, 1, kMany}}, {}},
         {4, {{1LL << 31, 0, 2}}, {}},
-        {4, {{1, 0, kMany}}, {}},
+        {4, {{1, 0, 5}}, {}},
         {4, {{1, 1, 2}}, {}},
         {4, {}, {}}}) {
     Data config;

@@ -26,14 +26,16 @@ class EnergyPublisher : public LivePublisher {
     zones_.clear();
     LiveLegend legend;
     const std::string directory = root_.kernelPath(kZones);
+    std::map<std::string, int> names;
     for (const std::string& zoneName : ListDirectory(directory)) {
       const std::size_t controlEnd = zoneName.find(':');
       if (controlEnd == std::string::npos || zones_.size() == kMaxZones) continue;
-      const std::string name = fullName(directory, zoneName, controlEnd);
+      std::string name = fullName(directory, zoneName, controlEnd);
       const std::string control = CleanName(zoneName.substr(0, controlEnd));
       if (name.empty()) continue;
-      const Zone zone{HashedID(control + "\n" + name), JoinPath(directory, zoneName), name};
-      if (legend.typeOf(zone.id) != 0) continue;
+      const int number = ++names[JoinPath(control, name)];
+      if (number > 1) name.append(" #").append(std::to_string(number));
+      const Zone zone{HashedID(JoinPath(control, name)), JoinPath(directory, zoneName), name};
       legend.add({.group = "Energy", .subgroup = control, .unit = kMicrojoules},
                  {.id = zone.id, .name = name});
       zones_.push_back(zone);

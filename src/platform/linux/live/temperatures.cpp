@@ -87,9 +87,9 @@ class TemperaturesPublisher : public LivePublisher {
       if (!file.starts_with("temp") || !file.ends_with(kInput)) continue;
       const std::string sensor = file.substr(0, file.size() - kInput.size());
       if (!NumberBehind("temp", sensor)) continue;
-      const auto label = ReadKernelText(directory + "/" + sensor + "_label");
+      const auto label = ReadKernelText(JoinPath(directory, sensor) + "_label");
       const std::string shown = label && !label->empty() ? *label : sensor;
-      add(legend, stable, CleanName(*kind + " " + shown),
+      add(legend, stable, CleanName(*kind) + " " + CleanName(shown),
           {HashedID(sensor), directory, file, "name", *kind, link});
     }
   }
