@@ -98,7 +98,7 @@ const Data* getChannelConfig(const Dictionary& channel) {
 }
 
 const std::string* DrvReportChannelGetChannelName(Dictionary& channel) {
-  if (const std::string* name = StringEntry(channel, kChannelNameKey)) return name;
+  if (const PropertyValue* kept = channel.find(kChannelNameKey)) return kept->asString();
   const Array* legend = ArrayEntry(channel, kLegendChannelKey);
   const std::string* given =
       legend != nullptr && legend->size() > 2 ? (*legend)[2].asString() : nullptr;
@@ -151,7 +151,7 @@ void drvErrLog(std::uint32_t opts, const std::optional<std::string>& name,
   line += error ? error->reason : "<unknown> error";
   // The name is the driver's: it stays one line, and controls no terminal.
   std::ranges::replace_if(
-      line, [](char c) { return static_cast<unsigned char>(c) < 0x20 || c == 0x7F; }, '?');
+      line, [](char c) { return !IsPrintable(static_cast<unsigned char>(c)); }, '?');
   line += '\n';
   std::fwrite(line.data(), 1, line.size(), stderr);
 }

@@ -98,8 +98,9 @@ const std::string* DrvReportChannelGetChannelName(Dictionary& channel);
 // below, "DrvReportDrivers" and "DrvReportChannelGroups": dictionaries from names to aggregates
 // without options. The order of channels matters to samples and deltas, which keep it.
 //
-// A driver takes part when its entry has the property "DrvReportLegendPublic". Of a legend with a
-// fault, the channels before the fault count.
+// A driver takes part when its entry has the property "DrvReportLegendPublic". In a legend, what
+// comes after a group that is none is not read, nor what comes after an entry that is no array in
+// its group. An entry without an ID and a type word fails the driver.
 
 inline constexpr std::uint32_t kDrvReportByDriver = 1;  // files channels under their driver
 inline constexpr std::uint32_t kDrvReportByGroup = 2;   // and under their group and subgroup
@@ -177,7 +178,8 @@ inline constexpr int kDrvReportLeaveOut = 16;
 inline constexpr int kDrvReportWalkFailed = 0x111;
 
 int DrvReportIterate(const Dictionary& aggregate, const std::function<int(Dictionary&)>& visit);
-// Removes the channels for which `prune` gives 16, and drivers and groups that have none left.
+// Removes the channels for which `prune` gives 16, once all channels of their array are visited,
+// and drivers and groups that have none left.
 int DrvReportPrune(Dictionary& aggregate, const std::function<int(Dictionary&)>& prune);
 // The number of channels; -1 for a malformed aggregate.
 int DrvReportGetChannelCount(const Dictionary& aggregate);
@@ -188,9 +190,10 @@ int DrvReportGetChannelCount(const Dictionary& aggregate);
 // with its last reference; samples outlive it. The registry must outlive the subscription.
 class DrvReportSubscription;
 
-// Subscribes to the channels of an aggregate. `subscribed`, which becomes a copy of them, is what
-// DrvReportCreateSamples takes. `allocator` makes the object, nullptr is the default one; `options`
-// is not read. Without channels, or without a hub that takes the list, nothing.
+// Subscribes to the channels of an aggregate. `subscribed`, which becomes a copy of them (empty
+// when copying fails), is what DrvReportCreateSamples takes. `allocator` makes the object, nullptr
+// is the default one; `options` is not read. Without channels, or without a hub that takes the
+// list, nothing.
 std::shared_ptr<DrvReportSubscription> DrvReportCreateSubscription(
     DriverRegistry& registry, std::pmr::memory_resource* allocator, const Dictionary* desired,
     Dictionary* subscribed, std::uint64_t options, std::optional<ErrorValue>* error = nullptr);

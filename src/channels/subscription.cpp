@@ -1,6 +1,6 @@
 // Subscribing to channels at the hub, and cutting the memory that the hub fills into samples.
 #include <algorithm>
-#include <tuple>
+#include <new>
 #include <utility>
 #include <vector>
 
@@ -10,9 +10,9 @@
 
 namespace quorlet {
 
-class DrvReportSubscription {
+class [[gnu::visibility("hidden")]] DrvReportSubscription {
  public:
-  explicit DrvReportSubscription(DriverRegistry& registry) : registry_(registry) {}
+  explicit DrvReportSubscription(DriverRegistry & registry) : registry_(registry) {}
   DrvReportSubscription(const DrvReportSubscription&) = delete;
   DrvReportSubscription& operator=(const DrvReportSubscription&) = delete;
   ~DrvReportSubscription() {
@@ -28,7 +28,7 @@ class DrvReportSubscription {
 
  private:
   std::uint32_t memoryType() const { return static_cast<std::uint32_t>(token_); }
-  KernelReturn connect(RegistryHandle hub, std::optional<ErrorValue>* error);
+  KernelReturn connect(RegistryHandle hub, std::optional<ErrorValue> * error);
   KernelReturn configure(const Data& interests);
 
   DriverRegistry& registry_;
@@ -240,7 +240,13 @@ std::shared_ptr<DrvReportSubscription> DrvReportCreateSubscription(
   if (!interests) return fail(kKernelNoMemory, "createInterestList() failed");
   const std::pmr::polymorphic_allocator<DrvReportSubscription> memory(
       allocator != nullptr ? allocator : std::pmr::new_delete_resource());
-  auto subscription = std::allocate_shared<DrvReportSubscription>(memory, registry);
+  std::shared_ptr<DrvReportSubscription> subscription;
+  try {
+    subscription = std::allocate_shared<DrvReportSubscription>(memory, registry);
+  } catch (const std::bad_alloc&) {
+    storeErr(error, kKernelNoMemory);
+    return nullptr;
+  }
   if (!subscription->open(*interests, error)) return nullptr;
   *subscribed = cloneAggregate(*desired, [](const Dictionary&, Dictionary&) {
                   return 0;

@@ -2,6 +2,8 @@
 
 #include <algorithm>
 #include <array>
+#include <compare>
+#include <map>
 #include <string>
 #include <utility>
 #include <vector>
@@ -20,7 +22,7 @@ struct Identity {
   std::int64_t driverID = 0;
   std::int64_t channelID = 0;
   std::uint64_t type = 0;
-  bool operator==(const Identity&) const = default;
+  auto operator<=>(const Identity&) const = default;
 };
 
 std::optional<Identity> IdentityOf(const PropertyValue& value) {
@@ -48,14 +50,12 @@ class PartnerSearch {
     if (!wanted || !candidate) return false;
     std::size_t found = index;
     if (candidate != wanted) {
-      found = hint_.value_or(index + 1);
-      hint_ = found;
-      for (;; ++found) {
-        if (found >= partners_.size()) return true;
-        candidate = IdentityOf(partners_[found]);
-        if (!candidate) return false;
-        if (candidate == wanted) break;
-      }
+      const std::size_t start = hint_.value_or(index + 1);
+      hint_ = start;
+      if (!isIndexed_) buildIndex();
+      found = firstFrom(start, places_[*wanted]);
+      if (firstFrom(start, malformed_) < found) return false;
+      if (found == kNowhere) return true;
       hint_ = found + 1;
     }
     partner = partners_[found].asDictionary();
@@ -63,8 +63,28 @@ class PartnerSearch {
   }
 
  private:
+  using Places = std::vector<std::size_t>;  // in ascending order
+  static constexpr std::size_t kNowhere = SIZE_MAX;
+
+  static std::size_t firstFrom(std::size_t start, const Places& places) {
+    const auto found = std::ranges::lower_bound(places, start);
+    return found != places.end() ? *found : kNowhere;
+  }
+
+  void buildIndex() {
+    isIndexed_ = true;
+    for (std::size_t i = 0; i < partners_.size(); ++i) {
+      const auto identity = IdentityOf(partners_[i]);
+      (identity ? places_[*identity] : malformed_).push_back(i);
+    }
+  }
+
   const Array& partners_;
-  std::optional<std::size_t> hint_;
+  std::optional<std::size_t> hint_;  // where the next search begins
+  // So that many channels without a partner do not each go through all of them.
+  bool isIndexed_ = false;
+  std::map<Identity, Places> places_;
+  Places malformed_;
 };
 
 // The partner's records in the new channel's format, with every value invalid; false when it has
@@ -83,6 +103,21 @@ bool TakeInvalidRecords(const Dictionary& partner, Dictionary& newChannel) {
   }
   newChannel[kRawElementsKey] = std::move(records);
   return true;
+}
+
+// Removes the elements at the places, which ascend, in one go.
+void Remove(const std::vector<std::size_t>& places, Array& array) {
+  if (places.empty()) return;
+  std::size_t kept = places.front();
+  auto next = places.begin();
+  for (std::size_t i = kept; i < array.size(); ++i) {
+    if (next != places.end() && *next == i) {
+      ++next;
+    } else {
+      array[kept++] = std::move(array[i]);
+    }
+  }
+  array.truncate(kept);
 }
 
 class Walk {
@@ -128,23 +163,18 @@ class Walk {
     Array newChannels;
     const Array none;
     PartnerSearch search(partners != nullptr ? *partners : none);
-    std::size_t kept = 0;
+    std::vector<std::size_t> removed;
     int result = 0;
-    std::size_t i = 0;
-    for (; i < channels.size(); ++i) {
+    for (std::size_t i = 0; i < channels.size(); ++i) {
       const int one = visit(channels[i], i, search, newChannels);
       if ((one & kFailureBit) != 0) {
         result = one;
         break;
       }
       result |= one;
-      if (isPruning_ && one == kDrvReportLeaveOut) continue;
-      if (kept != i) channels[kept] = std::move(channels[i]);
-      ++kept;
+      if (isPruning_ && one == kDrvReportLeaveOut) removed.push_back(i);
     }
-    // What was not visited stays, after a failure.
-    for (; kept != i && i < channels.size(); ++i) channels[kept++] = std::move(channels[i]);
-    if (isPruning_ && kept < i) channels.truncate(kept);
+    Remove(removed, channels);
     if ((result & kFailureBit) != 0) return result;
     if (made) (*made)[kChannelsKey] = newChannels;
     if (isPruning_ && channels.empty()) aggregate.remove(kChannelsKey);

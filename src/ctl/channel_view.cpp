@@ -2,6 +2,7 @@
 
 #include <algorithm>
 #include <array>
+#include <cmath>
 #include <cstdio>
 #include <limits>
 #include <optional>
@@ -15,10 +16,11 @@ namespace {
 constexpr std::int32_t kValuesPerRecord = 4;
 constexpr std::size_t kRecordBytes = 64;
 
-std::string Hexadecimal(std::uint64_t number) {
-  std::array<char, 24> text{};
-  std::snprintf(text.data(), text.size(), "0x%llx", static_cast<unsigned long long>(number));
-  return text.data();
+// As the type word has it; 0 when there is none.
+std::int32_t ElementCount(const Dictionary& channel) {
+  const Array* legend = ArrayEntry(channel, "LegendChannel");
+  const Number* type = legend != nullptr && legend->size() > 1 ? (*legend)[1].asNumber() : nullptr;
+  return type != nullptr ? static_cast<std::int32_t>((type->toInt64() >> 32) & 0xFFFF) : 0;
 }
 
 std::string Decimals(double number, int count) {
@@ -51,13 +53,15 @@ std::vector<State> States(Dictionary& sample) {
   std::vector<State> states;
   std::uint64_t sum = 0;
   const int count = DrvReportStateGetCount(sample);
+  // All states have names or none has, and then each question would look for all of them again.
+  const bool haveNames = count > 0 && DrvReportStateGetNameForIndex(sample, 0) != nullptr;
   for (std::int32_t i = 0; i < count; ++i) {
     State state;
     state.id = DrvReportStateGetIDForIndex(sample, i);
     state.transitions = DrvReportStateGetInTransitions(sample, i);
     state.residency = DrvReportStateGetResidency(sample, i);
     if (state.id == kDrvReportInvalidValue && state.residency == kDrvReportInvalidValue) return {};
-    state.name = TextOr(DrvReportStateGetNameForIndex(sample, i),
+    state.name = TextOr(haveNames ? DrvReportStateGetNameForIndex(sample, i) : nullptr,
                         Hexadecimal(static_cast<std::uint64_t>(state.id)));
     sum += static_cast<std::uint64_t>(state.residency);
     states.push_back(std::move(state));
@@ -84,6 +88,10 @@ struct Bucket {
 std::vector<Bucket> Buckets(Dictionary& sample) {
   std::vector<Bucket> buckets;
   const int count = DrvReportHistogramGetBucketCount(sample);
+  std::int64_t bound = 0;
+  // Without the first one there are none, and each question would compute them again.
+  const bool haveBounds =
+      DrvReportHistogramGetBucketBounds(sample, 0, &bound, nullptr) == kKernelSuccess;
   for (std::int32_t i = 0; i < count; ++i) {
     Bucket bucket;
     bucket.hits = DrvReportHistogramGetBucketHits(sample, i);
@@ -91,13 +99,12 @@ std::vector<Bucket> Buckets(Dictionary& sample) {
     bucket.minimum = DrvReportHistogramGetBucketMinValue(sample, i);
     bucket.maximum = DrvReportHistogramGetBucketMaxValue(sample, i);
     bucket.sum = DrvReportHistogramGetBucketSum(sample, i);
-    std::int64_t bound = 0;
-    if (DrvReportHistogramGetBucketBounds(sample, i, &bound, nullptr) == kKernelSuccess) {
-      bucket.lower = bound;
-    }
-    if (DrvReportHistogramGetBucketBounds(sample, i, nullptr, &bound) == kKernelSuccess) {
-      bucket.upper = bound;
-    }
+    const auto has = [&](std::int64_t* lower, std::int64_t* upper) {
+      return haveBounds &&
+             DrvReportHistogramGetBucketBounds(sample, i, lower, upper) == kKernelSuccess;
+    };
+    if (has(&bound, nullptr)) bucket.lower = bound;
+    if (has(nullptr, &bound)) bucket.upper = bound;
     buckets.push_back(bucket);
   }
   return buckets;
@@ -115,11 +122,12 @@ std::int32_t ArrayValueCount(const Dictionary& sample) {
 Array DescribeStates(const std::vector<State>& states) {
   Array described;
   for (const State& state : states) {
-    described.push_back(Dictionary{{"name", state.name},
-                                   {"id", Hexadecimal(static_cast<std::uint64_t>(state.id))},
-                                   {"transitions", Int64(state.transitions)},
-                                   {"residency", Int64(state.residency)},
-                                   {"share", Double(state.share)}});
+    Dictionary item{{"name", state.name},
+                    {"id", Hexadecimal(static_cast<std::uint64_t>(state.id))},
+                    {"transitions", Int64(state.transitions)},
+                    {"residency", Int64(state.residency)}};
+    if (!std::isnan(state.share)) item["share"] = Double(state.share);
+    described.push_back(item);
   }
   return described;
 }
@@ -237,7 +245,8 @@ Dictionary DescribeChannel(Dictionary& channel) {
       {"driver_id", Hexadecimal(static_cast<std::uint64_t>(DrvReportChannelGetDriverID(channel)))},
       {"id", Hexadecimal(static_cast<std::uint64_t>(DrvReportChannelGetChannelID(channel)))},
       {"format", FormatName(DrvReportChannelGetFormat(channel))},
-      {"categories", Int32(DrvReportChannelGetCategories(channel))}};
+      {"categories", Int32(DrvReportChannelGetCategories(channel))},
+      {"elements", Int32(ElementCount(channel))}};
   const std::uint64_t unit = DrvReportChannelGetUnit(channel);
   if (unit != static_cast<std::uint64_t>(kDrvReportInvalidValue)) {
     described["unit"] = Hexadecimal(unit);

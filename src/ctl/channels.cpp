@@ -54,13 +54,16 @@ using Arguments = std::shared_ptr<ChannelsArguments>;
 
 [[noreturn]] void Fail(std::string_view what, const std::optional<ErrorValue>& error) {
   std::string text(what);
-  if (error) text += ": " + error->reason;
+  if (error) {
+    text +=
+        ": " + error->reason + " (" + Hexadecimal(static_cast<std::uint32_t>(error->code)) + ")";
+  }
   throw Failure(text);
 }
 
 Dictionary Select(DriverRegistry& registry, const Selection& selection) {
   std::optional<ErrorValue> error;
-  auto channels = DrvReportCopyAllChannels(registry, 0, &error);
+  auto channels = DrvReportCopyAllChannels(registry, kDrvReportLogFailures, &error);
   if (!channels) Fail("cannot look for channels", error);
   const int pruned = DrvReportPrune(*channels, [&](const Dictionary& channel) {
     return selection.matches(channel) ? 0 : kDrvReportLeaveOut;

@@ -1,6 +1,8 @@
 #include "ctl/output.h"
 
+#include <array>
 #include <cerrno>
+#include <charconv>
 #include <cstdio>
 
 #include "values/text.h"
@@ -121,6 +123,12 @@ std::optional<std::string> Unescape(std::string_view text) {
     }
   }
   return bytes;
+}
+
+std::string Hexadecimal(std::uint64_t number) {
+  std::array<char, 16> digits{};
+  const auto [end, error] = std::to_chars(digits.begin(), digits.end(), number, 16);
+  return "0x" + std::string(digits.begin(), end);
 }
 
 std::string Counted(std::size_t count, std::string_view noun) {

@@ -2,6 +2,7 @@
 #ifndef QUORLET_CTL_OUTPUT_H_
 #define QUORLET_CTL_OUTPUT_H_
 
+#include <cstdint>
 #include <optional>
 #include <string>
 #include <string_view>
@@ -32,6 +33,9 @@ std::string Escape(std::string_view text);
 
 // The bytes that Escape was given, or nothing when a backslash starts none of its forms.
 std::optional<std::string> Unescape(std::string_view text);
+
+// "0x1f"
+std::string Hexadecimal(std::uint64_t number);
 
 // "1 key", "2 keys"
 std::string Counted(std::size_t count, std::string_view noun);

@@ -88,6 +88,11 @@ TEST(Walk, PruningRemovesChannelsAndWhatTheyLeaveEmpty) {
     for (const auto& [key, value] : tree) found.push_back(key);
     EXPECT_EQ(found, keys) << removed;
   }
+  // A callback may look at what it narrows, and may throw.
+  Dictionary watched = Tree();
+  DrvReportPrune(watched,
+                 [&](Dictionary&) { return DrvReportGetChannelCount(watched) > 0 ? 16 : 0; });
+  EXPECT_EQ(DrvReportGetChannelCount(watched), 0);
   Dictionary failing = Level({Channel("a"), Channel("b"), Channel("c")});
   int calls = 0;
   EXPECT_EQ(DrvReportPrune(failing, [&](Dictionary&) { return ++calls == 1 ? 16 : 5; }), 5);
@@ -144,6 +149,7 @@ TEST(Walk, ComparingPairsChannelsByTheirIDs) {
   EXPECT_EQ(Compared(Samples({1, 9, 2, 3}), Samples({1, 2, 3})), "1/1 2/2 3/3 = 1 2 3");
   EXPECT_EQ(Compared(Samples({1, 3}), Samples({1, 2, 3})), "1/1 = 1 2 3") << "plain copies";
   EXPECT_EQ(Compared(Samples({2, 1, 4}), Samples({1, 2})), "1/1 = 1 2") << "looked for forwards";
+  EXPECT_EQ(Compared(Samples({9, 8, 1, 1, 3}), Samples({1, 1, 3})), "1/1 1/1 3/3 = 1 1 3");
   EXPECT_EQ(Compared(Samples({}), Samples({1})), "= 1");
   EXPECT_EQ(Compared(Dictionary(), Samples({1})), std::nullopt);
   EXPECT_EQ(Compared(Samples({1}), Level({Channel("a")})), "= 1") << "another driver";

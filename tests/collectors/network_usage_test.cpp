@@ -1,9 +1,8 @@
-#include "collectors/platform_statistics.h"
-
 #include <gtest/gtest.h>
 
 #include <cmath>
 
+#include "collectors/platform_statistics.h"
 #include "fakes/fake_platform.h"
 #include "values/property_list.h"
 

@@ -340,9 +340,10 @@ TEST_F(ReportHub, EveryUpdateLaysOutWhatTheFilesSayNow) {
   device.source->runs.clear();
   ASSERT_EQ(update(), 0u);
   EXPECT_EQ(Values(memory), IDs{}) << "nothing of before survives";
-  report({{10, RunOf(10, 2, 3, 102)}});
+  report({{10, RunOf(10, 2, 3, 102)}, {20, RunOf(20, 2, 1, 202)}});
+  device.source->runs[40] = RunOf(40, 1, 0, 402);
   ASSERT_EQ(update(), 0u);
-  EXPECT_EQ(Values(memory), (IDs{102, 0})) << "what claims too much reaches beyond the end";
+  EXPECT_EQ(Values(memory), IDs{202}) << "neither what claims too much nor what claims nothing";
   EXPECT_EQ(device.registry->CloseDriverConnection(connection), 0u);
 }
 

@@ -173,7 +173,8 @@ DriverFile ReadDescription(std::string text) {
     return file;
   }
   const auto id = BitsEntry(*description, "EntryID");
-  if (!id) {
+  // The invalid value is the ID of nothing: a channel with it could not be asked for.
+  if (!id || *id == std::uint64_t{1} << 63) {
     file.problem = "it has no EntryID";
     return file;
   }

@@ -14,6 +14,7 @@ namespace {
 enum Method : std::uint32_t { kOpen = 0, kConfigureInterests = 2, kUpdateKernelBuffer = 3 };
 
 constexpr std::size_t kRecordBytes = 64;
+constexpr std::size_t kTypeOffset = 16;  // of the type word in a record
 constexpr std::size_t kMaxMemoryBytes = std::size_t{64} << 20;
 constexpr std::size_t kMaxInterests = kMaxMemoryBytes / kRecordBytes;
 constexpr std::size_t kMaxSubscriptions = 16;
@@ -38,6 +39,8 @@ struct Subscription {
   std::size_t runsStart = 0;  // where in `memory` the channels' runs start
 };
 
+std::size_t ElementCount(std::uint64_t typeWord) { return (typeWord >> 32) & 0xFFFF; }
+
 std::optional<std::vector<Interest>> ReadInterests(std::span<const std::byte> list) {
   ByteReader reader(list);
   const auto count = reader.little<std::uint32_t>();
@@ -50,7 +53,7 @@ std::optional<std::vector<Interest>> ReadInterests(std::span<const std::byte> li
   for (Interest& interest : interests) {
     interest.driverID = reader.little<std::uint64_t>();
     interest.channelID = reader.little<std::uint64_t>();
-    interest.records = (reader.little<std::uint64_t>() >> 32) & 0xFFFF;
+    interest.records = ElementCount(reader.little<std::uint64_t>());
   }
   return interests;
 }
@@ -158,11 +161,16 @@ class ReportHub : public EntryDriver {
     for (EntrySource* source : sources_) source->refreshElements();
   }
 
-  // The channel's whole records.
+  // The channel's records, as many as the first one says. A run that says that there are none, or
+  // more than there are, would cost whoever goes from run to run the others: it is not reported.
   std::span<const std::byte> run(const Interest& interest) const {
     for (EntrySource* source : sources_) {
       const auto bytes = source->elements(interest.driverID, interest.channelID);
-      if (bytes.size() >= kRecordBytes) return bytes.first(bytes.size() - bytes.size() % 64);
+      if (bytes.size() < kRecordBytes) continue;
+      ByteReader reader(bytes);
+      reader.skip(kTypeOffset);
+      const std::size_t size = ElementCount(reader.little<std::uint64_t>()) * kRecordBytes;
+      return size <= bytes.size() ? bytes.first(size) : std::span<const std::byte>();
     }
     return {};
   }
@@ -176,7 +184,9 @@ class ReportHub : public EntryDriver {
     for (const Interest& interest : interests) {
       const std::size_t bytes = run(interest).size();
       add(bytes, now);
-      add(std::max(bytes, interest.records * kRecordBytes), later);
+      // A channel whose size nobody knows yet has room for one record.
+      const std::size_t records = std::max<std::size_t>(interest.records, 1);
+      add(std::max(bytes, records * kRecordBytes), later);
     }
     return std::max(now, later);
   }

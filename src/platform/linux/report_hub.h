@@ -8,8 +8,8 @@
 // The memory is a sequence of runs of 64-byte records in the order of the list, without the
 // channels that nobody reports. Its size is fixed when it is mapped, with room for as many records
 // as the type words announce; the runs stand at its end. The room before them is taken by runs that
-// belong to no channel, so that whoever goes from run to run sees nothing else, and a run that
-// claims more records than it has reaches beyond the end.
+// belong to no channel, so that whoever goes from run to run sees nothing else. A channel whose run
+// claims no records, or more than it has, counts as one that nobody reports.
 #ifndef QUORLET_PLATFORM_LINUX_REPORT_HUB_H_
 #define QUORLET_PLATFORM_LINUX_REPORT_HUB_H_
 

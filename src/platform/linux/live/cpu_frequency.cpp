@@ -44,6 +44,9 @@ std::vector<Frequency> ParseTimes(std::string_view text) {
     const auto kilohertz = words.size() == 2 ? ParseCounter(words[0]) : std::nullopt;
     const auto ticks = words.size() == 2 ? ParseCounter(words[1]) : std::nullopt;
     if (!kilohertz || !ticks || *ticks > INT64_MAX / kTickMilliseconds) return {};
+    const bool isTwice =
+        std::ranges::find(frequencies, *kilohertz, &Frequency::kilohertz) != frequencies.end();
+    if (isTwice) return {};
     frequencies.push_back({*kilohertz, *ticks * kTickMilliseconds, 0});
   }
   return frequencies;

@@ -67,7 +67,10 @@ class CpuIdlePublisher : public LivePublisher {
     LiveLegend legend;
     cpus_.clear();
     const std::string cpus = root_.kernelPath(kCpus);
-    hasActivity_ = access(root_.kernelPath(kActivity).c_str(), R_OK) == 0;
+    // Idle times of a recorded machine say nothing about this one's activity, nor the other way.
+    const bool isOneMachine = (root_.kernelPath(kCpus) == root_.path(kCpus)) ==
+                              (root_.kernelPath(kActivity) == root_.path(kActivity));
+    hasActivity_ = isOneMachine && access(root_.kernelPath(kActivity).c_str(), R_OK) == 0;
     for (const auto& [number, name] : NumberedNames(cpus, "cpu")) {
       Cpu cpu{number, PackedID("CPU" + std::to_string(number)), {}};
       const std::string directory = JoinPath(cpus, name) + "/cpuidle";
