@@ -21,8 +21,8 @@ class Preferences {
                                                               std::string_view domain) = 0;
 
   // Stores `value`, or removes the key when there is none. Its containers are shared with the store
-  // from then on: do not change them. Every later read in this process sees it at once; it becomes durable when the domain is synchronized, at the latest when the process
-  // ends normally.
+  // from then on: do not change them. Every later read in this process sees it at once; it becomes
+  // durable when the domain is synchronized, at the latest when the process ends normally.
   virtual void DGWPreferencesSetValue(std::string_view key, std::optional<PropertyValue> value,
                                       std::string_view domain) = 0;
 

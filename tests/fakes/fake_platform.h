@@ -230,38 +230,18 @@ class FakePassLock : public PassLock {
   bool held = false;
 };
 
-// Delivers scripted messages, one a slice, each on a connection of its own.
+// Nobody ever calls.
 class FakeNamedService : public NamedService {
  public:
-  bool ListenNamedService(std::string_view name, ListenerHandler handler) override {
-    if (!canListen) return false;
-    listeningAs = name;
-    listener_ = std::move(handler);
-    return true;
-  }
-  void AcceptPeerConnection(Peer&, MessageHandler handler) override {
-    messages_ = std::move(handler);
-  }
+  bool ListenNamedService(std::string_view, ListenerHandler) override { return canListen; }
+  void AcceptPeerConnection(Peer&, MessageHandler) override {}
   MainLoopResult RunMainLoop(double seconds, bool) override {
     sliceSeconds.push_back(seconds);
-    if (!listener_ || arriving.empty()) return MainLoopResult::kTimedOut;
-    listener_({});
-    Peer peer;
-    listener_({&peer});
-    const PropertyValue message = arriving.front();
-    arriving.erase(arriving.begin());
-    messages_(message);
-    return MainLoopResult::kHandledEvent;
+    return MainLoopResult::kTimedOut;
   }
 
   bool canListen = true;
-  std::string listeningAs;
-  std::vector<PropertyValue> arriving;
   std::vector<double> sliceSeconds;
-
- private:
-  ListenerHandler listener_;
-  MessageHandler messages_;
 };
 
 class FakeNotifications : public Notifications {

@@ -71,16 +71,6 @@ TEST(Exporters, RequestsAndRows) {
   const RegistryHandle service = findNandExporter(device.driverRegistry, row);
   EXPECT_EQ(row->characteristicsKey, "Device Characteristics");
   device.driverRegistry.ReleaseHandle(service);
-  std::vector<std::uint32_t> selectors;
-  for (const auto getter :
-       {row->getStatsSelectors, row->getBandStatsSelectors, row->getDefectsListSelectors,
-        row->getTelemetryListSelectors, row->getTaskSchedulerSelectors, row->getSnapshotSelectors,
-        row->getSnapshotHeaderSelectors}) {
-    selectors.push_back(getter()->sizeQuery);
-    EXPECT_EQ(getter()->fetch, getter()->sizeQuery);
-  }
-  EXPECT_EQ(selectors, (std::vector<std::uint32_t>{13, 11, 15, 17, 39, 22, 145}));
-
   auto buffer = ExportBuffer::Allocate(5000);
   EXPECT_EQ(reinterpret_cast<std::uintptr_t>(buffer->bytes().data()) % 4096, 0U);
   EXPECT_EQ(std::ranges::count(buffer->bytes(), std::byte{0}), 5000);
