@@ -10,9 +10,9 @@
 
 namespace quorlet {
 
-class [[gnu::visibility("hidden")]] DrvReportSubscription {
+class DrvReportSubscription {
  public:
-  explicit DrvReportSubscription(DriverRegistry & registry) : registry_(registry) {}
+  explicit DrvReportSubscription(DriverRegistry& registry) : registry_(registry) {}
   DrvReportSubscription(const DrvReportSubscription&) = delete;
   DrvReportSubscription& operator=(const DrvReportSubscription&) = delete;
   ~DrvReportSubscription() {
@@ -28,7 +28,7 @@ class [[gnu::visibility("hidden")]] DrvReportSubscription {
 
  private:
   std::uint32_t memoryType() const { return static_cast<std::uint32_t>(token_); }
-  KernelReturn connect(RegistryHandle hub, std::optional<ErrorValue> * error);
+  KernelReturn connect(RegistryHandle hub, std::optional<ErrorValue>* error);
   KernelReturn configure(const Data& interests);
 
   DriverRegistry& registry_;

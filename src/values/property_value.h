@@ -66,6 +66,8 @@ class Array {
   using Elements = std::vector<PropertyValue>;
 
   Array();
+  // An array around a single array is Array{PropertyValue(inner)}: compilers read Array{inner}
+  // either as that or as a copy of `inner`.
   Array(std::initializer_list<PropertyValue> elements);
 
   std::size_t size() const;

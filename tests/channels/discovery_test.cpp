@@ -86,9 +86,9 @@ TEST_F(Discovery, ALegendCountsUpToItsFault) {
       {Array{good, Group(nullptr, "S", Array{Legend(9)}), next}, "1 "},
       {Array{good, Group("G", nullptr, "x"), next}, "1 "},
       {Array{Group("G", nullptr, Array{Legend(1), "x", Legend(9)}), next}, "1 2 "},
-      {Array{good, Group("G", nullptr, Array{Array{Int64(1)}}), next}, ""},
+      {Array{good, Group("G", nullptr, Array{PropertyValue(Array{Int64(1)})}), next}, ""},
       {Array{Group("G", nullptr, Array{Legend(INT64_MIN)})}, ""},
-      {Array{Group("G", nullptr, Array{Array{"x", Int64(1)}})}, ""},
+      {Array{Group("G", nullptr, Array{PropertyValue(Array{"x", Int64(1)})})}, ""},
       {"x", ""},
       {Array(), ""}};
   for (const auto& [legend, channels] : cases) {

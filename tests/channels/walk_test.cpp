@@ -76,11 +76,12 @@ TEST(Walk, PruningRemovesChannelsAndWhatTheyLeaveEmpty) {
       {"abf", {"c", "e"}, {"DrvReportChannelGroups", "DrvReportDrivers", "QueryOpts"}, 16},
       {"abcef", {}, {"QueryOpts"}, 16}};
   for (const auto& [removed, left, keys, result] : cases) {
+    const std::string& unwanted = removed;  // clang 14 cannot capture parts of a tuple
     Dictionary tree = Tree();
     EXPECT_EQ(DrvReportPrune(tree,
                              [&](Dictionary& channel) {
                                const auto& name = *DrvReportChannelGetChannelName(channel);
-                               return removed.find(name) != removed.npos ? 16 : 0;
+                               return unwanted.find(name) != unwanted.npos ? 16 : 0;
                              }),
               result);
     EXPECT_EQ(Visited(tree), left) << removed;

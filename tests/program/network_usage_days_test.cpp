@@ -26,10 +26,9 @@ struct NetworkUsageDays : testing::Test, ProgramDevice {
   // One pass at noon of a day; the counters of network usage that the day then has.
   std::vector<std::string> pass(int day, const std::string& records) {
     device.write("/var/db/vigil/usage.plist", Plist("<array>" + records + "</array>"));
-    ProgramSetting shifted = setting();
-    shifted.environment["ASAN_OPTIONS"] = "verify_asan_link_order=0";
     const std::string noon = "@2026-03-0" + std::to_string(4 + day) + " 12:00:00";
-    const auto run = RunProgram("/usr/bin/faketime", {"-f", noon, QUORLET_PROGRAM, "-d"}, shifted);
+    const auto run =
+        RunProgram("/usr/bin/faketime", {"-f", noon, QUORLET_PROGRAM, "-d"}, setting());
     EXPECT_EQ(run.status, 0) << run.err;
     const auto dump = RunProgram(
         QUORLETCTL_PROGRAM, {"tally", "dump", "--day", std::to_string(kFirstDay + day)}, setting());

@@ -224,7 +224,7 @@ TEST_F(ReportTest, AppInfoThatCannotBeWrittenIsLeftOut) {
   allowScalars({{"s", "", ""}});
   device.counterStore.hasScalar("s", 19999, 1);
   Array deep;
-  for (std::size_t i = 0; i < kMaxPropertyListDepth; ++i) deep = Array{deep};
+  for (std::size_t i = 0; i < kMaxPropertyListDepth; ++i) deep = Array{PropertyValue(deep)};
   writeLog(deep);
   EXPECT_FALSE(document().contains("TLActivatedAppInfo"));
   EXPECT_EQ(device.log.errors().size(), 1u);
