@@ -19,8 +19,8 @@ constexpr std::size_t kSmallestTextBytes = std::size_t{1} << 20;
 constexpr std::size_t kLargestTextBytes = std::size_t{256} << 20;
 
 struct StorageArguments {
-  std::string file;
-  std::string header;
+  std::optional<std::string> file;
+  std::optional<std::string> header;
   bool json = false;
 };
 
@@ -33,7 +33,6 @@ class KeptErrors final : public StandardError {
     const std::string line = text_.substr(0, text_.find('\n'));
     return line.empty() ? std::string(otherwise) : line;
   }
-  bool empty() const { return text_.empty(); }
 
  private:
   std::string text_;
@@ -82,7 +81,13 @@ void PrintVMFreezer(Session& session, const StorageArguments& arguments) {
 void PrintAdvice(Session& session, const StorageArguments& arguments) {
   StorageServices services(session);
   const bool advice = NandRecommendsContentDeletion(services.platform);
-  if (!advice && !services.errors.empty()) throw Failure(services.errors.firstLineOr(""));
+  const std::string problem = services.errors.firstLineOr("");
+  // The answer stands when only the connection could not be closed behind it.
+  if (problem == kConnectionNotClosed) {
+    session.messages.add(LogLevel::kError, problem);
+  } else if (!problem.empty()) {
+    throw Failure(problem);
+  }
   if (arguments.json) {
     session.out.line(JsonText(Dictionary{{"recommendsContentDeletion", advice}}, JsonForm::kPlain));
   } else {
@@ -99,18 +104,24 @@ Data ReadExportFile(const std::string& path) {
   return {content.begin(), content.end()};
 }
 
-// One export of the controller, or nothing when it has none.
-std::optional<Data> FetchExport(ExporterConnection& exporter, const SelectorPair* selectors) {
+// One export of the controller, or nothing when it has none. `name` is for errors.
+std::optional<Data> FetchExport(ExporterConnection& exporter, const SelectorPair* selectors,
+                                std::string_view name) {
   std::uint32_t size = 0;
   if (selectors == nullptr || selectors->sizeQuery == kNoSelector ||
       exporter.querySize(selectors, ExportFlags(false, 0), size) != kKernelSuccess || size == 0) {
     return std::nullopt;
   }
   const auto buffer = ExportBuffer::Allocate(size);
+  if (!buffer) {
+    throw Failure("the driver's " + std::string(name) + " is too large: " + Counted(size, "byte"));
+  }
   std::size_t written = 0;
-  if (!buffer || exporter.fetch(selectors, ExportFlags(false, 0), buffer->bytes(), written) !=
-                     kKernelSuccess) {
-    return std::nullopt;
+  const KernelReturn status =
+      exporter.fetch(selectors, ExportFlags(false, 0), buffer->bytes(), written);
+  if (status != kKernelSuccess) {
+    throw Failure("the driver does not give its " + std::string(name) + ": status " +
+                  Hexadecimal(status));
   }
   const auto content = buffer->bytes().first(std::min(written, buffer->bytes().size()));
   return Data(content.begin(), content.end());
@@ -128,13 +139,17 @@ Snapshot FetchSnapshot(Session& session) {
   if (service == 0) throw Failure("there is no storage driver");
   ExporterConnection exporter(services.platform, service, *row);
   if (!exporter) throw Failure(services.errors.firstLineOr("the driver refuses a connection"));
-  auto records = FetchExport(exporter, row->getSnapshotSelectors());
+  auto records = FetchExport(exporter, row->getSnapshotSelectors(), "snapshot");
   if (!records) throw Failure("the driver has no snapshot");
-  return {*std::move(records), FetchExport(exporter, row->getSnapshotHeaderSelectors())};
+  return {*std::move(records),
+          FetchExport(exporter, row->getSnapshotHeaderSelectors(), "snapshot header")};
 }
 
 // The text as long as it needs to be; renderers only tell that a buffer was too small for it.
 std::string Render(const Snapshot& snapshot) {
+  if (snapshot.header && snapshot.header->size() < kSnapshotHeaderBytes) {
+    throw Failure("the snapshot header is cut short");
+  }
   for (std::size_t size = kSmallestTextBytes; size <= kLargestTextBytes; size *= 4) {
     std::string text(size, '\0');
     const auto length = snapshot.header ? FSPParseSnapshotBufferWithInplaceParser(
@@ -144,19 +159,16 @@ std::string Render(const Snapshot& snapshot) {
     text.resize(*length);
     return text;
   }
-  throw Failure("the snapshot cannot be rendered");
+  throw Failure("the snapshot's text is too long");
 }
 
 void PrintSnapshot(Session& session, const StorageArguments& arguments) {
-  if (arguments.file.empty() && !arguments.header.empty()) {
-    throw Failure("--header needs --file");
-  }
   Snapshot snapshot;
-  if (arguments.file.empty()) {
-    snapshot = FetchSnapshot(session);
+  if (arguments.file) {
+    snapshot.records = ReadExportFile(*arguments.file);
+    if (arguments.header) snapshot.header = ReadExportFile(*arguments.header);
   } else {
-    snapshot.records = ReadExportFile(arguments.file);
-    if (!arguments.header.empty()) snapshot.header = ReadExportFile(arguments.header);
+    snapshot = FetchSnapshot(session);
   }
   const std::string text = Render(snapshot);
   if (arguments.json) {
@@ -165,10 +177,13 @@ void PrintSnapshot(Session& session, const StorageArguments& arguments) {
   }
   // The legend and the formats are the device's: nothing of them controls a terminal.
   for (std::string_view rest = text; !rest.empty();) {
-    const std::string_view line = rest.substr(0, rest.find('\n'));
-    session.out.line(Escape(line));
-    rest.remove_prefix(std::min(rest.size(), line.size() + 1));
+    const std::size_t kept = std::min(rest.find_first_of("\n\t\\"), rest.size());
+    session.out.write(Escape(rest.substr(0, kept)));
+    rest.remove_prefix(kept);
+    session.out.write(rest.substr(0, 1));
+    rest.remove_prefix(std::min<std::size_t>(rest.size(), 1));
   }
+  if (!text.ends_with('\n')) session.out.write("\n");
 }
 
 }  // namespace
@@ -191,8 +206,9 @@ void AddStorageCommands(CLI::App& app, Session& session) {
   CLI::App* snapshot = add("snapshot", "Print the controller's snapshot as text",
                            "Without --file, the snapshot of the driver.",
                            "quorletctl storage snapshot --file snapshot.bin", PrintSnapshot);
-  snapshot->add_option("--file", arguments->file, "Snapshot export to render");
-  snapshot->add_option("--header", arguments->header, "Snapshot header that describes the file");
+  CLI::Option* file = snapshot->add_option("--file", arguments->file, "Snapshot export to render");
+  snapshot->add_option("--header", arguments->header, "Snapshot header that describes the file")
+      ->needs(file);
   add("vmfreezer", "Print how much the memory freezer has written", "",
       "quorletctl storage vmfreezer", PrintVMFreezer);
   add("advice", "Print whether the drive recommends deleting content", "\"yes\" or \"no\".",

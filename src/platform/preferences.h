@@ -34,6 +34,13 @@ class Preferences {
   // The value when it is a boolean, otherwise false; `found` says whether it is one.
   bool DGWPreferencesGetBoolValue(std::string_view key, std::string_view domain, bool& found);
 
+  // A copy of the value for the caller to change, or nothing.
+  std::optional<PropertyValue> CopyPreferenceValue(std::string_view key, std::string_view domain);
+
+  // Whether the value is true, or a number other than 0; `exists` says whether it is a boolean or a
+  // number.
+  bool GetPreferenceBool(std::string_view key, std::string_view domain, bool& exists);
+
   // The value when it is a number (truncated, saturated), otherwise 0.
   std::int64_t DGWPreferencesGetIntegerValue(std::string_view key, std::string_view domain);
 };

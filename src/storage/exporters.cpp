@@ -26,6 +26,14 @@ constexpr SelectorPair telemetryListSelectors{17, 17};
 constexpr SelectorPair taskSchedulerSelectors{39, 39};
 constexpr SelectorPair snapshotSelectors{22, 22};
 constexpr SelectorPair snapshotHeaderSelectors{145, 145};
+// Two exports with one selector would be read as each other.
+static_assert([] {
+  auto selectors = std::array{statsSelectors,         bandStatsSelector,      defectsListSelector,
+                              telemetryListSelectors, taskSchedulerSelectors, snapshotSelectors,
+                              snapshotHeaderSelectors};
+  std::ranges::sort(selectors, {}, &SelectorPair::fetch);
+  return std::ranges::adjacent_find(selectors, {}, &SelectorPair::fetch) == selectors.end();
+}());
 
 // What every class that is known has in common.
 constexpr StorageExporter MakeRow(std::string_view className, std::string_view characteristicsKey,
@@ -137,7 +145,7 @@ ExporterConnection::ExporterConnection(Platform& platform, RegistryHandle servic
 
 ExporterConnection::~ExporterConnection() {
   if (connection_ != 0 && platform_.driverRegistry.CloseDriverConnection(connection_) != 0) {
-    platform_.standardError.write("Could not close connection to service\n");
+    platform_.standardError.write(std::string(kConnectionNotClosed) + '\n');
   }
   platform_.driverRegistry.ReleaseHandle(service_);
 }

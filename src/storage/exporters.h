@@ -67,6 +67,7 @@ RegistryHandle findNandExporter(DriverRegistry& registry, const StorageExporter*
 
 inline constexpr std::string_view kNoExporterMessage =
     "Could not get matching Devreg service for exporting classes\n";
+inline constexpr std::string_view kConnectionNotClosed = "Could not close connection to service";
 
 // --- One export ---------------------------------------------------------------------------------
 

@@ -65,8 +65,8 @@ class DictionaryBuilder {
     set32(kNANDInfoExportVersionKey, context.exportVersion);
     set32(kNANDInfoDriverVersionKey, context.driverVersion);
     bool found = false;
-    const bool isDemo = platform_.preferences.DGWPreferencesGetBoolValue(
-        "StoreDemoMode", "nuvex.demo-settings", found);
+    const bool isDemo =
+        platform_.preferences.GetPreferenceBool("StoreDemoMode", "nuvex.demo-settings", found);
     set64(kNANDInfoDemoModeKey, isDemo ? 1 : 0);
   }
 

@@ -170,8 +170,6 @@ void AppendLine(BoundedText& text, std::span<const std::byte, kRecordSize> recor
 constexpr std::size_t kFieldSize = 28;
 constexpr std::size_t kFieldFormatOffset = 12;
 constexpr std::size_t kTripleSize = 12;
-// Far more than a line can show. A table with more would cost without bound for every record.
-constexpr std::size_t kMostFields = 1024;
 
 enum FieldKind : std::uint16_t { kNumber = 0, kOtherNumber = 1, kMilliseconds = 2, kLatencies = 3 };
 
@@ -218,7 +216,7 @@ bool LiesWithin(std::size_t offset, std::size_t size, std::size_t limit) {
 // A table that is cut short keeps its whole fields.
 void ReadFields(std::span<const std::byte> table, Layout& layout) {
   ByteReader reader(table);
-  const std::size_t count = std::min<std::size_t>(reader.little<std::uint32_t>(), kMostFields);
+  const std::size_t count = reader.little<std::uint32_t>();
   reader.skip(4);
   for (std::size_t i = 0; i < count; ++i) {
     const auto bytes = reader.take(kFieldSize);
@@ -312,11 +310,15 @@ std::optional<std::size_t> FSPParseSnapshotBufferWithInplaceParser(
   BoundedText text(out);
   text.append(layout->legend);
   if (!layout->firstField) return text.finish();
+  // Nearly every field shows something. Those that never do must not cost without bound.
+  std::size_t affordable = out.size();
   for (std::size_t i = 0; text.ok() && i < layout->records; ++i) {
     if (records.size() < layout->stride) break;
     const auto record = records.first(layout->stride);
     records = records.subspan(layout->stride);
     if (WordAt(record, *layout->firstField) == 0) continue;
+    if (layout->fields.size() > affordable) return std::nullopt;
+    affordable -= layout->fields.size();
     for (const Field& field : layout->fields) AppendField(text, field, record);
     text.append("\n");
   }

@@ -3,7 +3,7 @@
 // Both renderers write a legend and then one line for each interval, followed by a terminator, into
 // a buffer of the caller. They give the number of characters without the terminator, or nothing
 // when the text and its terminator do not fit; the buffer then holds the beginning of a text that
-// is not terminated.
+// is not terminated. More fields than characters count as not fitting.
 #ifndef QUORLET_STORAGE_SNAPSHOT_H_
 #define QUORLET_STORAGE_SNAPSHOT_H_
 
@@ -12,6 +12,9 @@
 #include <span>
 
 namespace quorlet {
+
+// The part of a header without which nothing can be rendered.
+inline constexpr std::size_t kSnapshotHeaderBytes = 28;
 
 // Records of the fixed layout, 252 bytes each; what is left at the end is ignored. One empty line
 // follows the last line.

@@ -71,7 +71,7 @@ std::string LogText(Platform& platform, Date now, const Dictionary& values) {
 
 void WriteLog(Platform& platform, std::string_view typeCode, const Dictionary* values) {
   const Date now = platform.clock.now();
-  const auto stored = platform.preferences.DGWPreferencesGetValue(kLastLoggedAt, kDomain);
+  const auto stored = platform.preferences.CopyPreferenceValue(kLastLoggedAt, kDomain);
   const Date* last = stored ? stored->asDate() : nullptr;
   if (last != nullptr && now.secondsSince1970 - last->secondsSince1970 < kSecondsBetweenLogs) {
     platform.log.log("NANDLogWriter:Last written at %@ current %@ :skipped", PropertyValue(*last),

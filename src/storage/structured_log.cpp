@@ -77,7 +77,7 @@ WriteAmplification AmplificationFrom(const FSPParseContext& context) {
 }
 
 bool ExceedsThreshold(Preferences& preferences, float userRatio) {
-  const auto preference = preferences.DGWPreferencesGetValue("userWAmp", "nuvex.NANDInfo");
+  const auto preference = preferences.CopyPreferenceValue("userWAmp", "nuvex.NANDInfo");
   const Number* number = preference ? preference->asNumber() : nullptr;
   if (number != nullptr && number->isReal()) {
     const auto threshold = static_cast<float>(number->toDouble());
@@ -272,11 +272,12 @@ bool LogDefectsList(Platform& platform, std::span<const std::byte> buffer) {
   ByteReader reader(buffer);
   reader.skip(4);
   const auto factoryCount = static_cast<std::int32_t>(reader.little<std::uint32_t>());
-  const std::size_t claimed = reader.little<std::uint32_t>();
   if (!reader.ok()) {
     errors.write(kNotParsedMessage);
     return false;
   }
+  // 0 when the list ends before it.
+  const std::size_t claimed = reader.little<std::uint32_t>();
   Dictionary factory;
   SetNumberValue(errors, factory, "Factory Count", factoryCount);
   platform.crashSupport.FSLogStructuredData(kStructuredLogType, factory);

@@ -6,6 +6,7 @@
 
 #include <algorithm>
 #include <cstdint>
+#include <vector>
 
 #include "storage/nand_info.h"
 #include "values/byte_reader.h"
@@ -24,8 +25,6 @@ enum ItemType : std::uint32_t {
 constexpr char kFreezerThread[] = "VM_swapout";
 constexpr std::size_t kLongestThreadName = 64;
 constexpr std::size_t kBytesWrittenCounter = 3;
-// The kernel nests containers three deep.
-constexpr int kDeepestContainer = 64;
 
 struct SnapshotItem {
   std::uint32_t type = 0;
@@ -47,53 +46,57 @@ class ItemWalk {
     const auto size = reader_.little<std::uint32_t>();
     item.flags = reader_.little<std::uint64_t>();
     item.payload = reader_.take(size);
-    if (!reader_.ok() || item.type == kBufferEnd) stop();
-    return stopped_ ? std::nullopt : std::optional(item);
+    if (!reader_.ok() || item.type == kBufferEnd) isAtEnd_ = true;
+    return isAtEnd_ ? std::nullopt : std::optional(item);
   }
-  // There are no items any more.
-  void stop() { stopped_ = true; }
 
  private:
   ByteReader reader_;
-  bool stopped_ = false;
+  bool isAtEnd_ = false;
 };
 
-// As far as the text in the item goes, which need not be terminated. An empty one names nothing.
+// What has been seen of a container whose end has not come.
+struct OpenContainer {
+  explicit OpenContainer(const SnapshotItem& begin) : id(begin.flags) {}
+  std::uint64_t id;
+  std::optional<std::span<const std::byte>> name;
+  std::optional<IOStats> ioStats;
+};
+
+// As far as the text in the item goes, which need not be terminated.
 bool IsNamed(std::span<const std::byte> text, std::string_view name) {
   const std::string_view stored(reinterpret_cast<const char*>(text.data()), text.size());
   const std::string_view shown = stored.substr(0, kLongestThreadName);
   const std::size_t end = shown.find('\0');
-  if (shown.empty()) return false;
   return end != std::string_view::npos ? shown.substr(0, end) == name : name.starts_with(shown);
 }
 
-// Searches one container, whose begin the walk has just passed; the walk ends up behind it.
+// Searches one container, whose begin the walk has just passed, and all that are in it; the walk
+// ends up behind it.
 bool getIOStatsWithThreadnameFromSnapItemsHelper(ItemWalk& walk, const SnapshotItem& container,
-                                                 int depth, std::string_view threadName,
+                                                 std::string_view threadName,
                                                  std::optional<IOStats>& ioStats) {
-  if (depth > kDeepestContainer) {
-    walk.stop();
-    return false;
-  }
-  std::optional<std::span<const std::byte>> name;
-  std::optional<IOStats> ownStats;
-  while (const auto item = walk.next()) {
-    if (item->isContainer()) {
-      if (getIOStatsWithThreadnameFromSnapItemsHelper(walk, *item, depth + 1, threadName,
-                                                      ioStats)) {
+  // From the outermost to the innermost. A list rather than a recursion: how deep containers lie in
+  // each other is up to whoever wrote the snapshot.
+  std::vector<OpenContainer> open{OpenContainer(container)};
+  while (!open.empty()) {
+    const auto item = walk.next();
+    OpenContainer& innermost = open.back();
+    if (!item || (item->type == kContainerEnd && item->flags == innermost.id)) {
+      if (innermost.name && IsNamed(*innermost.name, threadName)) {
+        ioStats = innermost.ioStats;
         return true;
       }
-    } else if (item->type == kContainerEnd && item->flags == container.flags) {
-      break;
+      open.pop_back();
+    } else if (item->isContainer()) {
+      open.emplace_back(*item);
     } else if (item->type == kThreadName) {
-      name = item->payload;
+      innermost.name = item->payload;
     } else if (item->type == kIOStatistics) {
-      ownStats = item->payload;
+      innermost.ioStats = item->payload;
     }
   }
-  if (!name || !IsNamed(*name, threadName)) return false;
-  ioStats = ownStats;
-  return true;
+  return false;
 }
 
 std::uint64_t BytesWritten(IOStats ioStats) {
@@ -111,7 +114,7 @@ bool getIOStatsWithThreadnameFromSnapItems(std::span<const std::byte> items,
   ItemWalk walk(items);
   while (const auto item = walk.next()) {
     if (item->isContainer() &&
-        getIOStatsWithThreadnameFromSnapItemsHelper(walk, *item, 1, threadName, ioStats)) {
+        getIOStatsWithThreadnameFromSnapItemsHelper(walk, *item, threadName, ioStats)) {
       return true;
     }
   }

@@ -4,9 +4,12 @@
 
 #include <map>
 
+#include "fakes/fake_platform.h"
 #include "fakes/temp_root.h"
 #include "platform/linux/nvme_health_page.h"
 #include "platform/linux/nvme_statistics.h"
+#include "storage/nand_info.h"
+#include "storage/statistics_parser.h"
 #include "values/byte_reader.h"
 
 namespace quorlet {
@@ -26,7 +29,8 @@ Statistics Read(std::span<const std::byte> bytes) {
   return statistics;
 }
 
-// A page as a drive gives it, full of what is not read: 35 °C, 100 % spare, 3 % used.
+// The page of a drive of 256 GB in daily use, put together again from a published report of it
+// ("Data Units Read: 9,351,610 [4.78 TB]"); what the report does not tell is filled with 0xEE.
 Data HealthPage() {
   Data page(kNvmeHealthPageBytes, std::byte{0xEE});
   const auto put = [&](std::size_t at, std::size_t width, std::uint64_t value) {
@@ -34,32 +38,48 @@ Data HealthPage() {
       page[at + i] = static_cast<std::byte>(i < 8 ? value >> (8 * i) & 0xFF : 0);
     }
   };
-  put(0, 6, 0x03'0A'64'01'34'04);
-  const std::uint64_t counters[] = {18'446'744, 29'000'001, 512'000'000, 733'000'000, 1234,
-                                    815,        9001,       42,          7,           99};
+  put(0, 6, 0x05'0A'64'01'30'00);  // 304 K, all of the spare left, 5 % used
+  const std::uint64_t counters[] = {9'351'610, 10'338'739, 77'209'705, 94'922'330, 773,
+                                    1'163,     1'055,      134,        0,          65};
   for (std::size_t i = 0; i < std::size(counters); ++i) put(32 + 16 * i, 16, counters[i]);
   return page;
 }
-const Statistics kOfPage = {{53, 0x20002},
-                            {36, 4},
-                            {7, 18'446'744 * 125ULL},
-                            {4, 3'625'000'125},
-                            {3, 512'000'000},
-                            {2, 733'000'000},
-                            {10, 815},
-                            {34, 9001},
-                            {11, 42},
-                            {172, 7}};
+const Statistics kOfPage = {
+    {53, 0x20002},   {36, 0},     {7, 1'168'951'250}, {4, 1'292'342'375}, {3, 77'209'705},
+    {2, 94'922'330}, {10, 1'163}, {34, 1'055},        {11, 134},          {172, 0}};
 
-TEST(NvmeStatistics, ThePageIsReadInItsUnits) {
+TEST(NvmeStatistics, TheDictionaryTellsWhatTheDriveReports) {
   NvmeFacts facts;
   Data page = HealthPage();
   facts.healthPage = page;
-  EXPECT_EQ(Read(*EncodeNvmeStatistics(facts)), kOfPage);
-  page[32 + 15] = std::byte{1};    // beyond 64 bits
-  page[48 + 7] = std::byte{0x80};  // beyond 64 bits once it is in sectors
+  FSPParseContext context;
+  ASSERT_TRUE(FSPParseBufferToCxt(context, *EncodeNvmeStatistics(facts)));
+  FakePlatform device;
+  Dictionary info = *BuildNANDInfoDictionary(device.services, context, false);
+  Dictionary told;
+  for (const auto& [key, value] : info) {
+    if (value.asNumber()->toInt64() != 0) told[key] = value;
+  }
+  EXPECT_EQ(PropertyValue(told).description(),
+            PropertyValue(Dictionary{{kNANDInfoExportVersionKey, Int32(0x20002)},
+                                     {kNANDInfoDriverVersionKey, Int32(-1)},
+                                     {kNANDInfoNumLogicalReadsKey,
+                                      Int64(std::int64_t{9'351'610} * 1000 * 512 / 4096)},
+                                     {kNANDInfoNumLogicalWritesKey,
+                                      Int64(std::int64_t{10'338'739} * 1000 * 512 / 4096)},
+                                     {"nuvex.NANDInfo.UncleanBoots", Int64(134)}})
+                .description());
+  FSPReleaseContext(context);
+
+  page[32 + 15] = std::byte{1};  // beyond 64 bits
+  page[48 + 7] = std::byte{2};   // beyond 63 bits once it is in sectors
+  page[64 + 7] = std::byte{0x80};
   const Statistics saturated = Read(*EncodeNvmeStatistics(facts));
-  EXPECT_TRUE(saturated.at(7) == UINT64_MAX && saturated.at(4) == UINT64_MAX);
+  for (const std::uint32_t key : {7u, 4u, 3u})
+    EXPECT_EQ(saturated.at(key), std::uint64_t{INT64_MAX});
+  std::fill_n(page.begin() + 32, 32, std::byte{0});
+  const Statistics silent = Read(*EncodeNvmeStatistics(facts));
+  EXPECT_FALSE(silent.contains(7) || silent.contains(4)) << "data units are not reported";
 }
 
 // A machine with one controller and two namespaces, whose page comes from the test.

@@ -140,7 +140,7 @@ TEST(NANDInfo, MergeLeavesOutVersionsAndErrors) {
 // Through the whole daily sequence of collectors.
 TEST(DailyPush, NumbersBecomeCountersOfToday) {
   ExportDevice device("NuvexEmbeddedNVMeController");
-  device.preferences.DGWPreferencesSetValue("StoreDemoMode", true, "nuvex.demo-settings");
+  device.preferences.DGWPreferencesSetValue("StoreDemoMode", Int8(1), "nuvex.demo-settings");
   device.words = ExportOf({{"exportVersion", {1}}, {"nandWrites", {9}}});
   collectPlatformStatistics(device.services);
   auto& scalars = device.counterStore.scalars;

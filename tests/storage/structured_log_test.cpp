@@ -143,8 +143,10 @@ TEST(StructuredLog, DamagedLists) {
   defects[11] = '\x7F';  // claims far more records than there are
   for (std::size_t length = 0; length <= defects.size(); ++length) {
     Device device;
-    EXPECT_EQ(LogDefectsList(device.services, Bytes(defects.substr(0, length))), length >= 12);
-    EXPECT_EQ(device.crashSupport.entries.size(), length < 12 ? 0 : 1 + (length - 12) / 28);
+    EXPECT_EQ(LogDefectsList(device.services, Bytes(defects.substr(0, length))), length >= 8);
+    EXPECT_EQ(device.crashSupport.entries.size(), length < 8    ? 0
+                                                  : length < 12 ? 1
+                                                                : 1 + (length - 12) / 28);
   }
 }
 

@@ -45,7 +45,7 @@ TEST(VMFreezer, FindsTheThreadsContainer) {
       {7, Begin(1) + Written(7) + Name("VM_swapout" + std::string(54, '\0') + "x") + End(1)},
       {-1, name + Written(7)},
       {-1, Begin(1) + Written(7) + End(1)},
-      {-1, Begin(1) + Name("") + Written(7) + End(1)},
+      {7, Begin(1) + Name("") + Written(7) + End(1)},
       {-1, Begin(1) + Name("VM_swapout_extra") + Written(7) + End(1)},
       {-1, Begin(1) + Name(std::string("VM_swap\0out", 11)) + End(1)},
       {0, Begin(1) + name + End(1) + Written(7)},
@@ -57,7 +57,7 @@ TEST(VMFreezer, FindsTheThreadsContainer) {
       {-1, Item(0x13, 1, "abc") + name + End(1)},
       {-1, Item(0x23, 1, "abcdefgh") + name + End(1)},
       {7, Begin(1) + name + Written(7) + Begin(2) + Item(0xF19158ED, 0, "") + Written(8) + End(1)},
-      {-1, deep + name + Written(7)},
+      {7, deep + name + Written(7)},
   };
   // clang-format on
   for (const auto& row : cases) EXPECT_EQ(Found(row.second), row.first) << &row - cases;

@@ -173,9 +173,13 @@ DriverFile ReadDescription(std::string text) {
     return file;
   }
   const auto id = BitsEntry(*description, "EntryID");
-  // The invalid value is the ID of nothing: a channel with it could not be asked for.
-  if (!id || *id == std::uint64_t{1} << 63) {
+  if (!id) {
     file.problem = "it has no EntryID";
+    return file;
+  }
+  // The invalid value is the ID of nothing: a channel with it could not be asked for.
+  if (*id == std::uint64_t{1} << 63) {
+    file.problem = "its EntryID is the invalid value";
     return file;
   }
   const Dictionary* properties = DictionaryEntry(*description, "Properties");

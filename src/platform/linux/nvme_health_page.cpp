@@ -11,9 +11,11 @@
 #include <unistd.h>
 
 #include <algorithm>
-#include <array>
 #include <csignal>
 #include <cstdint>
+#include <functional>
+#include <span>
+#include <utility>
 
 #include "platform/linux/descriptor.h"
 #include "platform/linux/nvme_statistics.h"
@@ -24,58 +26,75 @@ namespace {
 constexpr std::uint8_t kGetLogPage = 0x02;
 constexpr std::uint32_t kHealthPage = 0x02;
 constexpr std::uint32_t kAllNamespaces = 0xFFFFFFFF;
+constexpr std::size_t kMaxAttributeBytes = 64;
 
-int AskDrive(int device, std::array<std::byte, kNvmeHealthPageBytes>& page) {
-  nvme_admin_cmd command{};
-  command.opcode = kGetLogPage;
-  command.nsid = kAllNamespaces;
-  command.addr = reinterpret_cast<std::uintptr_t>(page.data());
-  command.data_len = kNvmeHealthPageBytes;
-  // The number of 32-bit words less one, and the page.
-  command.cdw10 = (std::uint32_t{kNvmeHealthPageBytes / 4 - 1} << 16) | kHealthPage;
-  return ioctl(device, NVME_IOCTL_ADMIN_CMD, &command);
-}
+// What a child does: it fills the buffer and says how much of it, or fails below 0. Only what may
+// be called between fork and the end.
+using Question = std::function<ssize_t(std::span<std::byte> answer)>;
 
-// In the child: only what may be called between fork and the end.
-[[noreturn]] void AnswerFromChild(const char* path, int answer) {
+[[noreturn]] void AnswerFromChild(const Question& question, std::span<std::byte> answer, int pipe) {
   // Whatever else is open, a lock or somebody's pipe, must not stay open with a child that hangs.
-  if (dup2(answer, 0) < 0 || close_range(1, ~0U, 0) != 0) _exit(1);
-  std::array<std::byte, kNvmeHealthPageBytes> page{};
-  const int device = open(path, O_RDONLY | O_NONBLOCK | O_CLOEXEC);
-  if (device >= 0 && AskDrive(device, page) == 0) {
-    // A pipe takes a page in one go.
-    if (write(0, page.data(), page.size()) < 0) _exit(1);
-  }
+  if (dup2(pipe, 0) < 0 || close_range(1, ~0U, 0) != 0) _exit(1);
+  const ssize_t size = question(answer);
+  // A pipe takes as little as this in one go.
+  if (size > 0 && write(0, answer.data(), static_cast<std::size_t>(size)) < 0) _exit(1);
   _exit(0);
 }
 
-}  // namespace
-
-std::optional<Data> ReadNvmeHealthPage(const std::string& device, std::chrono::milliseconds limit) {
+// The answer, of at most `capacity` bytes; empty when there is none within `limit`.
+Data AnswerWithin(std::chrono::milliseconds limit, std::size_t capacity, const Question& question) {
+  Data answer(capacity);
   int ends[2];
-  if (pipe2(ends, O_CLOEXEC) != 0) return std::nullopt;
-  const Descriptor answer(ends[0]);
-  Descriptor written(ends[1]);
+  if (pipe2(ends, O_CLOEXEC) != 0) return {};
+  const Descriptor heard(ends[0]);
+  Descriptor told(ends[1]);
   const pid_t child = fork();
-  if (child == 0) AnswerFromChild(device.c_str(), written.get());
-  written = Descriptor();
-  if (child < 0) return std::nullopt;
+  if (child == 0) AnswerFromChild(question, answer, told.get());
+  told = Descriptor();
+  if (child < 0) return {};
 
   const auto deadline = std::chrono::steady_clock::now() + limit;
-  pollfd waiting{answer.get(), POLLIN, 0};
+  pollfd waiting{heard.get(), POLLIN, 0};
   const int ready = Uninterrupted([&] {
     const auto left =
         std::chrono::ceil<std::chrono::milliseconds>(deadline - std::chrono::steady_clock::now());
     return poll(&waiting, 1, static_cast<int>(std::max<std::int64_t>(left.count(), 0)));
   });
-  Data page(kNvmeHealthPageBytes);
   const ssize_t size =
-      ready > 0 ? Uninterrupted([&] { return read(answer.get(), page.data(), page.size()); }) : 0;
+      ready > 0 ? Uninterrupted([&] { return read(heard.get(), answer.data(), answer.size()); })
+                : 0;
   kill(child, SIGKILL);
   // One that has answered is gone in no time; one that hangs is not waited for.
   waitpid(child, nullptr, ready > 0 ? 0 : WNOHANG);
-  if (size != static_cast<ssize_t>(page.size())) return std::nullopt;
-  return page;
+  answer.resize(static_cast<std::size_t>(std::max<ssize_t>(size, 0)));
+  return answer;
+}
+
+}  // namespace
+
+std::optional<Data> ReadNvmeHealthPage(const std::string& device, std::chrono::milliseconds limit) {
+  Data page = AnswerWithin(limit, kNvmeHealthPageBytes, [&](std::span<std::byte> answer) {
+    const int drive = open(device.c_str(), O_RDONLY | O_NONBLOCK | O_CLOEXEC);
+    if (drive < 0) return ssize_t{-1};
+    nvme_admin_cmd command{};
+    command.opcode = kGetLogPage;
+    command.nsid = kAllNamespaces;
+    command.addr = reinterpret_cast<std::uintptr_t>(answer.data());
+    command.data_len = kNvmeHealthPageBytes;
+    // The number of 32-bit words less one, and the page.
+    command.cdw10 = (std::uint32_t{kNvmeHealthPageBytes / 4 - 1} << 16) | kHealthPage;
+    const bool isRead = ioctl(drive, NVME_IOCTL_ADMIN_CMD, &command) == 0;
+    return isRead ? static_cast<ssize_t>(answer.size()) : ssize_t{-1};
+  });
+  return page.size() == kNvmeHealthPageBytes ? std::optional(std::move(page)) : std::nullopt;
+}
+
+std::string ReadNvmeAttribute(const std::string& path, std::chrono::milliseconds limit) {
+  const Data text = AnswerWithin(limit, kMaxAttributeBytes, [&](std::span<std::byte> answer) {
+    const int file = open(path.c_str(), O_RDONLY | O_NONBLOCK | O_CLOEXEC);
+    return file < 0 ? ssize_t{-1} : read(file, answer.data(), answer.size());
+  });
+  return {reinterpret_cast<const char*>(text.data()), text.size()};
 }
 
 }  // namespace quorlet

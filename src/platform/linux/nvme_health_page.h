@@ -1,4 +1,4 @@
-// Asks an NVMe drive for its SMART / Health log page.
+// What an NVMe drive itself has to be asked for, with a time limit.
 #ifndef QUORLET_PLATFORM_LINUX_NVME_HEALTH_PAGE_H_
 #define QUORLET_PLATFORM_LINUX_NVME_HEALTH_PAGE_H_
 
@@ -13,6 +13,9 @@ namespace quorlet {
 // The page of the controller behind the character device, opened for reading only; nothing when the
 // drive does not answer, or not within `limit`.
 std::optional<Data> ReadNvmeHealthPage(const std::string& device, std::chrono::milliseconds limit);
+
+// The start of a file of the kernel for which the drive is asked; empty like the page above.
+std::string ReadNvmeAttribute(const std::string& path, std::chrono::milliseconds limit);
 
 }  // namespace quorlet
 

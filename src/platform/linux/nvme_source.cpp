@@ -10,6 +10,7 @@
 #include <variant>
 #include <vector>
 
+#include "platform/linux/nvme_health_page.h"
 #include "platform/linux/nvme_statistics.h"
 #include "values/byte_reader.h"
 #include "values/text.h"
@@ -25,6 +26,7 @@ constexpr std::uint32_t kExportMethod = 9;
 constexpr std::uint32_t kStatisticsSelector = 13;
 constexpr unsigned kSizeOnly = 1;
 constexpr std::chrono::seconds kLimit{2};
+using Deadline = std::chrono::steady_clock::time_point;
 constexpr std::size_t kMaxAttributeBytes = 4096;
 constexpr std::size_t kMaxControllers = 256;
 
@@ -94,16 +96,17 @@ class NvmeDriver : public EntryDriver {
         status && *status != "active" && *status != "unsupported") {
       return {};
     }
+    const Deadline deadline = std::chrono::steady_clock::now() + kLimit;
     const auto page = reader_(root_.path("/dev/" + name_), kLimit);
     if (!page) return {};
     NvmeFacts facts;
     facts.healthPage = *page;
-    addNamespaces(facts);
+    addNamespaces(facts, deadline);
     return EncodeNvmeStatistics(facts).value_or(Data());
   }
 
   // What the kernel says about the drive's namespaces; a total needs all of them.
-  void addNamespaces(NvmeFacts& facts) const {
+  void addNamespaces(NvmeFacts& facts, Deadline deadline) const {
     facts.counters.emplace();
     facts.usedBytes = 0;
     std::size_t count = 0;
@@ -116,7 +119,7 @@ class NvmeDriver : public EntryDriver {
       if (!line || (facts.counters && !AddBlockCounters(*line, *facts.counters))) {
         facts.counters.reset();
       }
-      const auto used = NumberBehind("", Attribute(directory, "nuse").value_or(""));
+      const auto used = usedBlocks(directory, deadline);
       const auto blockBytes =
           NumberBehind("", Attribute(directory, "queue/logical_block_size").value_or(""));
       std::uint64_t bytes = 0;
@@ -129,6 +132,16 @@ class NvmeDriver : public EntryDriver {
     if (count != 0) return;
     facts.counters.reset();
     facts.usedBytes.reset();
+  }
+
+  // The kernel asks the drive for it.
+  static std::optional<std::uint64_t> usedBlocks(const std::string& directory, Deadline deadline) {
+    const auto left =
+        std::chrono::ceil<std::chrono::milliseconds>(deadline - std::chrono::steady_clock::now());
+    if (left.count() <= 0) return std::nullopt;
+    std::string text = ReadNvmeAttribute(JoinPath(directory, "nuse"), left);
+    if (text.ends_with('\n')) text.pop_back();
+    return NumberBehind("", text);
   }
 
   const Root root_;

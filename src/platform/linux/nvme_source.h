@@ -19,7 +19,7 @@ using HealthPageReader =
 
 // Publishes each controller of /sys/class/nvme that has its device in /dev as an entry of class
 // "NuvexEmbeddedNVMeController". A drive is asked once, when its statistics export is wanted, for
-// at most 2 seconds, and not at all while it sleeps; the other exports are empty.
+// at most 2 seconds in all, and not at all while it sleeps; the other exports are empty.
 std::unique_ptr<EntrySource> MakeNvmeSource(const Root& root, HealthPageReader reader);
 
 }  // namespace quorlet

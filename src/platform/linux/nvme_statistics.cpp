@@ -1,5 +1,6 @@
 #include "platform/linux/nvme_statistics.h"
 
+#include <algorithm>
 #include <array>
 #include <charconv>
 #include <limits>
@@ -38,17 +39,19 @@ static_assert(kSectorsPerDataUnit * kSectorBytes == 1000 * 512);
 // Where the health page has its counters of 16 bytes.
 constexpr std::size_t kDataUnitsRead = 32;
 
+// What reads the figures takes them for signed numbers.
+constexpr std::uint64_t kLargest = std::numeric_limits<std::int64_t>::max();
+
 std::uint64_t SaturatingProduct(std::uint64_t value, std::uint64_t factor) {
   std::uint64_t product = 0;
-  return __builtin_mul_overflow(value, factor, &product) ? std::numeric_limits<std::uint64_t>::max()
-                                                         : product;
+  return __builtin_mul_overflow(value, factor, &product) ? kLargest : std::min(product, kLargest);
 }
 
-// A counter of 16 bytes; one that does not fit into 8 saturates.
+// A counter of 16 bytes, saturated.
 std::uint64_t TakeCounter(ByteReader& page) {
   const auto low = page.little<std::uint64_t>();
   const auto high = page.little<std::uint64_t>();
-  return high == 0 ? low : std::numeric_limits<std::uint64_t>::max();
+  return high == 0 ? std::min(low, kLargest) : kLargest;
 }
 
 class Export {
@@ -97,8 +100,11 @@ std::optional<Data> EncodeNvmeStatistics(const NvmeFacts& facts) {
   ByteReader page(facts.healthPage);
   out.add(kSmartCritWarnings, page.little<std::uint8_t>());
   page.seek(kDataUnitsRead);
-  out.add(kHostReads, SaturatingProduct(TakeCounter(page), kSectorsPerDataUnit));
-  out.add(kHostWrites, SaturatingProduct(TakeCounter(page), kSectorsPerDataUnit));
+  for (const Key key : {kHostReads, kHostWrites}) {
+    // 0 also stands for a figure that the drive does not report.
+    const std::uint64_t units = TakeCounter(page);
+    if (units != 0) out.add(key, SaturatingProduct(units, kSectorsPerDataUnit));
+  }
   out.add(kHostReadXacts, TakeCounter(page));
   out.add(kHostWriteXacts, TakeCounter(page));
   (void)TakeCounter(page);  // controller busy time
