@@ -46,9 +46,10 @@ struct UsageRecord {
   std::array<Number, kFields.size()> counts;
 };
 
-const Number* NumberEntry(const Dictionary& dictionary, std::string_view key) {
+const Number* IntegerNumberEntry(const Dictionary& dictionary, std::string_view key) {
   const PropertyValue* value = dictionary.find(key);
-  return value != nullptr ? value->asNumber() : nullptr;
+  const Number* number = value != nullptr ? value->asNumber() : nullptr;
+  return number != nullptr && !number->isReal() ? number : nullptr;
 }
 
 // Nothing for a record that lacks something; the names are the dictionary's.
@@ -58,7 +59,7 @@ std::optional<UsageRecord> ReadRecord(const Dictionary& record) {
   const PropertyValue* since = record.find(UsageSinceTimeKey);
   const Number* counts[kFields.size()];
   std::ranges::transform(kFields, counts,
-                         [&](std::string_view field) { return NumberEntry(record, field); });
+                         [&](std::string_view field) { return IntegerNumberEntry(record, field); });
   const bool isComplete = name != nullptr && since != nullptr && since->asDate() != nullptr &&
                           std::ranges::find(counts, nullptr) == std::end(counts);
   if (!isComplete) return std::nullopt;
@@ -196,6 +197,13 @@ UsageGrowth CompareWithBaseline(const Array& records, CounterStore& counterStore
   return comparison.take();
 }
 
+// The baseline only after the counters: lost counters are added again by the next run.
+void WriteGrowth(const UsageGrowth& growth, CounterStore& counterStore, Preferences& preferences) {
+  if (growth.changes.empty() || counterStore.writeScalars(growth.changes)) {
+    storeBaseline(growth.baseline, preferences);
+  }
+}
+
 }  // namespace
 
 void storeBaseline(const Dictionary& baseline, Preferences& preferences) {
@@ -205,10 +213,8 @@ void storeBaseline(const Dictionary& baseline, Preferences& preferences) {
 
 void processDataUsageReply(const Array& records, CounterStore& counterStore,
                            Preferences& preferences, SystemLog& log) {
-  const UsageGrowth growth = CompareWithBaseline(records, counterStore, preferences, log);
-  if (growth.changes.empty() || counterStore.writeScalars(growth.changes)) {
-    storeBaseline(growth.baseline, preferences);
-  }
+  WriteGrowth(CompareWithBaseline(records, counterStore, preferences, log), counterStore,
+              preferences);
 }
 
 std::optional<UsageGrowth> collectDataUsage(Platform& platform) {
@@ -223,14 +229,18 @@ std::optional<UsageGrowth> collectDataUsage(Platform& platform) {
   platform.networkUsage.QueryProcessDataUsage(
       {}, UsageNameKind::kProcessName,
       [replied, waiting, &counterStore = platform.counterStore, &preferences = platform.preferences,
-       &log = platform.log](const Array& records) {
+       &log = platform.log](const Array* records) {
         RunStep(log, "network usage reply", [&] {
-          const std::lock_guard hold(waiting->mutex);
-          if (waiting->hasGivenUp) {
-            processDataUsageReply(records, counterStore, preferences, log);
-          } else {
-            waiting->growth = CompareWithBaseline(records, counterStore, preferences, log);
+          if (records == nullptr) return;
+          UsageGrowth growth = CompareWithBaseline(*records, counterStore, preferences, log);
+          // The comparison of many records takes its time: the pass must not wait for the lock.
+          std::unique_lock hold(waiting->mutex);
+          if (!waiting->hasGivenUp) {
+            waiting->growth = std::move(growth);
+            return;
           }
+          hold.unlock();
+          WriteGrowth(growth, counterStore, preferences);
         });
         replied->signal();
       });

@@ -33,7 +33,7 @@ void CollectDiskUsage(DeviceInfo& deviceInfo, CounterBatch& counters) {
 
 void collectPlatformStatistics(Platform& platform) {
   SystemLog& log = platform.log;
-  // Written at the end in one go: a pass that is killed before makes them anew.
+  // Written at the end in one go. The gated pass is made anew when it is killed before.
   CounterBatch counters(platform.counterStore);
   RunStep(log, "disk usage", [&] { CollectDiskUsage(platform.deviceInfo, counters); });
   RunStep(log, "storage", [&] { PushNANDInfoScalars(platform, counters); });

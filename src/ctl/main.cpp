@@ -2,28 +2,18 @@
 //
 // Exit status: 0, 1 when the command failed, 2 when the command line makes no sense. Both of the
 // latter come with exactly one line on standard error.
-#include <fcntl.h>
-
 #include <CLI/CLI.hpp>
 #include <csignal>
 #include <cstdlib>
 
 #include "ctl/session.h"
+#include "platform/linux/descriptor.h"
 
 namespace quorlet {
 namespace {
 
 constexpr int kFailed = 1;
 constexpr int kUsage = 2;
-
-// A closed standard stream must not become the descriptor of a file that is written; opened the
-// wrong way round, its use still fails.
-void OccupyStandardStreams() {
-  for (const int stream : {0, 1, 2}) {
-    if (::fcntl(stream, F_GETFD) != -1) continue;
-    [[maybe_unused]] const int opened = ::open("/dev/null", stream == 0 ? O_WRONLY : O_RDONLY);
-  }
-}
 
 void AddCommands(CLI::App& app, Session& session) {
   app.require_subcommand(1);

@@ -40,6 +40,9 @@ Descriptor Connect(double waitSeconds) {
     const UnixSocketAddress address(directory, kServiceName);
     Descriptor connection = MakeUnixSocket();
     if (!connection.isOpen()) throw Failure("cannot make a socket: " + ErrnoText(errno));
+    // A service that is stuck must not keep a script for ever.
+    const timeval limit{.tv_sec = 60, .tv_usec = 0};
+    setsockopt(connection.get(), SOL_SOCKET, SO_SNDTIMEO, &limit, sizeof limit);
     const int error = address.connect(connection.get());
     if (error == 0) return connection;
     const bool mayAppear = error == ENOENT || error == ECONNREFUSED;
@@ -56,9 +59,6 @@ void Send(const Dictionary& message, double waitSeconds) {
   const auto* text = std::get_if<std::string>(&document);
   if (text == nullptr || text->size() > kMaxFrameBytes) throw Failure("the message is too large");
   const Descriptor connection = Connect(waitSeconds);
-  // A service that is stuck must not keep a script for ever.
-  const timeval limit{.tv_sec = 60, .tv_usec = 0};
-  setsockopt(connection.get(), SOL_SOCKET, SO_SNDTIMEO, &limit, sizeof limit);
   if (const int error = WriteFully(connection.get(), MakeFrame(*text))) {
     throw Failure(std::string("cannot send to ") + kServiceName + ": " + ErrnoText(error));
   }
@@ -93,13 +93,19 @@ Dictionary AppDataElement(const PropertyValue& record, std::size_t index) {
   const auto uuid = uuidText != nullptr ? ParseUuid(*uuidText) : std::nullopt;
   if (!uuid) throw wrong("\"uuid\" must be the text of a UUID");
   Dictionary element{{"uuid", *uuid}};
-  for (const char* key : {"bundle_id", "version"}) {
-    const std::string* text = StringEntry(*fields, key);
+  // As in a message, or else as in the log.
+  const auto find = [fields](const char* key, const char* nameInLog) {
+    const PropertyValue* value = fields->find(key);
+    return value != nullptr ? value : fields->find(nameInLog);
+  };
+  for (const auto& [key, nameInLog] : {std::pair("bundle_id", "bundle"), {"version", "version"}}) {
+    const PropertyValue* value = find(key, nameInLog);
+    const std::string* text = value != nullptr ? value->asString() : nullptr;
     if (text == nullptr) throw wrong(std::string("\"") + key + "\" must be a string");
     element[key] = *text;
   }
-  for (const char* key : {"tesk_id", "arch"}) {
-    const PropertyValue* value = fields->find(key);
+  for (const auto& [key, nameInLog] : {std::pair("tesk_id", "teskID"), {"arch", "arch"}}) {
+    const PropertyValue* value = find(key, nameInLog);
     if (value == nullptr) continue;  // the service takes 0
     const Number* number = value->asNumber();
     if (number == nullptr || number->kind() != NumberKind::kInt64) {
@@ -172,7 +178,8 @@ void AddSendCommands(CLI::App& app, Session& session) {
       ->required();
   add("app-info", "Send the activated applications",
       "FILE is a JSON array of objects with \"uuid\", \"bundle_id\", \"version\" (strings) and\n"
-      "\"tesk_id\", \"arch\" (integers, 0 when left out).",
+      "\"tesk_id\", \"arch\" (integers, 0 when left out). The names that the log has for them,\n"
+      "\"bundle\" and \"teskID\", will do as well.",
       "quorletctl send app-info apps.json", SendAppInfo)
       ->add_option("FILE", arguments->file, "The records")
       ->required();

@@ -29,11 +29,11 @@ std::string UuidText(const Data& uuid) {
   return text;
 }
 
-// The field's 64 bits; 0 when it is missing or not a number.
+// The field's 64 bits; 0 when it is missing or not an integer.
 std::int64_t IntegerField(const Dictionary& message, std::string_view key) {
   const PropertyValue* value = message.find(key);
   const Number* number = value != nullptr ? value->asNumber() : nullptr;
-  if (number == nullptr) return 0;
+  if (number == nullptr || number->isReal()) return 0;
   return number->kind() == NumberKind::kUInt64 ? static_cast<std::int64_t>(number->toUInt64())
                                                : number->toInt64();
 }

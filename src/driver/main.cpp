@@ -6,6 +6,7 @@
 
 #include "driver/listener.h"
 #include "driver/run_driver.h"
+#include "platform/linux/descriptor.h"
 #include "platform/linux/linux_platform.h"
 
 namespace {
@@ -52,6 +53,7 @@ void Run(int argumentCount, char** arguments) {
 
 // The exit status is always 0: what went wrong is in the system log.
 int main(int argumentCount, char** arguments) {
+  quorlet::OccupyStandardStreams();
   // A reader of our standard error, or a peer, that goes away is no reason to die.
   std::signal(SIGPIPE, SIG_IGN);
   // A file that hits the process's size limit is a failed write, like a full disk.

@@ -20,6 +20,7 @@ constexpr std::string_view kTaskingDigest = "TaskingDigest";
 constexpr std::string_view kTaskingPayload = "TaskingPayload";
 // What is being applied, with the keys above; there only while the other domains are being written.
 constexpr std::string_view kTaskingInProgress = "TaskingInProgress";
+constexpr std::string_view kTaskingChanged = "nuvex.da.tasking_changed";
 
 std::optional<std::string> Text(const PropertyValue* value) {
   const std::string* text = value != nullptr ? value->asString() : nullptr;
@@ -132,10 +133,15 @@ class TaskingUpdate {
         set(key, Optional(known.find(key)));
       }
       if (payload != nullptr) set(kTaskingOS, Optional(record.find(kTaskingOS)));
-      if (isWritten) set(kTaskingInProgress, std::nullopt);
+      // Cut short before the announcement, the next run makes it.
       platform_.preferences.DGWPreferencesSynchronize(kOwnDomain);
+      platform_.notifications.PostNotification(kTaskingChanged);
+      if (!isWritten) return;
+      set(kTaskingInProgress, std::nullopt);
+      platform_.preferences.DGWPreferencesSynchronize(kOwnDomain);
+      return;
     }
-    platform_.notifications.PostNotification("nuvex.da.tasking_changed");
+    platform_.notifications.PostNotification(kTaskingChanged);
   }
 
   // Writes the values themselves and makes them durable; false when that failed for some.
@@ -143,6 +149,8 @@ class TaskingUpdate {
     std::set<std::string> touched;
     const auto set = [&](const std::string& domain, const std::string& key,
                          const PropertyValue* value) {
+      // Not a tasking's to change: it is what brings this one to its end.
+      if (domain == kOwnDomain && key == kTaskingInProgress) return;
       platform_.preferences.DGWPreferencesSetValue(key, Optional(value), domain);
       touched.insert(domain);
     };

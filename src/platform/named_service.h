@@ -36,8 +36,9 @@ class NamedService {
   // process ends. False, after one error line, when the listener cannot be created.
   virtual bool ListenNamedService(std::string_view name, ListenerHandler handler) = 0;
 
-  // Takes the new connection; its messages go to `handler` in the order of their arrival among
-  // all connections. A peer that is not accepted in the listener handler is disconnected.
+  // Takes the new connection; its messages go to `handler` in their order. Among connections, those
+  // have the first turn that were the first to have something to say. A peer that is not accepted
+  // in the listener handler is disconnected.
   virtual void AcceptPeerConnection(Peer& peer, MessageHandler handler) = 0;
 
   // Serves events for at most `seconds`, with returnAfterOneEvent until one has been handled.

@@ -20,8 +20,9 @@ class NetworkUsage {
  public:
   // `records`: one dictionary for each process, with "procName", optionally "bundleName", the since
   // date, and the integers "wifiInBytes", "wifiOutBytes", "wwanInBytes" and "wwanOutBytes". Nobody
-  // vouches for their shape.
-  using Reply = std::function<void(const Array& records)>;
+  // vouches for their shape. nullptr when the service cannot say: nothing is known then, which is
+  // not the same as no traffic.
+  using Reply = std::function<void(const Array* records)>;
 
   virtual ~NetworkUsage() = default;
 

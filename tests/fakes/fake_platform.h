@@ -246,8 +246,12 @@ class FakeNamedService : public NamedService {
 
 class FakeNotifications : public Notifications {
  public:
-  void PostNotification(std::string_view name) override { posted.emplace_back(name); }
+  void PostNotification(std::string_view name) override {
+    if (beforePosting) beforePosting();
+    posted.emplace_back(name);
+  }
   std::vector<std::string> posted;
+  std::function<void()> beforePosting;  // may throw: nothing is posted
 };
 
 // Replies on a thread of its own, before the query returns unless the reply is held back.
@@ -261,7 +265,7 @@ class FakeNetworkUsage : public NetworkUsage {
   }
   // Delivers the reply that was held back.
   void deliver() {
-    std::thread([this] { held_(records); }).join();
+    std::thread([this] { held_(&records); }).join();
     held_ = nullptr;
   }
 

@@ -24,11 +24,12 @@ class NetworkUsageTest : public testing::Test {
                                                 "</dict></plist>");
   }
   // The records of one reply.
-  Array recordsOf(const std::vector<std::string>& names = {}) {
-    std::promise<Array> reply;
+  std::optional<Array> recordsOf(const std::vector<std::string>& names = {}) {
+    std::promise<std::optional<Array>> reply;
     const auto usage = MakeLinuxNetworkUsage(root.root(), log);
-    usage->QueryProcessDataUsage(names, UsageNameKind::kProcessName,
-                                 [&](const Array& given) { reply.set_value(given); });
+    usage->QueryProcessDataUsage(names, UsageNameKind::kProcessName, [&](const Array* given) {
+      reply.set_value(given ? std::optional(*given) : std::nullopt);
+    });
     return reply.get_future().get();
   }
 
@@ -41,8 +42,10 @@ TEST_F(NetworkUsageTest, RecordsComeAsTheFileHasThem) {
   const std::string list =
       "<array><dict><key>procName</key><string>a</string></dict><string>odd</string></array>";
   const Array all = {Dictionary{{"procName", "a"}}, "odd"};
-  const std::tuple<std::string, std::string, Array> cases[] = {
-      {"<integer>0</integer>", "<array>", {}},
+  const std::tuple<std::string, std::string, std::optional<Array>> cases[] = {
+      {"<integer>0</integer>", "<array>", std::nullopt},
+      {"<integer>0</integer>", "<true/>", std::nullopt},
+      {"<integer>0</integer>", "<array/>", Array()},
       {"<real>nan</real>", list, all},
       {"<integer>-9223372036854775808</integer>", list, all},
       {"<string>5</string>", list, all},
@@ -63,9 +66,9 @@ TEST_F(NetworkUsageTest, TheEndWaitsForWhatIsProcessedAndDropsWhatHasNotCome) {
     usage->QueryProcessDataUsage({}, UsageNameKind::kProcessName, std::move(reply));
     std::this_thread::sleep_for(50ms);
   };
-  query("<integer>9223372036854775807</integer>", [](const Array&) { ADD_FAILURE() << "came"; });
-  query("<real>0</real>", [](const Array&) { throw std::runtime_error("no more room"); });
-  query("<real>0</real>", [&](const Array&) {
+  query("<integer>9223372036854775807</integer>", [](const Array*) { ADD_FAILURE() << "came"; });
+  query("<real>0</real>", [](const Array*) { throw std::runtime_error("no more room"); });
+  query("<real>0</real>", [&](const Array*) {
     begun->signal();
     std::this_thread::sleep_for(200ms);
     finished = true;

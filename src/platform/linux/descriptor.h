@@ -45,6 +45,10 @@ auto Uninterrupted(const Call& call) {
   return result;
 }
 
+// A closed standard stream must not become the descriptor of a file that is written. Opened the
+// wrong way round, its use still fails. To be called before anything else is opened.
+void OccupyStandardStreams();
+
 // Opens (and with O_CREAT creates, mode 0640) a regular file; 0 or the errno. Anything else at
 // `path` is refused: EISDIR for a directory, otherwise EINVAL. Never waits on a FIFO or device.
 [[nodiscard]] int OpenRegularFile(const std::string& path, int flags, Descriptor& opened,

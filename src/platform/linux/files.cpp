@@ -50,6 +50,13 @@ int OpenLocked(const std::string& path, Descriptor& opened, struct stat& status)
 
 }  // namespace
 
+void OccupyStandardStreams() {
+  for (const int stream : {0, 1, 2}) {
+    if (fcntl(stream, F_GETFD) != -1) continue;
+    [[maybe_unused]] const int opened = open("/dev/null", stream == 0 ? O_WRONLY : O_RDONLY);
+  }
+}
+
 int OpenRegularFile(const std::string& path, int flags, Descriptor& opened, struct stat& status) {
   // O_NONBLOCK means nothing to a regular file; it keeps a FIFO from stopping the program.
   const int allFlags = flags | O_CLOEXEC | O_NONBLOCK | O_NOCTTY;

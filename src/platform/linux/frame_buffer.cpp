@@ -28,6 +28,10 @@ std::string MakeFrame(std::string_view payload) {
 
 std::size_t FrameBuffer::append(std::string_view bytes) {
   if (broken_) return 0;
+  // By a quarter rather than by half: large frames must not cost twice their size.
+  if (const std::size_t size = bytes_.size() + bytes.size(); size > bytes_.capacity()) {
+    bytes_.reserve(size + size / 4);
+  }
   bytes_.append(bytes);
   std::size_t completed = 0;
   while (bytes_.size() - scanned_ >= kFrameHeaderBytes) {

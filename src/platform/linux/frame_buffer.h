@@ -31,8 +31,8 @@ class FrameBuffer {
   // apart any more. Frames before it can still be taken.
   bool isBroken() const { return broken_; }
 
-  // The memory set aside for what has arrived.
-  std::size_t capacity() const { return bytes_.capacity(); }
+  // How much is held of what has arrived.
+  std::size_t size() const { return bytes_.size(); }
 
  private:
   void compact();

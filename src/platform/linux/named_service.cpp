@@ -4,8 +4,9 @@
 // woke up, in the order in which they did: each is told once (edge-triggered)
 // and read until it is empty, so that a source that wakes up again while a
 // handler runs takes its place behind those that woke up before. What was read
-// of one source is handled before the next is read, and a peer that floods the
-// service has at most one block of its bytes ahead of everybody else's.
+// of one source is handled before the next is read: what a peer adds while it
+// waits for its turn is handled in that turn. A peer that floods the service has
+// at most one block of its bytes ahead of everybody else's.
 #include "platform/linux/named_service.h"
 
 #include <poll.h>
@@ -34,9 +35,11 @@ namespace {
 using Time = std::chrono::steady_clock::time_point;
 
 constexpr std::size_t kReadBytes = 256 * 1024;
-// What all connections together may hold; the one among the large holders that
-// has been silent longest goes first.
+// What all connections together may hold; beyond that, messages are taken in one after the other.
 constexpr std::size_t kMaxHeldBytes = std::size_t{64} * 1024 * 1024;
+// How long one that is in the middle of a message may keep the others waiting then.
+constexpr auto kLongestHoldUp = std::chrono::seconds(1);
+constexpr int kHeldUpPollMilliseconds = 10;
 // New connections in a row before everybody else has a turn.
 constexpr int kAcceptsInARow = 64;
 constexpr auto kAcceptPause = std::chrono::seconds(1);
@@ -49,7 +52,7 @@ struct Connection : Peer {
   NamedService::MessageHandler handler;
   FrameBuffer frames;
   std::size_t waiting = 0;  // complete frames that have not been handled
-  std::uint64_t heard = 0;  // the higher, the later
+  Time heard;               // when it last said anything
   bool hasSpoken = false;   // a whole message has come
 };
 
@@ -91,7 +94,7 @@ class LinuxNamedService : public NamedService {
   void drop(Connection& connection) { connection.socket = Descriptor(); }
   void forgetDropped();
   std::shared_ptr<Connection> findQuietest() const;
-  void limitMemory(const Connection& reading);
+  bool mayHoldMore(const Connection& reading);
   template <typename Call>
   void guarded(Call call);
 
@@ -111,7 +114,7 @@ class LinuxNamedService : public NamedService {
   // listening socket.
   std::deque<std::shared_ptr<Connection>> ready_;
   std::vector<std::shared_ptr<Connection>> unfinished_;  // they may have more, in the next round
-  std::uint64_t clock_ = 0;
+  bool isHeldUp_ = false;  // a connection in unfinished_ waits for another
   std::string readBuffer_;
 };
 
@@ -196,7 +199,8 @@ void LinuxNamedService::findReady(Time deadline) {
   ready_.assign(unfinished_.begin(), unfinished_.end());
   unfinished_.clear();
   const Time end = std::min(deadline, acceptAgainAt_.value_or(deadline));
-  const int timeout = ready_.empty() ? PollTimeout(end) : 0;
+  int timeout = ready_.empty() ? PollTimeout(end) : 0;
+  if (std::exchange(isHeldUp_, false)) timeout = kHeldUpPollMilliseconds;
   if (!epoll_.isOpen()) {
     poll(nullptr, 0, timeout);
     return;
@@ -237,7 +241,7 @@ bool LinuxNamedService::acceptOne() {
     return false;
   }
   acceptFails_ = false;
-  ready_.push_front(nullptr);  // the next one in the queue came before what woke up later
+  ready_.push_front(nullptr);  // one wake-up stands for all in the queue
   ucred peer{};
   socklen_t size = sizeof peer;
   if (getsockopt(socket.get(), SOL_SOCKET, SO_PEERCRED, &peer, &size) != 0 ||
@@ -258,7 +262,7 @@ bool LinuxNamedService::acceptOne() {
     forgetDropped();
   }
   auto connection = std::make_shared<Connection>(std::move(socket));
-  connection->heard = ++clock_;
+  connection->heard = std::chrono::steady_clock::now();
   connections_.push_back(connection);
   return announce(connection);
 }
@@ -288,6 +292,10 @@ bool LinuxNamedService::announce(const std::shared_ptr<Connection>& connection) 
 void LinuxNamedService::readFrom(const std::shared_ptr<Connection>& connection) {
   readBuffer_.resize(kReadBytes);
   for (std::size_t taken = 0; taken < kReadBytes;) {
+    if (!mayHoldMore(*connection)) {
+      isHeldUp_ = true;
+      break;
+    }
     const ssize_t size = Uninterrupted(
         [&] { return recv(connection->socket.get(), readBuffer_.data(), readBuffer_.size(), 0); });
     if (size < 0 && errno == EAGAIN) return;
@@ -298,7 +306,7 @@ void LinuxNamedService::readFrom(const std::shared_ptr<Connection>& connection) 
       return;
     }
     taken += static_cast<std::size_t>(size);
-    connection->heard = ++clock_;
+    connection->heard = std::chrono::steady_clock::now();
     const std::size_t completed =
         connection->frames.append({readBuffer_.data(), static_cast<std::size_t>(size)});
     connection->hasSpoken = connection->hasSpoken || completed != 0;
@@ -312,7 +320,6 @@ void LinuxNamedService::readFrom(const std::shared_ptr<Connection>& connection) 
       drop(*connection);
       return;
     }
-    limitMemory(*connection);
   }
   unfinished_.push_back(connection);
 }
@@ -338,24 +345,25 @@ std::shared_ptr<Connection> LinuxNamedService::findQuietest() const {
   return quietest;
 }
 
-void LinuxNamedService::limitMemory(const Connection& reading) {
-  if (reading.frames.capacity() <= kReadBytes) return;
-  while (true) {
-    std::size_t held = 0;
-    std::shared_ptr<Connection> silent;
-    for (const auto& connection : connections_) {
-      held += connection->frames.capacity();
-      if (!connection->socket.isOpen() || connection.get() == &reading) continue;
-      if (connection->frames.capacity() <= kReadBytes) continue;
-      if (silent == nullptr || connection->heard < silent->heard) silent = connection;
-    }
-    if (held <= kMaxHeldBytes || silent == nullptr) return;
-    log_.error(
-        "Closing a connection that keeps back the rest of a message, to "
-        "save memory");
-    drop(*silent);
-    std::erase(connections_, silent);
+// Whether more may be read of the connection. Once all together hold too much, only the one that is
+// nearest to the end of its message is read, and dropped when it keeps back the rest; peers that
+// are only slow wait for it.
+bool LinuxNamedService::mayHoldMore(const Connection& reading) {
+  if (reading.frames.size() <= kReadBytes) return true;
+  std::size_t held = 0;
+  std::shared_ptr<Connection> first;
+  for (const auto& connection : connections_) {
+    held += connection->frames.size();
+    if (!connection->socket.isOpen()) continue;
+    if (first == nullptr || connection->frames.size() > first->frames.size()) first = connection;
   }
+  if (held <= kMaxHeldBytes || first.get() == &reading) return true;
+  if (std::chrono::steady_clock::now() - first->heard >= kLongestHoldUp) {
+    log_.error("Closing a connection that keeps back the rest of a message, to save memory");
+    drop(*first);
+    std::erase(connections_, first);
+  }
+  return false;
 }
 
 // What a handler throws must not end the service.

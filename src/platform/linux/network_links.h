@@ -21,7 +21,8 @@ enum class LinkKind { kWifi, kCellular };
 //   counts, as one of another kind: nothing says what is below it.
 //
 // It does not matter which interface is in use now: a total that began earlier may have gone over
-// every one of them.
+// every one of them. An interface that is gone cannot be known any more; what went over it counts
+// as the others'.
 std::optional<LinkKind> SoleLinkKind(const Root& root);
 
 }  // namespace quorlet

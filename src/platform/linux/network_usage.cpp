@@ -19,12 +19,10 @@ namespace {
 constexpr char kRecordsPath[] = "/var/db/vigil/usage.plist";
 constexpr std::chrono::milliseconds kUnitUsageLimit(100);
 constexpr double kMaxDelaySeconds = 30.0 * 86400;
-constexpr std::chrono::nanoseconds kNever =
-    std::chrono::hours(30 * 24);  // no process lives so long
 
 struct Answer {
   std::chrono::nanoseconds delay{0};
-  Array records;
+  std::optional<Array> records;  // none when they cannot be had
 };
 
 class LinuxNetworkUsage : public NetworkUsage {
@@ -60,10 +58,12 @@ class LinuxNetworkUsage : public NetworkUsage {
     try {
       const auto start = std::chrono::steady_clock::now();
       Answer answer = readAnswer();
-      if (!nameFilter.empty()) answer.records = Named(answer.records, nameFilter, kind);
+      if (answer.records && !nameFilter.empty()) {
+        answer.records = Named(*answer.records, nameFilter, kind);
+      }
       const auto used = std::chrono::steady_clock::now() - start;
       if (stop_->wait(std::max(answer.delay - used, std::chrono::nanoseconds(0)))) return;
-      reply(answer.records);
+      reply(answer.records ? &*answer.records : nullptr);
     } catch (const std::exception& error) {
       log_.error("A network usage reply failed: %@", error.what());
     } catch (...) {
@@ -132,10 +132,11 @@ class LinuxNetworkUsage : public NetworkUsage {
   // A service manager that is late has not answered: an empty reply would say that nobody has used
   // the network, and the counts to compare with would be gone.
   Answer readUnits() {
-    auto records = ReadUnitUsage(root_, kUnitUsageLimit);
-    if (records) return {.delay = {}, .records = std::move(*records)};
-    log_.error("The service manager did not say what its services transferred");
-    return {.delay = kNever, .records = {}};
+    Answer answer{.delay = {}, .records = ReadUnitUsage(root_, kUnitUsageLimit)};
+    if (!answer.records) {
+      log_.error("The service manager did not say what its services transferred");
+    }
+    return answer;
   }
 
   const Root root_;

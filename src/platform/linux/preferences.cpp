@@ -136,6 +136,7 @@ class LinuxPreferences : public Preferences {
     const std::lock_guard lock(mutex_);
     Domain* found = findDomain(domain);
     if (found == nullptr) return;
+    found->hasFailed = false;
     found->pending.insert_or_assign(StorableKey(key), std::move(value));
   }
 
@@ -151,8 +152,9 @@ class LinuxPreferences : public Preferences {
   struct Domain {
     std::optional<FileVersion> version;  // of `stored`; none before the first reading
     Dictionary stored;
-    bool damaged = false;  // there is a file, but `stored` is not from it
-    Changes pending;       // no value: the key is to be removed
+    bool damaged = false;    // there is a file, but `stored` is not from it
+    Changes pending;         // no value: the key is to be removed
+    bool hasFailed = false;  // the pending changes could not be written, and that was said
   };
 
   // The domain's state, or nullptr and an error line for a name that is refused.
@@ -198,13 +200,20 @@ class LinuxPreferences : public Preferences {
                std::get<std::string>(read));
   }
 
-  // As DGWPreferencesSynchronize.
+  // As DGWPreferencesSynchronize. What fails again is not said again.
   bool synchronize(std::string_view name, Domain& domain) {
+    domain.hasFailed = !write(name, domain);
+    return !domain.hasFailed;
+  }
+
+  bool write(std::string_view name, Domain& domain) {
     if (access_ == Access::kReadOnly) return true;
     if (isSettled(name, domain)) return true;  // nothing to write: no lock file either
     const FileLock lock(directory_ + "/." + std::string(name) + ".lock");
     if (lock.error() != 0) {
-      log_.error("Cannot lock the preferences %@: %@", path(name), ErrnoText(lock.error()));
+      if (!domain.hasFailed) {
+        log_.error("Cannot lock the preferences %@: %@", path(name), ErrnoText(lock.error()));
+      }
       return false;
     }
     return isSettled(name, domain) || writeMerged(name, domain);
@@ -265,7 +274,9 @@ class LinuxPreferences : public Preferences {
       return true;
     }
     if (const int error = replaceFile(name, domain.damaged, std::get<std::string>(document))) {
-      log_.error("Cannot write the preferences %@: %@", path(name), ErrnoText(error));
+      if (!domain.hasFailed) {
+        log_.error("Cannot write the preferences %@: %@", path(name), ErrnoText(error));
+      }
       return false;
     }
     domain.pending = std::move(refused);
