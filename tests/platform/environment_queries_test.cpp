@@ -2,10 +2,6 @@
 
 #include <gtest/gtest.h>
 
-#include <array>
-#include <atomic>
-#include <thread>
-
 #include "fakes/fake_platform.h"
 
 namespace quorlet {
@@ -19,16 +15,14 @@ TEST(EnvironmentQueries, TheOverrideFileCountsOnInternalDevicesOnly) {
     bool internal;
     bool overrideFile;
     bool expected;
-  } cases[] = {
-      {std::nullopt, true, true, true},
-      {0, true, true, true},
-      {std::nullopt, false, true, false},
-      {0, false, true, false},
-      {1, false, true, true},
-      {-1, true, false, true},
-      {0, true, false, false},
-      {std::nullopt, true, false, false},
-  };
+  } cases[] = {{std::nullopt, true, true, true},
+               {0, true, true, true},
+               {std::nullopt, false, true, false},
+               {0, false, true, false},
+               {1, false, true, true},
+               {-1, true, false, true},
+               {0, true, false, false},
+               {std::nullopt, true, false, false}};
   for (const auto& c : cases) {
     FakePlatform platform;
     platform.deviceInfo.answers["InternalBuild"] = c.internal;
@@ -58,21 +52,6 @@ TEST(EnvironmentQueries, TheContainerIsLookedUpUntilItIsFound) {
   platform.environment.containerError = 2;
   EXPECT_EQ(platform.queries.dataHomePath(), "/containers/systemgroup.nuvex.diagwell");
   EXPECT_EQ(FakePlatform().queries.dataHomePath(), "/var/mobile");
-}
-
-TEST(EnvironmentQueries, AnyThreadMayAskWhetherTheDeviceIsInternal) {
-  FakePlatform platform;
-  platform.deviceInfo.answers["InternalBuild"] = true;
-  std::atomic<int> internal = 0;
-  {
-    std::array<std::jthread, 8> threads;
-    for (std::jthread& thread : threads) {
-      thread = std::jthread([&] { internal += platform.queries.TLIsInternalDevice() ? 1 : 0; });
-    }
-  }
-  EXPECT_EQ(internal, 8);
-  platform.deviceInfo.answers["InternalBuild"] = false;
-  EXPECT_TRUE(platform.queries.TLIsInternalDevice());
 }
 
 }  // namespace

@@ -1,6 +1,5 @@
 // The Linux services against the files of a temporary root.
 #include <gtest/gtest.h>
-#include <sys/file.h>
 #include <sys/stat.h>
 #include <unistd.h>
 
@@ -235,15 +234,6 @@ TEST_F(LinuxServices, KernelParametersAreFilesAndQueues) {
     root.write("/proc/meminfo", std::string("SwapTotal: ") + total + " kB\nSwapFree: 0 kB\n");
     EXPECT_EQ(ask("vm.swapusage", 32), kMissing) << total;
   }
-}
-
-TEST_F(LinuxServices, APassExcludesOthers) {
-  const auto pass = MakeLinuxPassLock(root.root(), Access::kReadWrite, log);
-  pass->lock();
-  const Descriptor other(open(root.path("/run/quorlet/pass.lock").c_str(), O_RDWR));
-  EXPECT_NE(flock(other.get(), LOCK_EX | LOCK_NB), 0);
-  pass->unlock();
-  EXPECT_EQ(flock(other.get(), LOCK_EX | LOCK_NB), 0);
 }
 
 }  // namespace

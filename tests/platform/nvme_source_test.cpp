@@ -44,9 +44,12 @@ Data HealthPage() {
   for (std::size_t i = 0; i < std::size(counters); ++i) put(32 + 16 * i, 16, counters[i]);
   return page;
 }
+// By the keys of the export.
+// clang-format off
 const Statistics kOfPage = {
-    {53, 0x20002},   {36, 0},     {7, 1'168'951'250}, {4, 1'292'342'375}, {3, 77'209'705},
-    {2, 94'922'330}, {10, 1'163}, {34, 1'055},        {11, 134},          {172, 0}};
+    {53, 0x20002}, {36, 0}, {7, 1'168'951'250}, {4, 1'292'342'375}, {3, 77'209'705},
+    {2, 94'922'330}, {10, 1'163}, {34, 1'055}, {11, 134}, {172, 0}};
+// clang-format on
 
 TEST(NvmeStatistics, TheDictionaryTellsWhatTheDriveReports) {
   NvmeFacts facts;
