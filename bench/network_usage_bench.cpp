@@ -14,10 +14,8 @@
 #include <vector>
 
 #include "collectors/network_usage.h"
-#include "platform/environment_queries.h"
-#include "platform/linux/counter_store.h"
+#include "platform/linux/linux_platform.h"
 #include "platform/linux/services.h"
-#include "platform/linux/tally_ledger.h"
 #include "platform/network_usage.h"
 
 namespace quorlet::bench {
@@ -63,23 +61,16 @@ Array Records(Date since, std::int64_t count) {
 
 void ProcessReply(benchmark::State& state) {
   const TemporaryDirectory directory;
-  const Root root(directory.path());
-  const auto log = MakeStandardErrorLog();
-  const auto clock = MakeLinuxClock();
-  const auto preferences = MakeLinuxPreferences(root, Access::kReadWrite, *log);
-  const auto deviceInfo = MakeLinuxDeviceInfo(root, *log);
-  const auto environment = MakeLinuxEnvironment(root, *deviceInfo, *log);
-  EnvironmentQueries queries(*deviceInfo, *environment, *log);
-  const auto ledger = MakeTallyLedger(root, Access::kReadWrite, queries, *preferences, *log);
-  const auto store = MakeLinuxCounterStore(*ledger, *clock);
-  const Date since = clock->now();
+  LinuxPlatform device(Root(directory.path()), Access::kReadWrite, MakeStandardErrorLog());
+  Platform& platform = device.services();
+  const Date since = platform.clock.now();
   std::int64_t count = 1'000'000;
-  processDataUsageReply(Records(since, count), *store, *preferences, *log);
+  processDataUsageReply(Records(since, count), platform);
   for (auto _ : state) {
     state.PauseTiming();
     const Array records = Records(since, count += 1'000'000);
     state.ResumeTiming();
-    processDataUsageReply(records, *store, *preferences, *log);
+    processDataUsageReply(records, platform);
   }
 }
 BENCHMARK(ProcessReply)->Unit(benchmark::kMillisecond);

@@ -43,17 +43,24 @@ Dictionary EntryFromRecord(const Record& record) {
 
 void logECCEvents(Platform& platform) {
   std::size_t length = kRecordSize;
-  for (int handled = 0; handled < kEventsPerPass; ++handled) {
+  bool allLogged = true;
+  int logged = 0;
+  for (; allLogged && logged < kEventsPerPass; ++logged) {
     // Zero for each event, so that a short one does not show the registers of the one before.
     Record record{};
     const auto buffer = std::span(record).first(std::min(length, kRecordSize));
     const int error = platform.kernelParameters.sysctlbyname(kParameter, buffer, length);
-    if (error == ENOENT || error == EBUSY) return;
+    if (error == ENOENT || error == EBUSY) break;
     if (error != 0) {
       platform.log.log("Unexpected errno (%d) reading ECC events from kernel", error);
-      return;
+      break;
     }
-    platform.crashSupport.FSLogStructuredData(kStructuredLogType, EntryFromRecord(record));
+    allLogged =
+        platform.crashSupport.FSLogStructuredData(kStructuredLogType, EntryFromRecord(record));
+  }
+  // Only what is durable leaves the queue: killed before, an event is logged twice, but never lost.
+  if (logged > 0 && allLogged && platform.crashSupport.syncStructuredData()) {
+    platform.kernelParameters.removeTaken(kParameter);
   }
 }
 

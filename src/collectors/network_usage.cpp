@@ -1,5 +1,7 @@
 // The baseline is the preference "netUsageBaseline": a dictionary with a row for each name, an
 // array of the since-time and the four counts in the order of kFields, as they were received.
+// The store's note has the same dictionary as "baseline", and as "replaced" the digest of the one
+// before it.
 #include "collectors/network_usage.h"
 
 #include <algorithm>
@@ -8,6 +10,7 @@
 #include <cmath>
 #include <cstddef>
 #include <cstdint>
+#include <functional>
 #include <limits>
 #include <memory>
 #include <mutex>
@@ -15,9 +18,11 @@
 #include <string>
 #include <string_view>
 #include <utility>
+#include <variant>
 #include <vector>
 
 #include "platform/run_step.h"
+#include "values/digest.h"
 #include "values/property_list.h"
 
 namespace quorlet {
@@ -25,6 +30,7 @@ namespace {
 
 constexpr char kDomain[] = "nuvex.diagwell.quorlet";
 constexpr char kBaseline[] = "netUsageBaseline";
+constexpr char kNote[] = "network-usage-baseline";
 constexpr std::chrono::seconds kReplyLimit{10};
 constexpr double kSecondsPerDay = 86400;
 
@@ -92,7 +98,7 @@ std::size_t RowBytes(std::string_view name) {
 // Compares the records of one reply with the baseline.
 class UsageComparison {
  public:
-  UsageComparison(Dictionary baseline, std::int64_t yesterday)
+  UsageComparison(Dictionary baseline, std::int32_t yesterday)
       : old_(std::move(baseline)), yesterday_(yesterday) {}
 
   // Rows and records are gone through together, in the order of the rows' names.
@@ -110,7 +116,7 @@ class UsageComparison {
     }
   }
 
-  UsageGrowth take() { return {std::move(changes_), new_}; }
+  UsageGrowth take() { return {std::move(changes_), new_, std::nullopt}; }
   // How many records were refused for their size.
   std::uint64_t leftOut() const { return leftOut_; }
 
@@ -166,23 +172,27 @@ class UsageComparison {
   void addToKey(std::string_view kind, const UsageRecord& record, std::int64_t value) {
     std::string key("datausage.");
     key.append(kind).append(record.prefix).append(record.name);
-    changes_.push_back({ScalarChange::Kind::kAdd, std::move(key), value});
+    changes_.push_back({ScalarChange::Kind::kAdd, std::move(key), value, yesterday_ + 1});
   }
 
   const Dictionary old_;
-  const std::int64_t yesterday_;
+  const std::int32_t yesterday_;
   std::vector<ScalarChange> changes_;
   Dictionary new_;
   std::size_t room_ = kBaselineBytes;
   std::uint64_t leftOut_ = 0;
 };
 
-UsageGrowth CompareWithBaseline(const Array& records, CounterStore& counterStore,
-                                Preferences& preferences, SystemLog& log) {
-  const std::int64_t yesterday = std::int64_t{counterStore.TLDaysSince1970()} - 1;
-  const auto stored = preferences.DGWPreferencesGetValue(kBaseline, kDomain);
-  const Dictionary* baseline = stored ? stored->asDictionary() : nullptr;
-  UsageComparison comparison(baseline != nullptr ? *baseline : Dictionary(), yesterday);
+// Tells one stored baseline from another, also after it has been in a file.
+std::string DigestOf(const Dictionary* baseline) {
+  if (baseline == nullptr) return "none";
+  const auto text = WriteXmlPropertyList(*baseline);
+  const auto* bytes = std::get_if<std::string>(&text);
+  return bytes != nullptr ? HexDigest(DigestKind::kSha256, *bytes) : "unknown";
+}
+
+UsageComparison Compare(const Array& records, const Dictionary& baseline, Platform& platform) {
+  UsageComparison comparison(baseline, platform.counterStore.TLDaysSince1970() - 1);
   std::vector<UsageRecord> complete;
   for (const PropertyValue& value : records) {
     const Dictionary* dictionary = value.asDictionary();
@@ -191,66 +201,114 @@ UsageGrowth CompareWithBaseline(const Array& records, CounterStore& counterStore
   }
   comparison.add(std::move(complete));
   if (comparison.leftOut() != 0) {
-    log.error("Left out %llu network usage records whose names are too long or that are too many",
-              comparison.leftOut());
+    platform.log.error(
+        "Left out %llu network usage records whose names are too long or that are too many",
+        comparison.leftOut());
   }
-  return comparison.take();
+  return comparison;
 }
 
-// The baseline only after the counters: lost counters are added again by the next run.
-void WriteGrowth(const UsageGrowth& growth, CounterStore& counterStore, Preferences& preferences) {
-  if (growth.changes.empty() || counterStore.writeScalars(growth.changes)) {
-    storeBaseline(growth.baseline, preferences);
+// Nothing when what the counts are to be compared with cannot be read: they are there next time.
+std::optional<UsageGrowth> CompareWithBaseline(const Array& records, Platform& platform) {
+  const auto stored = platform.preferences.DGWPreferencesGetValue(kBaseline, kDomain);
+  std::optional<Dictionary> noted;
+  if (!platform.preferences.isReadable(kDomain) || !platform.counterStore.readNote(kNote, noted)) {
+    platform.log.error("Network usage is not counted now: its baseline cannot be read");
+    return std::nullopt;
+  }
+  const Dictionary* baseline = stored ? stored->asDictionary() : nullptr;
+  const std::string digest = DigestOf(baseline);
+  const std::string* replaced = noted ? StringEntry(*noted, "replaced") : nullptr;
+  const Dictionary* notedBaseline = noted ? DictionaryEntry(*noted, "baseline") : nullptr;
+  const bool isLeftBehind = replaced != nullptr && *replaced == digest && notedBaseline != nullptr;
+  const Dictionary* old = isLeftBehind ? notedBaseline : baseline;
+  UsageGrowth growth = Compare(records, old != nullptr ? *old : Dictionary(), platform).take();
+  if (DigestOf(&growth.baseline) != digest) {
+    growth.note = StoreNote{kNote, Dictionary{{"replaced", digest}, {"baseline", growth.baseline}}};
+  }
+  return growth;
+}
+
+// The baseline only after the counters.
+void WriteGrowth(UsageGrowth growth, Platform& platform) {
+  StoreChanges changes;
+  changes.scalars = std::move(growth.changes);
+  if (growth.note) changes.notes.push_back(*std::move(growth.note));
+  if (changes.empty() || platform.counterStore.write(changes)) {
+    storeBaseline(growth.baseline, platform.preferences);
   }
 }
 
-}  // namespace
-
-void storeBaseline(const Dictionary& baseline, Preferences& preferences) {
-  preferences.DGWPreferencesSetValue(kBaseline, baseline, kDomain);
-  preferences.DGWPreferencesSynchronize(kDomain);
-}
-
-void processDataUsageReply(const Array& records, CounterStore& counterStore,
-                           Preferences& preferences, SystemLog& log) {
-  WriteGrowth(CompareWithBaseline(records, counterStore, preferences, log), counterStore,
-              preferences);
-}
-
-std::optional<UsageGrowth> collectDataUsage(Platform& platform) {
-  // Shared with the reply, which may come when nobody waits any more.
+// Asks for the counts of all processes. `process` turns the records into what is waited for; `late`
+// gets it when nobody waits any more. Both run on the service's thread.
+template <typename Result>
+std::optional<Result> AskForUsage(Platform& platform,
+                                  std::function<std::optional<Result>(const Array&)> process,
+                                  std::function<void(Result)> late) {
+  // Shared with the reply.
   struct Waiting {
     std::mutex mutex;
     bool hasGivenUp = false;
-    std::optional<UsageGrowth> growth;
+    std::optional<Result> result;
   };
   const auto waiting = std::make_shared<Waiting>();
   const std::shared_ptr<Semaphore> replied = platform.semaphores.create();
   platform.networkUsage.QueryProcessDataUsage(
       {}, UsageNameKind::kProcessName,
-      [replied, waiting, &counterStore = platform.counterStore, &preferences = platform.preferences,
-       &log = platform.log](const Array* records) {
+      [replied, waiting, process, late, &log = platform.log](const Array* records) {
         RunStep(log, "network usage reply", [&] {
           if (records == nullptr) return;
-          UsageGrowth growth = CompareWithBaseline(*records, counterStore, preferences, log);
-          // The comparison of many records takes its time: the pass must not wait for the lock.
+          std::optional<Result> result = process(*records);
+          if (!result) return;
+          // Processing many records takes its time: the pass must not wait for the lock.
           std::unique_lock hold(waiting->mutex);
           if (!waiting->hasGivenUp) {
-            waiting->growth = std::move(growth);
+            waiting->result = std::move(result);
             return;
           }
           hold.unlock();
-          WriteGrowth(growth, counterStore, preferences);
+          late(*std::move(result));
         });
         replied->signal();
       });
   const bool isInTime = replied->wait(kReplyLimit);
   const std::lock_guard hold(waiting->mutex);
-  if (!isInTime && !waiting->growth) {
+  if (!isInTime && !waiting->result) {
     platform.log.log("Vigil timed out, no datausage available");
   }
   waiting->hasGivenUp = true;
-  return std::move(waiting->growth);
+  return std::move(waiting->result);
+}
+
+}  // namespace
+
+bool storeBaseline(const Dictionary& baseline, Preferences& preferences) {
+  preferences.DGWPreferencesSetValue(kBaseline, baseline, kDomain);
+  return preferences.DGWPreferencesSynchronize(kDomain);
+}
+
+StoreNote forgottenBaseline() { return {kNote, std::nullopt}; }
+
+void processDataUsageReply(const Array& records, Platform& platform) {
+  if (auto growth = CompareWithBaseline(records, platform)) {
+    WriteGrowth(*std::move(growth), platform);
+  }
+}
+
+std::optional<UsageGrowth> collectDataUsage(Platform& platform) {
+  return AskForUsage<UsageGrowth>(
+      platform,
+      [platform](const Array& records) mutable { return CompareWithBaseline(records, platform); },
+      [platform](UsageGrowth growth) mutable { WriteGrowth(std::move(growth), platform); });
+}
+
+std::optional<Dictionary> askForBaseline(Platform& platform) {
+  return AskForUsage<Dictionary>(
+      platform,
+      [platform](const Array& records) mutable {
+        return std::optional(Compare(records, Dictionary(), platform).take().baseline);
+      },
+      [](const Dictionary&) {});
 }
 
 }  // namespace quorlet

@@ -31,12 +31,22 @@ void CollectDiskUsage(DeviceInfo& deviceInfo, CounterBatch& counters) {
 
 }  // namespace
 
-void collectPlatformStatistics(Platform& platform) {
+void collectPlatformStatistics(Platform& platform, const PassProgress& progress) {
   SystemLog& log = platform.log;
-  // Written at the end in one go. The gated pass is made anew when it is killed before.
+  CrashSupport& support = platform.crashSupport;
   CounterBatch counters(platform.counterStore);
+  // The storage log is staged, and published once the store knows of it: cut short before, it is
+  // dropped; cut short after, the next pass publishes it and makes none of its own.
+  const bool logsStorage = !progress.storageLogged;
+  if (logsStorage) static_cast<void>(support.stageEntries());
   RunStep(log, "disk usage", [&] { CollectDiskUsage(platform.deviceInfo, counters); });
-  RunStep(log, "storage", [&] { PushNANDInfoScalars(platform, counters); });
+  RunStep(log, "storage", [&] { PushNANDInfoScalars(platform, counters, logsStorage); });
+  // Before the network's answer, which may be waited for into the next day.
+  RunStep(log, "storage counters", [&] {
+    if (logsStorage && progress.storageLoggedNote) counters.add(progress.storageLoggedNote());
+    counters.commit();
+  });
+  RunStep(log, "storage log", [&] { static_cast<void>(support.publishStagedEntries()); });
   RunStep(log, "ECC events", [&] { logECCEvents(platform); });
   std::optional<UsageGrowth> usage;
   RunStep(log, "network usage", [&] { usage = collectDataUsage(platform); });
@@ -44,8 +54,9 @@ void collectPlatformStatistics(Platform& platform) {
           [&] { collectReportingChannelMetrics(platform.driverRegistry, counters); });
   RunStep(log, "counters", [&] {
     if (usage) counters.add(std::move(usage->changes));
-    // The two stores cannot be changed at once. This way round, a pass that is killed in between,
-    // or that cannot write its counters, loses no traffic: the next one adds the same growth again.
+    if (usage && usage->note) counters.add(*std::move(usage->note));
+    // The two stores cannot be changed at once. The store remembers the baseline as well, for a
+    // pass that is killed in between.
     if (counters.commit() && usage) storeBaseline(usage->baseline, platform.preferences);
   });
 }

@@ -29,14 +29,15 @@ class CapturingDiagnostics final : public Diagnostics {
   std::optional<PropertyValue> DGWGetDATaskingValue(std::string_view name) override {
     return diagnostics_.DGWGetDATaskingValue(name);
   }
-  bool DGWWriteLogForSubmission(std::string_view, std::string_view,
-                                const std::optional<Dictionary>&,
-                                const LogWriter& writer) override {
+  bool writeLog(const LogRequest&, const LogWriter& writer) override {
     Capture capture;
     if (!writer(capture)) return false;
     body_ = std::move(capture.bytes);
     return true;
   }
+  bool hasLog(const std::string&) override { return false; }
+  bool removeLogs(std::span<const std::string>) override { return false; }
+  bool removeAllLogs() override { return false; }
   void SubmitDiagnosticLogs() override {}
 
   // The captured log's body, or nothing when none was written.

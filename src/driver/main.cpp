@@ -37,7 +37,7 @@ void RunArgument(Platform& platform, const char* argument) {
 
 void Run(int argumentCount, char** arguments) {
   quorlet::LinuxPlatform linuxPlatform(quorlet::Root::FromEnvironment(),
-                                       quorlet::Access::kReadWrite);
+                                       quorlet::Access::kReadWrite, nullptr, quorlet::kPassOptions);
   Platform& platform = linuxPlatform.services();
   platform.log.log("quorlet started");
   try {

@@ -1,8 +1,10 @@
 #include "driver/run_driver.h"
 
-#include <mutex>
+#include <string>
 
 #include "collectors/platform_statistics.h"
+#include "driver/consent.h"
+#include "driver/pass_journal.h"
 #include "driver/tasking.h"
 #include "platform/run_step.h"
 #include "report/report.h"
@@ -13,39 +15,93 @@ namespace {
 constexpr char kDomain[] = "nuvex.aggregated.quorlet";
 constexpr char kLastDay[] = "LastCrashLogSerializationDateInDaysSince1970";
 
+// A gate that is further ahead than this was recorded while the clock was wrong.
+constexpr std::int32_t kFarAhead = 30;
+
+// What repeats the pass for `day` by hand.
+std::string CommandFor(std::int32_t day, std::int32_t today) {
+  if (day == today - 1) return "quorlet -f";
+  if (day == today) return "quorlet -t";
+  return "quorletctl send run-day " + std::to_string(day);
+}
+
 }  // namespace
 
 void RunDriver::runDailyTasksIfNewDay(const std::optional<Array>& appInfo) {
   // Taken before the gate is asked: of several processes started at once, one makes the pass.
-  const std::lock_guard hold(platform_.passLock);
-  const std::int32_t yesterday = platform_.counterStore.TLDaysSince1970() - 1;
-  if (platform_.preferences.DGWPreferencesGetIntegerValue(kLastDay, kDomain) >= yesterday) {
-    platform_.log.log("Day unchanged since last run");
+  const PassHold hold(platform_.passLock);
+  if (!hold.isHeld()) {
+    platform_.log.error("No daily pass without its lock; the next start tries again");
     return;
   }
-  runSequence(yesterday, appInfo);
-  platform_.preferences.DGWPreferencesSetValue(kLastDay, Int32(yesterday), kDomain);
-  platform_.preferences.DGWPreferencesSynchronize(kDomain);
+  Preferences& preferences = platform_.preferences;
+  if (!preferences.isReadable(kDomain)) {
+    platform_.log.error("No daily pass while the day of the last one cannot be read");
+    return;
+  }
+  const std::int32_t yesterday = platform_.counterStore.TLDaysSince1970() - 1;
+  const std::int64_t last = preferences.DGWPreferencesGetIntegerValue(kLastDay, kDomain);
+  if (last >= yesterday) {
+    platform_.log.log("Day unchanged since last run");
+    if (last > std::int64_t{yesterday} + kFarAhead) warnOfFutureDay(last);
+    return;
+  }
+  PassJournal journal(platform_, yesterday, /*isGated=*/true, last);
+  runSequence(yesterday, appInfo, journal);
+  preferences.DGWPreferencesSetValue(kLastDay, Int32(yesterday), kDomain);
+  preferences.DGWPreferencesSynchronize(kDomain);
+  journal.end();
 }
 
 void RunDriver::runDailyTasks(std::int32_t day, const std::optional<Array>& appInfo) {
-  const std::lock_guard hold(platform_.passLock);
-  runSequence(day, appInfo);
+  const PassHold hold(platform_.passLock);
+  const std::int64_t last = platform_.preferences.DGWPreferencesGetIntegerValue(kLastDay, kDomain);
+  PassJournal journal(platform_, day, /*isGated=*/false, last);
+  runSequence(day, appInfo, journal);
+  journal.end();
 }
 
-void RunDriver::runSequence(std::int32_t day, const std::optional<Array>& appInfo) {
+void RunDriver::warnOfFutureDay(std::int64_t day) {
+  platform_.log.error(
+      "The last daily pass is recorded for day %lld, far in the future: no pass runs until then. "
+      "If "
+      "today's date is right, \"quorletctl prefs remove %s %s\" lets passes run again",
+      day, kDomain, kLastDay);
+}
+
+ReportOutcome RunDriver::writeLog(std::int32_t day, const std::optional<Array>& appInfo,
+                                  PassJournal& journal) {
+  if (!platform_.diagnostics.DiagnosticLogSubmissionEnabled()) {
+    platform_.log.info("No log is written: the device's owner has not consented to submission");
+    return ReportOutcome::kNothingToReport;
+  }
+  if (!finishDueDrop(platform_)) return ReportOutcome::kLost;
+  const std::optional<Array> records = journal.takeAppInfo(appInfo);
+  Platform platform = platform_.with({.diagnostics = &journal.diagnostics()});
+  TLReport report(platform, journal.usedUp());
+  return report.writeLogForYesterdayWithAppInfo(day, records);
+}
+
+void RunDriver::runSequence(std::int32_t day, const std::optional<Array>& appInfo,
+                            PassJournal& journal) {
   SystemLog& log = platform_.log;
   log.log("daily tasks for day %d", day);
   RunStep(log, "checkpoint", [&] { platform_.counterStore.TLClientCheckpoint(); });
-  RunStep(log, "aggregated log", [&] {
-    if (!platform_.diagnostics.DiagnosticLogSubmissionEnabled()) return;
-    TLReport report(platform_);
-    report.writeLogForYesterdayWithAppInfo(day, appInfo);
+  auto outcome = ReportOutcome::kLost;
+  RunStep(log, "aggregated log", [&] { outcome = writeLog(day, appInfo, journal); });
+  if (outcome == ReportOutcome::kLost) {
+    const std::int32_t today = platform_.counterStore.TLDaysSince1970();
+    log.error("The log of day %d is not in the spool; \"%s\" repeats it", day,
+              CommandFor(day, today));
+  }
+  RunStep(log, "platform statistics", [&] {
+    Platform platform = platform_.with({.diagnostics = &journal.diagnostics()});
+    collectPlatformStatistics(platform, journal.progress());
   });
-  RunStep(log, "platform statistics", [&] { collectPlatformStatistics(platform_); });
   RunStep(log, "structured logs", [&] { platform_.crashSupport.FSDumpAllOldStructuredDataLogs(); });
   RunStep(log, "tasking", [&] { updateTasking(platform_); });
   RunStep(log, "support logs", [&] { platform_.crashSupport.rollCarewellLogs(); });
+  RunStep(log, "record of the pass", [&] { journal.settle(outcome); });
 }
 
 }  // namespace quorlet

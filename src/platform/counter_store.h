@@ -9,9 +9,11 @@
 #include <functional>
 #include <iterator>
 #include <memory>
+#include <optional>
 #include <span>
 #include <string>
 #include <string_view>
+#include <utility>
 #include <vector>
 
 #include "values/property_value.h"
@@ -32,7 +34,7 @@ class TLHistoryDistributionEnumerator {
   virtual ~TLHistoryDistributionEnumerator() = default;
 
   // Writes the next value and the second of the day at which it was recorded, or returns false
-  // when there are no more.
+  // when there are no more, or no more that could be read.
   bool getNextValueSecondsInDayOffset(double& value, std::int32_t& secondsInDay) {
     if (position_ == block_.size()) {
       block_ = nextBlock();
@@ -44,6 +46,8 @@ class TLHistoryDistributionEnumerator {
     ++position_;
     return true;
   }
+  // Whether the values ended because the rest could not be read.
+  virtual bool failed() const { return false; }
 
  protected:
   // The next samples, empty at the end; the enumerator owns them until the next call.
@@ -74,14 +78,33 @@ class TLHistory {
   virtual void distributionsForKeyPrefixMinDaysSince1970MaxDaysSince1970RowHandler(
       std::string_view keyPrefix, std::int32_t minDay, std::int32_t maxDay,
       const DistributionHandler& rowHandler) = 0;
+
+  // Whether rows are missing because they could not be read.
+  virtual bool failed() const = 0;
 };
 
-// One change of today's value of a scalar key.
+// One change of a day's value of a scalar key.
 struct ScalarChange {
   enum class Kind { kSet, kAdd };
   Kind kind;
   std::string key;
   std::int64_t value;
+  std::int32_t day;  // the day on which the value was measured
+};
+
+// What the program itself has to remember in step with the counters. No value: it is forgotten.
+struct StoreNote {
+  std::string name;
+  std::optional<Dictionary> value;
+};
+
+// Changes that are made together, in this order.
+struct StoreChanges {
+  bool dropCounters = false;  // every scalar and distribution of every day
+  std::vector<ScalarChange> scalars;
+  std::vector<StoreNote> notes;
+
+  bool empty() const { return !dropCounters && scalars.empty() && notes.empty(); }
 };
 
 class CounterStore {
@@ -94,26 +117,36 @@ class CounterStore {
   // The instant at which `day` starts.
   virtual Date dateForDaysSince1970(std::int32_t day) = 0;
 
-  // Makes everything recorded so far durable and drops rows older than 30 days.
+  // Makes everything recorded so far durable, looks for damage and drops rows older than 30 days.
   virtual void TLClientCheckpoint() = 0;
 
-  // Makes all changes in order and at once: in one short transaction, where the store has them. A
-  // failure leaves one error line, and none of them is made: false. A change whose key the store
-  // cannot take (longer than 64 KiB, say) is left out, with an error line of its own.
-  [[nodiscard]] virtual bool writeScalars(std::span<const ScalarChange> changes) = 0;
+  // Makes all changes in one short transaction, durable when it returns. A failure leaves one error
+  // line, and none of them is made: false. A change whose key the store cannot take (longer than
+  // 64 KiB, say) is left out, with an error line of its own.
+  [[nodiscard]] virtual bool write(const StoreChanges& changes) = 0;
+
+  // Reads the note of that name, nothing when there is none. False, after an error line, when that
+  // cannot be known.
+  [[nodiscard]] virtual bool readNote(std::string_view name, std::optional<Dictionary>& value) = 0;
 
   // Sets, or adds to (saturating), today's value of one key.
   void TLClientSetValueForScalarKey(std::string_view key, std::int64_t value) {
-    const ScalarChange change{ScalarChange::Kind::kSet, std::string(key), value};
-    static_cast<void>(writeScalars({&change, 1}));
+    change(ScalarChange::Kind::kSet, key, value);
   }
   void TLClientAddValueForScalarKey(std::string_view key, std::int64_t value) {
-    const ScalarChange change{ScalarChange::Kind::kAdd, std::string(key), value};
-    static_cast<void>(writeScalars({&change, 1}));
+    change(ScalarChange::Kind::kAdd, key, value);
   }
 
-  // A reader on the store's default location, or nullptr when it cannot be opened.
+  // A reader on the store's default location, or nullptr when there is no store. One that cannot be
+  // opened gives a reader that has failed, after an error line.
   virtual std::unique_ptr<TLHistory> initWithDefaultPath() = 0;
+
+ private:
+  void change(ScalarChange::Kind kind, std::string_view key, std::int64_t value) {
+    StoreChanges changes;
+    changes.scalars.push_back({kind, std::string(key), value, TLDaysSince1970()});
+    static_cast<void>(write(changes));
+  }
 };
 
 // Collects changes and hands them to the store together, so that writers with many values hold its
@@ -126,26 +159,25 @@ class CounterBatch {
   // What has not been committed is dropped.
   ~CounterBatch() = default;
 
+  // A value that was measured today.
   void TLClientSetValueForScalarKey(std::string_view key, std::int64_t value) {
-    changes_.push_back({ScalarChange::Kind::kSet, std::string(key), value});
-  }
-  void TLClientAddValueForScalarKey(std::string_view key, std::int64_t value) {
-    changes_.push_back({ScalarChange::Kind::kAdd, std::string(key), value});
+    changes_.scalars.push_back(
+        {ScalarChange::Kind::kSet, std::string(key), value, store_.TLDaysSince1970()});
   }
   void add(std::vector<ScalarChange> changes) {
-    changes_.insert(changes_.end(), std::make_move_iterator(changes.begin()),
-                    std::make_move_iterator(changes.end()));
+    changes_.scalars.insert(changes_.scalars.end(), std::make_move_iterator(changes.begin()),
+                            std::make_move_iterator(changes.end()));
   }
+  void add(StoreNote note) { changes_.notes.push_back(std::move(note)); }
   // Writes what was collected; the batch is empty afterwards. False when none of it was written.
   bool commit() {
-    const bool written = changes_.empty() || store_.writeScalars(changes_);
-    changes_.clear();
-    return written;
+    const StoreChanges changes = std::exchange(changes_, {});
+    return changes.empty() || store_.write(changes);
   }
 
  private:
   CounterStore& store_;
-  std::vector<ScalarChange> changes_;
+  StoreChanges changes_;
 };
 
 }  // namespace quorlet

@@ -4,6 +4,7 @@
 
 #include <functional>
 #include <optional>
+#include <span>
 #include <string>
 #include <string_view>
 
@@ -17,6 +18,16 @@ class LogOutput {
   virtual ~LogOutput() = default;
   // False when the bytes could not be written; the log then fails as a whole.
   virtual bool write(std::string_view bytes) = 0;
+};
+
+// A log to be written.
+struct LogRequest {
+  std::string_view typeCode;  // a decimal number
+  std::string_view name;
+  std::optional<Dictionary> metadata;
+  // Called with the name of the log's file before that can be seen; may be empty. It must not use
+  // the diagnostics.
+  std::function<void(const std::string& fileName)> beforePublication;
 };
 
 class Diagnostics {
@@ -36,12 +47,23 @@ class Diagnostics {
 
   // Creates a log of type `typeCode` (a decimal number) for later submission, with `writer`
   // writing its body before the call returns. The log appears whole or not at all; false says
-  // that it does not, and one error line in the system log says why.
-  virtual bool DGWWriteLogForSubmission(std::string_view typeCode, std::string_view name,
-                                        const std::optional<Dictionary>& metadata,
-                                        const LogWriter& writer) = 0;
+  // that it does not, and one line in the system log says why: an error, or, while submission is
+  // not enabled, for information.
+  bool DGWWriteLogForSubmission(std::string_view typeCode, std::string_view name,
+                                const std::optional<Dictionary>& metadata,
+                                const LogWriter& writer) {
+    return writeLog({typeCode, name, metadata, {}}, writer);
+  }
+  virtual bool writeLog(const LogRequest& request, const LogWriter& writer) = 0;
 
-  // Hands every log written so far to the uploader.
+  // Whether a log of that file name has been written and not been taken away.
+  virtual bool hasLog(const std::string& fileName) = 0;
+  // Removes logs durably; one that is gone already is no failure. False after an error line.
+  virtual bool removeLogs(std::span<const std::string> fileNames) = 0;
+  // Removes every log durably. False after an error line.
+  virtual bool removeAllLogs() = 0;
+
+  // Hands every log written so far to the uploader; while submission is not enabled, none.
   virtual void SubmitDiagnosticLogs() = 0;
 };
 

@@ -17,6 +17,11 @@ class KernelParameters {
   // `buffer` is too small.
   virtual int sysctlbyname(std::string_view name, std::span<std::byte> buffer,
                            std::size_t& length) = 0;
+
+  // What a queue handed out stays in it until it is removed here, so that it is never lost between
+  // the queue and where it goes; the next read gives the next one all the same. False, after an
+  // error line, when something could not be removed.
+  virtual bool removeTaken(std::string_view name) = 0;
 };
 
 }  // namespace quorlet

@@ -53,6 +53,7 @@ struct Platform {
   StandardError& standardError;
 
   struct Others {
+    CounterStore* counterStore = nullptr;
     Diagnostics* diagnostics = nullptr;
     CrashSupport* crashSupport = nullptr;
     StandardError* standardError = nullptr;

@@ -31,6 +31,15 @@ class Preferences {
   // refused for good, such as a value that no file can hold, does not count as a failure.
   virtual bool DGWPreferencesSynchronize(std::string_view domain) = 0;
 
+  // Adds to an integer: when the domain is synchronized, to the value that is durable by then, so
+  // that no other process's change is lost. Saturates, and never goes below 0. Several additions
+  // add up; setting the key takes them back.
+  virtual void addToInteger(std::string_view key, std::int64_t delta, std::string_view domain) = 0;
+
+  // Whether what is durable can be read. A domain that cannot reads as empty, after one error line,
+  // and is never replaced: synchronizing it fails.
+  virtual bool isReadable(std::string_view domain) = 0;
+
   // The value when it is a boolean, otherwise false; `found` says whether it is one.
   bool DGWPreferencesGetBoolValue(std::string_view key, std::string_view domain, bool& found);
 

@@ -1,13 +1,10 @@
 #include "report/config.h"
 
-#include <openssl/crypto.h>
-#include <openssl/evp.h>
-
-#include <array>
 #include <set>
 #include <utility>
 #include <variant>
 
+#include "values/digest.h"
 #include "values/property_list.h"
 
 namespace quorlet {
@@ -15,24 +12,6 @@ namespace {
 
 constexpr std::string_view kInternalTesting = "InternalTesting";
 constexpr std::string_view kTaskingDomain = "nuvex.da";
-
-// Lower-case hexadecimal MD5; empty when the library has no MD5.
-std::string Md5Hex(std::string_view bytes) {
-  // The machine's OpenSSL configuration may forbid MD5; here it only names a file's version.
-  OPENSSL_init_crypto(OPENSSL_INIT_NO_LOAD_CONFIG, nullptr);
-  std::array<unsigned char, EVP_MAX_MD_SIZE> digest{};
-  unsigned int length = 0;
-  if (EVP_Digest(bytes.data(), bytes.size(), digest.data(), &length, EVP_md5(), nullptr) != 1) {
-    return {};
-  }
-  constexpr std::string_view kDigits = "0123456789abcdef";
-  std::string text;
-  for (unsigned int i = 0; i < length; ++i) {
-    text += kDigits[digest[i] >> 4];
-    text += kDigits[digest[i] & 15];
-  }
-  return text;
-}
 
 // A group entry's table, or nothing for a name that means nothing.
 std::optional<Dictionary> TableNamed(std::string_view name, const KeyTables& tables) {
@@ -102,7 +81,7 @@ std::optional<TLConfig> TLConfig::init(Platform& platform) {
     platform.log.error("Couldn't load whitelist");
     return std::nullopt;
   }
-  config._configFileDigest = Md5Hex(*bytes);
+  config._configFileDigest = HexDigest(DigestKind::kMd5, *bytes);
 
   const auto parsed = ReadPropertyList(*bytes);
   const auto* value = std::get_if<PropertyValue>(&parsed);

@@ -97,13 +97,20 @@ void TLReport::computeAndAddDistributionForKeyWithOptions(TLHistoryDistributionE
       summary.add(value);
       histogram->add(value);
     });
+  } else {
+    ForEachValue(values, [&](double value) { summary.add(value); });
+  }
+  if (values.failed()) {
+    _platform.log.error("Leaving out the distribution %@: not all of its values could be read",
+                        key);
+    return;
+  }
+  if (histogram) {
     if (auto labelled = histogramDictForIntervalsWithHistCounts(*intervals, histogram->counts)) {
       _histogramsOutput[key] = std::move(*labelled);
     } else {
       _histogramsOutput.remove(key);
     }
-  } else {
-    ForEachValue(values, [&](double value) { summary.add(value); });
   }
   _distributionsOutput[key] = summary.distributionStats();
 }

@@ -19,23 +19,26 @@ std::string FirstOrUnknown(const std::vector<std::string>& list) {
 }
 
 // Remembers the running OS version; when it is new, the metadata that tells the one before.
-std::optional<Dictionary> NoteOSVersion(Platform& platform) {
+std::optional<Dictionary> NoteOSVersion(Platform& platform, std::int32_t day) {
   const auto previous = platform.preferences.DGWPreferencesGetValue(kLastOSVersion, kDomain);
   const std::string current = platform.diagnostics.DGWOSVersion();
   const std::string* previousText = previous ? previous->asString() : nullptr;
   if (previousText != nullptr && *previousText == current) return std::nullopt;
+  const std::string before = previousText != nullptr ? *previousText : kUnknown;
   platform.preferences.DGWPreferencesSetValue(kLastOSVersion, PropertyValue(current), kDomain);
+  // Written together: should this log never be spooled, the next one tells it.
+  if (!platform.preferences.DGWPreferencesGetValue(kOSVersionBefore, kDomain)) {
+    platform.preferences.DGWPreferencesSetValue(
+        kOSVersionBefore, Dictionary{{"version", before}, {"day", Int32(day)}}, kDomain);
+  }
   platform.preferences.DGWPreferencesSynchronize(kDomain);
-  Dictionary metadata;
-  metadata["previous_os_version"] = previousText != nullptr ? *previousText : kUnknown;
-  return metadata;
+  return Dictionary{{"previous_os_version", before}};
 }
 
 }  // namespace
 
-void TLReport::serializeWithDateAndAppInfo(std::int32_t yesterday,
+bool TLReport::serializeWithDateAndAppInfo(std::int32_t yesterday,
                                            const std::optional<Array>& appInfo) {
-  if (_scalarsOutput.empty() && _distributionsOutput.empty() && _histogramsOutput.empty()) return;
   addInstalledAppInfo();
   addMetadataKeys();
   reportDatabaseSize();
@@ -54,15 +57,17 @@ void TLReport::serializeWithDateAndAppInfo(std::int32_t yesterday,
   }
   if (const auto* error = std::get_if<PropertyListError>(&document)) {
     _platform.log.error("Could not create aggregated plist: %@", error->description);
-    return;
+    return false;
   }
-  const auto metadata = NoteOSVersion(_platform);
+  const auto metadata = NoteOSVersion(_platform, yesterday);
   const auto writer = [&](LogOutput& output) {
     return output.write(std::get<std::string>(document));
   };
-  if (!_platform.diagnostics.DGWWriteLogForSubmission("193", "log-aggregated", metadata, writer)) {
-    _platform.log.error("Failed to write aggregated log");
+  if (_platform.diagnostics.DGWWriteLogForSubmission("193", "log-aggregated", metadata, writer)) {
+    return true;
   }
+  _platform.log.error("Failed to write aggregated log");
+  return false;
 }
 
 Dictionary TLReport::assembleDocument(std::int32_t yesterday, const std::string& whitelistDigest,

@@ -39,10 +39,12 @@ std::int64_t RoundToDigits(std::int64_t value, std::uint64_t digits) {
 
 }  // namespace
 
-TLReport::TLReport(Platform& platform) : _platform(platform), _config(TLConfig::init(platform)) {}
+TLReport::TLReport(Platform& platform, UsedUp& usedUp)
+    : _platform(platform), _usedUp(usedUp), _config(TLConfig::init(platform)) {}
 
-void TLReport::writeLogForYesterdayWithAppInfo(std::int32_t yesterday,
-                                               const std::optional<Array>& appInfo) {
+ReportOutcome TLReport::writeLogForYesterdayWithAppInfo(std::int32_t yesterday,
+                                                        const std::optional<Array>& appInfo) {
+  bool allRead = true;
   _platform.log.info("writing aggregated log. yesterday=%d", yesterday);
   if (const auto history = _platform.counterStore.initWithDefaultPath()) {
     const std::int32_t before = yesterday > std::numeric_limits<std::int32_t>::min()
@@ -63,8 +65,13 @@ void TLReport::writeLogForYesterdayWithAppInfo(std::int32_t yesterday,
             computeAndAddDistributionForKeyWithOptions(values, key, *options);
           }
         });
+    allRead = !history->failed();
   }
-  serializeWithDateAndAppInfo(yesterday, appInfo);
+  if (_scalarsOutput.empty() && _distributionsOutput.empty() && _histogramsOutput.empty()) {
+    return allRead ? ReportOutcome::kNothingToReport : ReportOutcome::kLost;
+  }
+  return serializeWithDateAndAppInfo(yesterday, appInfo) ? ReportOutcome::kWritten
+                                                         : ReportOutcome::kLost;
 }
 
 std::int64_t TLReport::addScalarForKeyWithOptions(std::int64_t value, std::string_view key,

@@ -16,17 +16,39 @@
 
 namespace quorlet {
 
+// What a log tells once only, since telling uses it up.
+struct UsedUp {
+  // Database corruptions that an earlier log took off the count and that the next log is to tell.
+  std::int64_t corruptions = 0;
+  // Those that this log took off: the change is pending in the preferences, domain
+  // "nuvex.aggregated".
+  std::int64_t corruptionsTaken = 0;
+};
+
+enum class ReportOutcome {
+  kNothingToReport,
+  kWritten,
+  kLost  // the counters could not be read, or the log not be written; the system log says why
+};
+
+// In the preferences of domain "nuvex.aggregated.quorlet" while a log that tells of a new OS
+// version is not known to be spooled: {"version": the version before, "day": the log's day}.
+inline constexpr char kOSVersionBefore[] = "LastOSVersionBefore";
+
 // A report is made for one day, used once and discarded. KeyOptions are the whitelist's options
 // of a key (report/config.h).
 class TLReport {
  public:
   // Loads the whitelist; without one the report stays empty.
-  explicit TLReport(Platform& platform);
+  explicit TLReport(Platform& platform) : TLReport(platform, _nothingUsedUp) {}
+  // The same; `usedUp` must outlive the report.
+  TLReport(Platform& platform, UsedUp& usedUp);
 
   // Reads the whitelisted scalars and distributions of day `yesterday` from the counter store and
   // hands the aggregated log to the diagnostics library, if there is anything to report.
   // `appInfo`: app-info records, put into the log as they are. Call it at most once.
-  void writeLogForYesterdayWithAppInfo(std::int32_t yesterday, const std::optional<Array>& appInfo);
+  ReportOutcome writeLogForYesterdayWithAppInfo(std::int32_t yesterday,
+                                                const std::optional<Array>& appInfo);
 
   // Rounds `value` as `options` ask, stores it under `key` (replacing) and returns what was stored.
   std::int64_t addScalarForKeyWithOptions(std::int64_t value, std::string_view key,
@@ -37,7 +59,8 @@ class TLReport {
                                        const std::function<std::int64_t()>& producer);
 
   // Consumes `values` and stores the key's [minimum, maximum, mean, sum of squared deviations,
-  // count] and, when the options have "intervals", its histogram. NaN values are left out.
+  // count] and, when the options have "intervals", its histogram. NaN values are left out; a
+  // distribution whose values could not all be read is, with an error line.
   void computeAndAddDistributionForKeyWithOptions(TLHistoryDistributionEnumerator& values,
                                                   std::string_view key, const KeyOptions& options);
 
@@ -57,7 +80,7 @@ class TLReport {
   const Dictionary& histogramsOutput() const { return _histogramsOutput; }
 
  private:
-  void serializeWithDateAndAppInfo(std::int32_t yesterday, const std::optional<Array>& appInfo);
+  bool serializeWithDateAndAppInfo(std::int32_t yesterday, const std::optional<Array>& appInfo);
   std::optional<KeyOptions> optionsForScalarKey(std::string_view key) const;
   // One error line for each option that will not work, once for each options dictionary.
   void reportFaultyOptions(const KeyOptions& options, std::string_view key, KeyKind kind);
@@ -70,6 +93,8 @@ class TLReport {
   void reportVMStats();
 
   Platform& _platform;
+  UsedUp _nothingUsedUp;
+  UsedUp& _usedUp;
   std::optional<TLConfig> _config;
   Dictionary _scalarsOutput;
   Dictionary _distributionsOutput;

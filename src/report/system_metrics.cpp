@@ -71,17 +71,24 @@ void BindPreferenceFunctions(SupportLibrary& library, SystemLog& log) {
   }
 }
 
-// The corruptions counted since the last call; the count starts again at 0.
-std::int64_t TakeCorruptionCount(Platform& platform) {
+// The corruptions that no log has told yet; what is told is taken off the count.
+std::int64_t TakeCorruptionCount(Platform& platform, UsedUp& usedUp) {
   SupportLibrary& library = platform.supportLibrary;
   if (library.integerReader == nullptr || library.integerWriter == nullptr) {
     BindPreferenceFunctions(library, platform.log);
   }
-  if (library.integerReader == nullptr || library.integerWriter == nullptr) return 0;
+  if (library.integerReader == nullptr || library.integerWriter == nullptr) {
+    return usedUp.corruptions;
+  }
   const std::int64_t count =
       library.integerReader(platform.preferences, kCorruptionCount, kAggregatedDomain);
   library.integerWriter(platform.preferences, kCorruptionCount, 0, kAggregatedDomain);
-  return count;
+  usedUp.corruptionsTaken = count;
+  const std::int64_t most = std::numeric_limits<std::int64_t>::max();
+  if (__builtin_add_overflow(usedUp.corruptions, count, &usedUp.corruptions)) {
+    usedUp.corruptions = most;
+  }
+  return usedUp.corruptions;
 }
 
 std::int64_t DatabaseSize(Platform& platform) {
@@ -110,7 +117,8 @@ std::int64_t CpuUptime(Platform& platform) {
 
 void TLReport::reportDatabaseSize() {
   addScalarForKeyByExecutingBlock(kDatabaseSize, [this] { return DatabaseSize(_platform); });
-  addScalarForKeyByExecutingBlock(kCorruptions, [this] { return TakeCorruptionCount(_platform); });
+  addScalarForKeyByExecutingBlock(kCorruptions,
+                                  [this] { return TakeCorruptionCount(_platform, _usedUp); });
 }
 
 void TLReport::reportCPUUptime() {

@@ -17,11 +17,13 @@ std::optional<Dictionary> NANDInfo(Platform& platform) try {
 
 }  // namespace
 
-void PushNANDInfoScalars(Platform& platform, CounterBatch& counters) {
-  RunStep(platform.log, "storage structured log", [&] {
-    StorageLogState state;
-    DumpStorageStructuredLog(platform, state, false);
-  });
+void PushNANDInfoScalars(Platform& platform, CounterBatch& counters, bool logsStorage) {
+  if (logsStorage) {
+    RunStep(platform.log, "storage structured log", [&] {
+      StorageLogState state;
+      DumpStorageStructuredLog(platform, state, false);
+    });
+  }
   const auto info = NANDInfo(platform);
   if (!info) {
     platform.log.log("failed to get NAND info dict");

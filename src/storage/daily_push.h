@@ -6,9 +6,10 @@
 
 namespace quorlet {
 
-// Writes the storage structured log, then puts the counter of each number of the NAND information
-// dictionary into `counters`. When there is none, one line in the system log says so.
-void PushNANDInfoScalars(Platform& platform, CounterBatch& counters);
+// Writes the storage structured log (and the status log), if `logsStorage`, then puts the counter
+// of each number of the NAND information dictionary into `counters`. When there is none, one line
+// in the system log says so.
+void PushNANDInfoScalars(Platform& platform, CounterBatch& counters, bool logsStorage);
 
 }  // namespace quorlet
 

@@ -5,6 +5,7 @@
 #include <cmath>
 #include <limits>
 #include <map>
+#include <set>
 #include <string>
 #include <utility>
 #include <vector>
@@ -42,10 +43,14 @@ class FakeCounterStore : public CounterStore {
     std::erase_if(scalars, isOld);
     std::erase_if(distributions, isOld);
   }
-  bool writeScalars(std::span<const ScalarChange> changes) override {
+  bool write(const StoreChanges& changes) override {
     if (isFull) return false;
-    for (const ScalarChange& change : changes) {
-      std::int64_t& value = scalars[{change.key, TLDaysSince1970()}];
+    if (changes.dropCounters) {
+      scalars.clear();
+      distributions.clear();
+    }
+    for (const ScalarChange& change : changes.scalars) {
+      std::int64_t& value = scalars[{change.key, change.day}];
       if (change.kind == ScalarChange::Kind::kSet) {
         value = change.value;
       } else if (__builtin_add_overflow(value, change.value, &value)) {
@@ -53,6 +58,15 @@ class FakeCounterStore : public CounterStore {
                                  : std::numeric_limits<std::int64_t>::max();
       }
     }
+    for (const StoreNote& note : changes.notes) {
+      notes.erase(note.name);
+      if (note.value) notes.emplace(note.name, note.value->deepCopy());
+    }
+    return true;
+  }
+  bool readNote(std::string_view name, std::optional<Dictionary>& value) override {
+    const auto found = notes.find(name);
+    value = found != notes.end() ? std::optional(found->second.deepCopy()) : std::nullopt;
     return true;
   }
   std::unique_ptr<TLHistory> initWithDefaultPath() override {
@@ -62,26 +76,32 @@ class FakeCounterStore : public CounterStore {
 
   std::map<RowKey, std::int64_t> scalars;
   std::map<RowKey, Samples> distributions;
-  bool isMissing = false;  // no reader can be opened
-  bool isFull = false;     // nothing can be written
+  std::map<std::string, Dictionary, std::less<>> notes;
+  std::set<std::string, std::less<>> torn;  // distributions that can be read only in part
+  bool isMissing = false;                   // no reader can be opened
+  bool isUnreadable = false;                // readers have failed
+  bool isFull = false;                      // nothing can be written
   int checkpoints = 0;
   int historiesOpened = 0;
 
  private:
   class Enumerator : public TLHistoryDistributionEnumerator {
    public:
-    explicit Enumerator(const Samples& samples) : samples_(samples) {}
+    Enumerator(const Samples& samples, bool isTorn) : samples_(samples), isTorn_(isTorn) {}
+    bool failed() const override { return isTorn_; }
 
    protected:
     std::span<const DistributionSample> nextBlock() override { return std::exchange(samples_, {}); }
 
    private:
     std::span<const DistributionSample> samples_;
+    bool isTorn_;
   };
 
   class History : public TLHistory {
    public:
     explicit History(FakeCounterStore& store) : store_(store) {}
+    bool failed() const override { return store_.isUnreadable; }
     void scalarsForKeyPrefixMinDaysSince1970MaxDaysSince1970RowHandler(
         std::string_view keyPrefix, std::int32_t minDay, std::int32_t maxDay,
         const ScalarHandler& rowHandler) override {
@@ -98,7 +118,7 @@ class FakeCounterStore : public CounterStore {
       bool stop = false;
       for (const auto& [row, samples] : store_.distributions) {
         if (!matches(row, keyPrefix, minDay, maxDay)) continue;
-        Enumerator values(samples);
+        Enumerator values(samples, store_.torn.contains(row.first));
         rowHandler(row.first, row.second, values, stop);
         if (stop) return;
       }

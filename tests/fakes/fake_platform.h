@@ -28,6 +28,7 @@ struct SubmittedLog {
   std::string name;
   std::optional<Dictionary> metadata;
   std::string body;
+  std::string fileName;
 };
 
 class FakeDiagnostics : public Diagnostics {
@@ -38,9 +39,7 @@ class FakeDiagnostics : public Diagnostics {
     const PropertyValue* value = tasking.find(name);
     return value != nullptr ? std::optional(*value) : std::nullopt;
   }
-  bool DGWWriteLogForSubmission(std::string_view typeCode, std::string_view name,
-                                const std::optional<Dictionary>& metadata,
-                                const LogWriter& writer) override {
+  bool writeLog(const LogRequest& request, const LogWriter& writer) override {
     struct Output : LogOutput {
       bool write(std::string_view bytes) override {
         text += bytes;
@@ -48,8 +47,24 @@ class FakeDiagnostics : public Diagnostics {
       }
       std::string text;
     } output;
-    if (diskIsFull || !writer(output)) return false;
-    logs.push_back({std::string(typeCode), std::string(name), metadata, output.text});
+    if (!submissionEnabled || diskIsFull || !writer(output)) return false;
+    const std::string fileName = std::string(request.name) + "-" + std::to_string(++written);
+    if (request.beforePublication) request.beforePublication(fileName);
+    logs.push_back({std::string(request.typeCode), std::string(request.name), request.metadata,
+                    output.text, fileName});
+    return true;
+  }
+  bool hasLog(const std::string& fileName) override {
+    return std::ranges::find(logs, fileName, &SubmittedLog::fileName) != logs.end();
+  }
+  bool removeLogs(std::span<const std::string> fileNames) override {
+    std::erase_if(logs, [&](const SubmittedLog& log) {
+      return std::ranges::find(fileNames, log.fileName) != fileNames.end();
+    });
+    return true;
+  }
+  bool removeAllLogs() override {
+    logs.clear();
     return true;
   }
   void SubmitDiagnosticLogs() override { ++submissions; }
@@ -60,13 +75,27 @@ class FakeDiagnostics : public Diagnostics {
   Dictionary tasking;
   std::vector<SubmittedLog> logs;
   int submissions = 0;
+  int written = 0;
 };
 
 class FakeCrashSupport : public CrashSupport {
  public:
-  void FSLogStructuredData(std::int32_t type, const Dictionary& entry) override {
-    entries.emplace_back(type, entry.deepCopy());
+  bool FSLogStructuredData(std::int32_t type, const Dictionary& entry) override {
+    if (isFull) return false;
+    (isStaging ? staged : entries).emplace_back(type, entry.deepCopy());
+    return true;
   }
+  bool stageEntries() override {
+    staged.clear();
+    return isStaging = true;
+  }
+  bool publishStagedEntries() override {
+    entries.insert(entries.end(), staged.begin(), staged.end());
+    staged.clear();
+    isStaging = false;
+    return true;
+  }
+  bool syncStructuredData() override { return !isFull; }
   void FSDumpAllOldStructuredDataLogs() override { ++dumps; }
   void rollCarewellLogs() override { ++rolls; }
   std::string GetSysIDWithDescription() override { return "system-1"; }
@@ -74,6 +103,9 @@ class FakeCrashSupport : public CrashSupport {
   std::string GetSystemVersion() override { return "TestOS 1 (A1)"; }
   std::string GetIncidentID() override { return "INCIDENT-" + std::to_string(++incidents); }
   std::vector<std::pair<std::int32_t, Dictionary>> entries;
+  std::vector<std::pair<std::int32_t, Dictionary>> staged;  // outlive the process, as entries do
+  bool isStaging = false;
+  bool isFull = false;  // no entry can be added
   int incidents = 0;
   int dumps = 0;
   int rolls = 0;
@@ -130,17 +162,27 @@ class FakeKernelParameters : public KernelParameters {
                    std::size_t& length) override {
     asked.emplace_back(name);
     const auto queue = queues.find(name);
-    if (queue != queues.end() && !queue->second.empty()) {
-      const int error = copyOut(queue->second.front(), buffer, length);
-      if (error == 0) queue->second.pop_front();
-      return error;
+    if (queue != queues.end()) {
+      std::size_t& handedOut = taken[std::string(name)];
+      if (handedOut < queue->second.size()) {
+        const int error = copyOut(queue->second[handedOut], buffer, length);
+        if (error == 0) ++handedOut;
+        return error;
+      }
     }
     const auto found = values.find(name);
     return found != values.end() ? copyOut(found->second, buffer, length) : missing;
   }
   std::map<std::string, std::string, std::less<>> values;
-  std::map<std::string, std::deque<std::string>, std::less<>> queues;  // a read takes the first
-  int missing = ENOENT;  // what a read of anything else fails with
+  bool removeTaken(std::string_view name) override {
+    auto& queue = queues[std::string(name)];
+    const std::size_t count = std::exchange(taken[std::string(name)], 0);
+    queue.erase(queue.begin(), queue.begin() + static_cast<std::ptrdiff_t>(count));
+    return true;
+  }
+  std::map<std::string, std::deque<std::string>, std::less<>> queues;
+  std::map<std::string, std::size_t, std::less<>> taken;  // how many reads have handed out
+  int missing = ENOENT;                                   // what a read of anything else fails with
   std::vector<std::string> asked;
 
  private:
@@ -225,8 +267,9 @@ class FakeLocale : public LocaleService {
 
 class FakePassLock : public PassLock {
  public:
-  void lock() override { held = true; }
+  bool lock() override { return held = isFree; }
   void unlock() override { held = false; }
+  bool isFree = true;
   bool held = false;
 };
 

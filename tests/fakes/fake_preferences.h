@@ -56,6 +56,15 @@ class FakePreferences : public Preferences {
     return true;
   }
 
+  void addToInteger(std::string_view key, std::int64_t delta, std::string_view domain) override {
+    const auto value = DGWPreferencesGetValue(key, domain);
+    if (delta == 0 || (!value && delta < 0)) return;
+    const std::int64_t sum = DGWPreferencesGetIntegerValue(key, domain) + delta;
+    DGWPreferencesSetValue(key, Int64(sum < 0 ? 0 : sum), domain);
+  }
+
+  bool isReadable(std::string_view domain) override { return !unreadable.contains(domain); }
+
   // The process dies: what is not durable is gone.
   void crash() { pending_.clear(); }
   const Disk& disk() const { return *disk_; }
@@ -68,6 +77,7 @@ class FakePreferences : public Preferences {
   std::vector<std::string> synchronized;    // every domain, in order
   std::function<void()> beforeChange;       // may throw: the change is not made
   std::set<std::string, std::less<>> full;  // domains that cannot be written just now
+  std::set<std::string, std::less<>> unreadable;
 
  private:
   using Changes = std::map<std::string, std::optional<PropertyValue>, std::less<>>;

@@ -89,7 +89,7 @@ TEST(CounterStoreContract, TheFakeAndTheLinuxStoreGiveTheSameRows) {
   FakeCounterStore fake(clock);
   const TempRoot root;
   LinuxSubject subject(root);
-  const auto store = MakeLinuxCounterStore(*subject.ledger, clock);
+  const auto store = MakeLinuxCounterStore(*subject.ledger, clock, subject.log);
   for (const std::int32_t day : {kToday - 31, kToday + 1, kToday - 30, kToday}) {
     clock.goToDay(day);
     for (const auto& key : {"b"s, "\xff\xff\x01"s, "\xff"s, "ab"s, "a\xff\xff"s, "a\xff"s,
@@ -195,10 +195,13 @@ TEST(LinuxCounterStore, ProcessesLoseNothingAndKilledOnesLeaveWholeTransactions)
 // A sound store with a scalar and two distributions.
 void Fill(const TempRoot& root) {
   const TempRoot own;
-  LinuxSubject subject(own);
-  EXPECT_TRUE(subject.ledger->setScalar("s", kToday, 7));
-  EXPECT_TRUE(subject.ledger->recordValues("d", kToday, Ramp(200)));
-  EXPECT_TRUE(subject.ledger->recordValues("e", kToday, Ramp(3000)));
+  {
+    LinuxSubject subject(own);
+    EXPECT_TRUE(subject.ledger->setScalar("s", kToday, 7));
+    EXPECT_TRUE(subject.ledger->recordValues("d", kToday, Ramp(200)));
+    EXPECT_TRUE(subject.ledger->recordValues("e", kToday, Ramp(3000)));
+  }
+  // The file alone: whoever ends has copied the log back.
   root.write(kDatabase, own.read(kDatabase));
 }
 

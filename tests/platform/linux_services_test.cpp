@@ -20,6 +20,9 @@ class LinuxServices : public testing::Test {
   static constexpr char kPending[] = "/var/mobile/Library/Logs/Diagwell/pending";
   static constexpr char kOutbox[] = "/var/mobile/Library/Logs/Diagwell/outbox";
 
+  LinuxServices() {
+    preferences.DGWPreferencesSetValue("SubmissionEnabled", PropertyValue(true), "nuvex.diagwell");
+  }
   bool write(std::string_view name, std::string_view body,
              const std::optional<Dictionary>& metadata = std::nullopt) {
     return diagnostics->DGWWriteLogForSubmission(
@@ -131,6 +134,19 @@ TEST_F(LinuxServices, ALogIsOneFileWithANewName) {
             (Names{".hidden", "l-20241004T120000Z-2.log", "l-20241004T120000Z-3.log"}));
 }
 
+TEST_F(LinuxServices, WithoutConsentNoLogIsWrittenOrSubmitted) {
+  EXPECT_TRUE(write("l", "body"));
+  preferences.DGWPreferencesSetValue("SubmissionEnabled", std::nullopt, "nuvex.diagwell");
+  EXPECT_FALSE(write("m", "body"));
+  diagnostics->SubmitDiagnosticLogs();
+  EXPECT_EQ(root.list(kPending).size(), 1u);
+  EXPECT_EQ(root.list(kOutbox), Names());
+  EXPECT_EQ(log.at(LogLevel::kInfo).size(), 2u);
+  EXPECT_TRUE(log.errors().empty());
+  EXPECT_TRUE(diagnostics->removeAllLogs());
+  EXPECT_EQ(root.list(kPending), Names());
+}
+
 TEST_F(LinuxServices, AFailedLogLeavesNothing) {
   const auto failing = [](LogOutput& output) { return output.write("half") && false; };
   EXPECT_FALSE(diagnostics->DGWWriteLogForSubmission("1", "l", std::nullopt, failing));
@@ -221,10 +237,17 @@ TEST_F(LinuxServices, KernelParametersAreFilesAndQueues) {
 
   for (const char* name : {"10", "9", ".1", "8"})
     root.write(std::string("/var/db/kernel/q/") + name, name);
-  EXPECT_EQ(ask("q", 1), ErrnoText(ENOMEM)) << "and it is gone, not in the others' way";
-  for (const std::string& next : {std::string("8"), std::string("9"), kMissing}) {
+  root.write("/var/db/kernel/q/0", std::string(73, 'x'));
+  EXPECT_EQ(ask("q", 72), ErrnoText(ENOMEM)) << "larger than any event: not in the others' way";
+  EXPECT_EQ(ask("q", 1), ErrnoText(ENOMEM)) << "this one waits for a larger buffer";
+  for (const std::string& next :
+       {std::string("10"), std::string("8"), std::string("9"), kMissing}) {
     EXPECT_EQ(ask("q"), next);
   }
+  using Names = std::vector<std::string>;
+  EXPECT_EQ(root.list("/var/db/kernel/q"), (Names{".0.refused", ".1", "10", "8", "9"}));
+  EXPECT_TRUE(kernel->removeTaken("q"));
+  EXPECT_EQ(root.list("/var/db/kernel/q"), (Names{".0.refused", ".1"}));
 
   root.write("/proc/meminfo", "SwapTotal: 2 kB\nSwapFree:  3 kB\n");
   const std::uint64_t expected[] = {2048, 3072, 0};  // total, available, used

@@ -94,18 +94,61 @@ class LinuxPreferencesTest : public testing::Test {
 };
 
 TEST_F(LinuxPreferencesTest, ADamagedFileReadsAsEmptyAndIsKeptAside) {
-  for (const char* damaged : {"", "bplist00", "<plist><dict><key>k</key></dict></plist>", "junk",
-                              "<plist version=\"1.0\"><array/></plist>"}) {
+  std::string aside = std::string(kFile) + ".damaged";
+  int number = 1;
+  for (const char* damaged :
+       {"", "bplist00", "<plist><dict><key>k</key></dict></plist>", "junk",
+        "<plist version=\"1.0\"><array/></plist>", "6", "7", "8", "9", "10"}) {
     machine.log.lines.clear();
     root.write(kFile, damaged);
     EXPECT_EQ(preferences->DGWPreferencesGetValue("k", "d"), std::nullopt) << damaged;
     preferences->DGWPreferencesSetValue("x", Int64(1), "d");
     preferences->DGWPreferencesSynchronize("d");
-    EXPECT_EQ(root.read(std::string(kFile) + ".damaged"), damaged);
+    EXPECT_EQ(root.read(aside), damaged);
+    aside = std::string(kFile) + ".damaged" + (++number > 9 ? "" : "." + std::to_string(number));
     EXPECT_EQ(preferences->DGWPreferencesGetValue("x", "d"), Value(Int64(1)));
     EXPECT_EQ(machine.log.errors().size(), 1u) << damaged;
   }
-  EXPECT_EQ(root.list(kDirectory), (Names{".d.lock", "d.plist", "d.plist.damaged"}));
+  EXPECT_EQ(root.list(kDirectory).size(), 11u) << "the oldest went";
+}
+
+TEST_F(LinuxPreferencesTest, WhatCannotBeReadIsNeitherEmptyNorReplaced) {
+  preferences->DGWPreferencesSetValue("k", Int64(5), "d");
+  EXPECT_TRUE(preferences->DGWPreferencesSynchronize("d"));
+  const std::string bytes = root.read(kFile);
+  preferences = machine.startProcess();
+  rlimit before{};
+  getrlimit(RLIMIT_NOFILE, &before);
+  const rlimit none{3, before.rlim_max};
+  setrlimit(RLIMIT_NOFILE, &none);
+  const bool readable = preferences->isReadable("d");
+  preferences->DGWPreferencesSetValue("x", Int64(1), "d");
+  const bool written = preferences->DGWPreferencesSynchronize("d");
+  setrlimit(RLIMIT_NOFILE, &before);
+  EXPECT_FALSE(readable || written);
+  EXPECT_EQ(root.read(kFile), bytes);
+  EXPECT_EQ(root.list(kDirectory), (Names{".d.lock", "d.plist"}));
+  EXPECT_GE(machine.log.errors().size(), 1u);
+  EXPECT_TRUE(preferences->DGWPreferencesSynchronize("d")) << "the change was not lost";
+  EXPECT_EQ(preferences->DGWPreferencesGetIntegerValue("k", "d"), 5);
+}
+
+TEST_F(LinuxPreferencesTest, AdditionsOfTwoProcessesAddUp) {
+  const auto other = machine.startProcess();
+  const auto count = [](Preferences& of) { return of.DGWPreferencesGetIntegerValue("n", "d"); };
+  preferences->addToInteger("n", -3, "d");
+  EXPECT_TRUE(preferences->DGWPreferencesSynchronize("d"));
+  EXPECT_FALSE(root.exists(kFile)) << "nothing to take off: nothing is written";
+  for (Preferences* each : {preferences.get(), other.get()}) each->addToInteger("n", 2, "d");
+  EXPECT_EQ(count(*preferences), 2);
+  EXPECT_TRUE(preferences->DGWPreferencesSynchronize("d") && other->DGWPreferencesSynchronize("d"));
+  EXPECT_EQ(count(*preferences), 4);
+  preferences->addToInteger("n", -2, "d");
+  other->addToInteger("n", 1, "d");
+  EXPECT_TRUE(other->DGWPreferencesSynchronize("d") && preferences->DGWPreferencesSynchronize("d"));
+  EXPECT_EQ(count(*other), 3);
+  preferences->addToInteger("n", INT64_MIN, "d");
+  EXPECT_EQ(count(*preferences), 0);
 }
 
 TEST_F(LinuxPreferencesTest, AFailedWriteKeepsTheFileAndTheChange) {

@@ -10,8 +10,9 @@
 
 namespace quorlet {
 
-// `ledger` and `clock` must outlive the store.
-std::unique_ptr<CounterStore> MakeLinuxCounterStore(TallyLedger& ledger, Clock& clock);
+// What is given must outlive the store.
+std::unique_ptr<CounterStore> MakeLinuxCounterStore(TallyLedger& ledger, Clock& clock,
+                                                    SystemLog& log);
 
 }  // namespace quorlet
 

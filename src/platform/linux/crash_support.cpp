@@ -80,14 +80,31 @@ class LinuxCrashSupport : public CrashSupport {
         osVersion_(osVersion),
         log_(log) {}
 
-  void FSLogStructuredData(std::int32_t type, const Dictionary& entry) override {
-    if (access_ == Access::kReadOnly) return;
+  bool FSLogStructuredData(std::int32_t type, const Dictionary& entry) override {
+    if (access_ == Access::kReadOnly) return false;
     const nlohmann::ordered_json line = {
         {"type", type}, {"time", Rfc3339(clock_.now())}, {"data", PropertyJson(entry)}};
-    if (const int error = structuredLog_.append(JsonLine(line))) {
+    const std::string text = JsonLine(line);
+    const int error = isStaging_ ? structuredLog_.stageLine(text) : structuredLog_.append(text);
+    if (error != 0) {
       log_.error("Cannot add an entry of type %d to %@: %@", type, structuredLog_.path(),
                  ErrnoText(error));
     }
+    return error == 0;
+  }
+
+  bool stageEntries() override {
+    isStaging_ = access_ == Access::kReadWrite && succeeds(structuredLog_.beginStaging());
+    return isStaging_;
+  }
+
+  bool publishStagedEntries() override {
+    isStaging_ = false;
+    return access_ == Access::kReadOnly || succeeds(structuredLog_.publishStaged());
+  }
+
+  bool syncStructuredData() override {
+    return access_ == Access::kReadOnly || succeeds(structuredLog_.sync());
   }
 
   void FSDumpAllOldStructuredDataLogs() override {
@@ -99,7 +116,12 @@ class LinuxCrashSupport : public CrashSupport {
 
   void rollCarewellLogs() override {
     if (access_ == Access::kReadOnly) return;
-    for (const std::string& name : ListDirectory(supportLogs_)) {
+    const auto names = ReadDirectory(supportLogs_);
+    if (const int* error = std::get_if<int>(&names)) {
+      log_.error("Cannot read %@: %@", supportLogs_, ErrnoText(*error));
+      return;
+    }
+    for (const std::string& name : std::get<std::vector<std::string>>(names)) {
       const std::string log = supportLogs_ + "/" + name;
       if (name.starts_with('.') || !name.ends_with(".log") || !IsFile(log, false)) continue;
       if (const int error = Rotate(log)) {
@@ -135,6 +157,11 @@ class LinuxCrashSupport : public CrashSupport {
   }
 
  private:
+  bool succeeds(int error) {
+    if (error != 0) log_.error("Cannot write %@: %@", structuredLog_.path(), ErrnoText(error));
+    return error == 0;
+  }
+
   const Root root_;
   StructuredLog structuredLog_;
   const std::string supportLogs_;
@@ -142,6 +169,7 @@ class LinuxCrashSupport : public CrashSupport {
   Clock& clock_;
   OSVersion& osVersion_;
   SystemLog& log_;
+  bool isStaging_ = false;
 };
 
 }  // namespace

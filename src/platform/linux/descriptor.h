@@ -50,7 +50,8 @@ auto Uninterrupted(const Call& call) {
 void OccupyStandardStreams();
 
 // Opens (and with O_CREAT creates, mode 0640) a regular file; 0 or the errno. Anything else at
-// `path` is refused: EISDIR for a directory, otherwise EINVAL. Never waits on a FIFO or device.
+// `path` is refused: EISDIR for a directory, otherwise EINVAL; so is, to be written, a file that
+// has a second name: EMLINK. Never waits on a FIFO or device.
 [[nodiscard]] int OpenRegularFile(const std::string& path, int flags, Descriptor& opened,
                                   struct stat& status);
 

@@ -1,14 +1,13 @@
 #include "platform/device_info.h"
 
-#include <openssl/evp.h>
 #include <sys/statvfs.h>
 
-#include <array>
 #include <cerrno>
 #include <limits>
 #include <mutex>
 
 #include "platform/linux/services.h"
+#include "values/digest.h"
 #include "values/property_list.h"
 
 namespace quorlet {
@@ -70,18 +69,8 @@ class LinuxDeviceInfo : public DeviceInfo {
     const auto* text = std::get_if<std::string>(&bytes);
     if (text == nullptr) return std::nullopt;
     const std::string_view identifier = std::string_view(*text).substr(0, text->find('\n'));
-    std::array<unsigned char, EVP_MAX_MD_SIZE> digest = {};
-    unsigned length = 0;
-    if (identifier.empty() || EVP_Digest(identifier.data(), identifier.size(), digest.data(),
-                                         &length, EVP_sha1(), nullptr) != 1) {
-      return std::nullopt;
-    }
-    std::string hex;
-    for (unsigned i = 0; i < length; ++i) {
-      hex += "0123456789abcdef"[digest[i] >> 4];
-      hex += "0123456789abcdef"[digest[i] & 15];
-    }
-    return hex;
+    const std::string digest = identifier.empty() ? "" : HexDigest(DigestKind::kSha1, identifier);
+    return digest.empty() ? std::nullopt : std::optional<PropertyValue>(digest);
   }
 
   const Root root_;

@@ -13,6 +13,7 @@
 #include <cerrno>
 #include <cstdio>
 #include <tuple>
+#include <variant>
 #include <vector>
 
 #include "platform/linux/descriptor.h"
@@ -35,9 +36,11 @@ struct StoredLog {
   auto age() const { return std::tie(seconds, nanoseconds, name); }
 };
 
-std::vector<StoredLog> LogsIn(const std::string& directory) {
-  std::vector<StoredLog> logs;
-  for (const std::string& name : ListDirectory(directory)) {
+// The logs in a directory; 0 or the errno that keeps them from being known.
+int FindLogs(const std::string& directory, std::vector<StoredLog>& logs) {
+  const auto names = ReadDirectory(directory);
+  if (const int* error = std::get_if<int>(&names)) return *error;
+  for (const std::string& name : std::get<std::vector<std::string>>(names)) {
     const std::string path = JoinPath(directory, name);
     struct stat status = {};
     if (name.starts_with('.') || lstat(path.c_str(), &status) != 0) continue;
@@ -45,7 +48,20 @@ std::vector<StoredLog> LogsIn(const std::string& directory) {
     logs.push_back({status.st_mtim.tv_sec, status.st_mtim.tv_nsec, name, path,
                     static_cast<std::uint64_t>(std::max<off_t>(status.st_size, 0))});
   }
-  return logs;
+  return 0;
+}
+
+// Removes every file of a directory, unfinished ones too; 0 or the errno.
+int RemoveFiles(const std::string& directory) {
+  const auto names = ReadDirectory(directory);
+  if (const int* error = std::get_if<int>(&names)) return *error;
+  int failure = 0;
+  const auto& files = std::get<std::vector<std::string>>(names);
+  for (const std::string& name : files) {
+    if (unlink(JoinPath(directory, name).c_str()) != 0 && errno != ENOENT) failure = errno;
+  }
+  if (failure != 0 || files.empty()) return failure;
+  return SyncDirectory(directory);
 }
 
 // "20260304T050607Z"
@@ -104,30 +120,74 @@ class LinuxDiagnostics : public Diagnostics {
     return preferences_.DGWPreferencesGetValue(name, "nuvex.da");
   }
 
-  bool DGWWriteLogForSubmission(std::string_view typeCode, std::string_view name,
-                                const std::optional<Dictionary>& metadata,
-                                const LogWriter& writer) override {
+  bool writeLog(const LogRequest& request, const LogWriter& writer) override {
+    if (!DiagnosticLogSubmissionEnabled()) {
+      log_.info("Submission is not enabled: the log %@ is not written", request.name);
+      return false;
+    }
     std::string reason;
-    if (!IsSafeName(name)) {
+    if (!IsSafeName(request.name)) {
       reason = "the name is refused";
     } else if (access_ == Access::kReadOnly) {
       reason = "no file may be changed";
     } else {
-      reason = writeLog(typeCode, name, metadata, writer);
+      reason = write(request, writer);
     }
-    if (!reason.empty()) log_.error("Cannot write the log %@: %@", name, reason);
+    if (!reason.empty()) log_.error("Cannot write the log %@: %@", request.name, reason);
     return reason.empty();
   }
 
-  void SubmitDiagnosticLogs() override {
-    if (access_ == Access::kReadOnly || LogsIn(pending_).empty()) return;
+  bool hasLog(const std::string& fileName) override {
+    return IsSafeName(fileName) &&
+           (Exists(JoinPath(pending_, fileName)) || Exists(JoinPath(outbox_, fileName)));
+  }
+
+  bool removeLogs(std::span<const std::string> fileNames) override {
     const FileLock lock(lockPath());
-    const int error = lock.error() != 0 ? lock.error() : MakeDirectories(outbox_);
+    int error = lock.error();
+    for (const std::string& directory : {pending_, outbox_}) {
+      bool isChanged = false;
+      for (const std::string& name : fileNames) {
+        if (error != 0 || !IsSafeName(name)) continue;
+        const bool isGone = unlink(JoinPath(directory, name).c_str()) == 0;
+        if (!isGone && errno != ENOENT) error = errno;
+        isChanged |= isGone;
+      }
+      if (isChanged && error == 0) error = SyncDirectory(directory);
+    }
+    if (error != 0) log_.error("Cannot remove logs from %@: %@", directory_, ErrnoText(error));
+    return error == 0;
+  }
+
+  bool removeAllLogs() override {
+    const FileLock lock(lockPath());
+    int error = lock.error();
+    for (const std::string& directory : {pending_, outbox_}) {
+      if (error == 0) error = RemoveFiles(directory);
+    }
+    if (error != 0) log_.error("Cannot remove the logs of %@: %@", directory_, ErrnoText(error));
+    return error == 0;
+  }
+
+  void SubmitDiagnosticLogs() override {
+    if (!DiagnosticLogSubmissionEnabled()) {
+      log_.info("Submission is not enabled: no log is submitted");
+      return;
+    }
+    if (access_ == Access::kReadOnly) return;
+    std::vector<StoredLog> logs;
+    int error = FindLogs(pending_, logs);
+    if (error == 0 && logs.empty()) return;
+    const FileLock lock(lockPath());
+    logs.clear();
+    if (error == 0) error = lock.error();
+    if (error == 0) error = MakeDirectories(outbox_);
+    if (error == 0) error = FindLogs(pending_, logs);
     if (error != 0) {
       log_.error("Cannot submit the logs in %@: %@", pending_, ErrnoText(error));
       return;
     }
-    for (const StoredLog& log : LogsIn(pending_)) {
+    for (const StoredLog& log : logs) {
       const std::string target = outbox_ + "/" + log.name;
       // Names are new in both directories; a file of that name is not ours to replace.
       const int moved = Exists(target)                                  ? EEXIST
@@ -145,14 +205,14 @@ class LinuxDiagnostics : public Diagnostics {
   std::string lockPath() const { return directory_ + "/.lock"; }
 
   // Writes the log; returns why that failed, or nothing.
-  std::string writeLog(std::string_view typeCode, std::string_view name,
-                       const std::optional<Dictionary>& metadata, const LogWriter& writer) {
+  std::string write(const LogRequest& request, const LogWriter& writer) {
+    const std::string name(request.name);
     const Date created = clock_.now();
-    nlohmann::ordered_json header = {{"type", typeCode},
+    nlohmann::ordered_json header = {{"type", request.typeCode},
                                      {"name", name},
                                      {"created", Rfc3339(created)},
                                      {"os_version", DGWOSVersion()}};
-    if (metadata) header["metadata"] = PropertyJson(*metadata);
+    if (request.metadata) header["metadata"] = PropertyJson(*request.metadata);
 
     AtomicFile file(pending_, name);
     if (const int error = file.open()) return ErrnoText(error);
@@ -163,8 +223,9 @@ class LinuxDiagnostics : public Diagnostics {
 
     const FileLock lock(lockPath());
     if (lock.error() != 0) return ErrnoText(lock.error());
-    if (!makeRoom(output.size())) return "there is no room for it";
-    const std::string fileName = newName(std::string(name) + "-" + FileNameTime(created) + "-");
+    if (const std::string why = makeRoom(output.size()); !why.empty()) return why;
+    const std::string fileName = newName(name + "-" + FileNameTime(created) + "-");
+    if (request.beforePublication) request.beforePublication(fileName);
     if (const int error = file.publish(fileName)) {
       unlink((pending_ + "/" + fileName).c_str());  // it may be there, but not durable
       return ErrnoText(error);
@@ -180,10 +241,12 @@ class LinuxDiagnostics : public Diagnostics {
     }
   }
 
-  // Removes the oldest logs until one of `size` bytes fits; false when it does not even then.
-  bool makeRoom(std::uint64_t size) {
-    std::vector<StoredLog> logs = LogsIn(pending_);
-    std::ranges::move(LogsIn(outbox_), std::back_inserter(logs));
+  // Removes the oldest logs until one of `size` bytes fits; says why it does not, or nothing.
+  std::string makeRoom(std::uint64_t size) {
+    std::vector<StoredLog> logs;
+    for (const std::string& directory : {pending_, outbox_}) {
+      if (const int error = FindLogs(directory, logs)) return ErrnoText(error);
+    }
     std::ranges::sort(logs, {}, &StoredLog::age);
     std::uint64_t total = size;
     for (const StoredLog& log : logs) total += log.size;
@@ -196,7 +259,7 @@ class LinuxDiagnostics : public Diagnostics {
       log_.info("Removed the old log %@ to make room", log.path);
       total -= log.size;
     }
-    return total <= kQuotaBytes;
+    return total <= kQuotaBytes ? "" : "there is no room for it";
   }
 
   const std::string directory_;

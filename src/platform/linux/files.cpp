@@ -7,6 +7,7 @@
 #include <algorithm>
 #include <memory>
 #include <system_error>
+#include <tuple>
 #include <utility>
 
 #include "platform/linux/descriptor.h"
@@ -63,6 +64,8 @@ int OpenRegularFile(const std::string& path, int flags, Descriptor& opened, stru
   Descriptor descriptor(Uninterrupted([&] { return open(path.c_str(), allFlags, kFileMode); }));
   if (!descriptor.isOpen() || fstat(descriptor.get(), &status) != 0) return errno;
   if (!S_ISREG(status.st_mode)) return S_ISDIR(status.st_mode) ? EISDIR : EINVAL;
+  // A second name of some other file, which is not ours to write.
+  if ((flags & O_ACCMODE) != O_RDONLY && status.st_nlink > 1) return EMLINK;
   opened = std::move(descriptor);
   return 0;
 }
@@ -172,7 +175,11 @@ int AtomicFile::open() {
   while (true) {
     Descriptor file;
     struct stat status = {};
-    if (const int error = OpenLocked(temporaryPath_, file, status)) return error;
+    const int error = OpenLocked(temporaryPath_, file, status);
+    // A name that somebody else has given to one of his files: only the name goes.
+    const bool isForeign = error == EMLINK || error == ELOOP;
+    if (isForeign && unlink(temporaryPath_.c_str()) == 0) continue;
+    if (error != 0) return error;
     // Whoever held the lock before may have published or removed this very file.
     if (!StillNames(temporaryPath_, status)) continue;
     descriptor_ = file.release();
@@ -219,16 +226,49 @@ std::string JoinPath(const std::string& directory, std::string_view name) {
   return path.append(directory).append("/").append(name);
 }
 
-std::vector<std::string> ListDirectory(const std::string& directory) {
+std::variant<std::vector<std::string>, int> ReadDirectory(const std::string& directory) {
   std::vector<std::string> names;
   const std::unique_ptr<DIR, int (*)(DIR*)> stream(opendir(directory.c_str()), &closedir);
-  if (stream == nullptr) return names;
+  if (stream == nullptr && errno == ENOENT) return names;
+  if (stream == nullptr) return errno;
+  errno = 0;
   while (const dirent* entry = readdir(stream.get())) {
     const std::string_view name = entry->d_name;
     if (name != "." && name != "..") names.emplace_back(name);
+    errno = 0;
   }
+  if (errno != 0) return errno;
   std::ranges::sort(names);
   return names;
+}
+
+std::vector<std::string> ListDirectory(const std::string& directory) {
+  auto names = ReadDirectory(directory);
+  auto* read = std::get_if<std::vector<std::string>>(&names);
+  return read != nullptr ? std::move(*read) : std::vector<std::string>();
+}
+
+int MoveAsideAsDamaged(const std::string& path, std::string& aside) {
+  constexpr int kMostKept = 9;
+  timespec oldest{};
+  for (int number = 1; number <= kMostKept; ++number) {
+    std::string name = path + ".damaged";
+    if (number > 1) name += "." + std::to_string(number);
+    struct stat status = {};
+    if (lstat(name.c_str(), &status) != 0) {
+      if (errno != ENOENT) return errno;
+      aside = std::move(name);
+      break;
+    }
+    const timespec& time = status.st_ctim;
+    const bool isOlder =
+        std::tie(time.tv_sec, time.tv_nsec) < std::tie(oldest.tv_sec, oldest.tv_nsec);
+    if (number == 1 || isOlder) {
+      oldest = time;
+      aside = std::move(name);
+    }
+  }
+  return rename(path.c_str(), aside.c_str()) == 0 ? 0 : errno;
 }
 
 std::string ErrnoText(int error) { return std::generic_category().message(error); }

@@ -93,8 +93,16 @@ class FileLock {
 // "directory/name"; `name` must have been checked.
 std::string JoinPath(const std::string& directory, std::string_view name);
 
-// The names in a directory in byte order, without "." and ".."; empty when it cannot be read.
+// The names in a directory in byte order, without "." and "..", or the errno; none where there is
+// no such directory.
+[[nodiscard]] std::variant<std::vector<std::string>, int> ReadDirectory(
+    const std::string& directory);
+// The same for whoever can do without: empty when it cannot be read.
 std::vector<std::string> ListDirectory(const std::string& directory);
+
+// Moves the file at `path` aside as "<path>.damaged", or as ".damaged.2" to ".damaged.9" where that
+// is taken; the oldest of them goes when all are. Writes the new name to `aside`. 0 or the errno.
+[[nodiscard]] int MoveAsideAsDamaged(const std::string& path, std::string& aside);
 
 // The text of an errno value.
 std::string ErrnoText(int error);

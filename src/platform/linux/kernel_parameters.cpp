@@ -1,6 +1,6 @@
 #include "platform/kernel_parameters.h"
 
-#include <sys/file.h>
+#include <sys/stat.h>
 #include <unistd.h>
 
 #include <algorithm>
@@ -9,7 +9,10 @@
 #include <cstdint>
 #include <cstring>
 #include <limits>
+#include <map>
 #include <optional>
+#include <variant>
+#include <vector>
 
 #include "platform/linux/descriptor.h"
 #include "platform/linux/services.h"
@@ -18,6 +21,7 @@ namespace quorlet {
 namespace {
 
 constexpr char kDirectory[] = "/var/db/kernel/";
+constexpr off_t kLargestEvent = 72;
 constexpr std::size_t kMaxMemoryInfoBytes = 256UL << 10;
 
 // The value of "vm.swapusage".
@@ -80,30 +84,49 @@ class LinuxKernelParameters : public KernelParameters {
     return error;
   }
 
+  bool removeTaken(std::string_view name) override {
+    const std::string directory = root_.path(kDirectory) + std::string(name);
+    const auto found = taken_.find(directory);
+    if (found == taken_.end() || access_ == Access::kReadOnly) return true;
+    bool allRemoved = true;
+    std::erase_if(found->second, [&](const std::string& path) {
+      if (unlink(path.c_str()) == 0 || errno == ENOENT) return true;
+      log_.error("Cannot remove %@: %@", path, ErrnoText(errno));
+      allRemoved = false;
+      return false;
+    });
+    return allRemoved;
+  }
+
  private:
-  // Takes the first file. One that does not fit the buffer is removed all the same, or it would
-  // stand before the others for ever. The lock on the directory keeps two processes from taking
-  // the same one.
+  // Hands out the first file that was not handed out before; it is removed later. One that is
+  // larger than any event is moved out of the way, or it would stand before the others for ever.
   int takeFromQueue(const std::string& directory, std::span<std::byte> buffer,
                     std::size_t& length) {
-    const Descriptor queue(
-        Uninterrupted([&] { return open(directory.c_str(), O_RDONLY | O_DIRECTORY | O_CLOEXEC); }));
-    if (!queue.isOpen() || Uninterrupted([&] { return flock(queue.get(), LOCK_EX); }) != 0) {
-      return errno;
-    }
-    for (const std::string& name : ListDirectory(directory)) {
+    const auto names = ReadDirectory(directory);
+    if (const int* error = std::get_if<int>(&names)) return *error;
+    std::vector<std::string>& taken = taken_[directory];
+    for (const std::string& name : std::get<std::vector<std::string>>(names)) {
       struct stat status = {};
       const std::string path = JoinPath(directory, name);
       // Hidden names are files that their writer has not finished.
-      if (name.starts_with('.') || lstat(path.c_str(), &status) != 0 || !S_ISREG(status.st_mode)) {
-        continue;
-      }
+      if (name.starts_with('.') || std::ranges::find(taken, path) != taken.end()) continue;
+      if (lstat(path.c_str(), &status) != 0 || !S_ISREG(status.st_mode)) continue;
       const int error = ReadInto(path, buffer, length);
-      if ((error != 0 && error != ENOMEM) || access_ == Access::kReadOnly) return error;
-      // An entry that cannot be removed is not handed out, or it would be handed out for ever.
-      return unlink(path.c_str()) == 0 ? error : errno;
+      if (error == 0) taken.push_back(path);
+      if (error == ENOMEM && status.st_size > kLargestEvent) refuse(directory, name);
+      return error;
     }
     return ENOENT;
+  }
+
+  void refuse(const std::string& directory, const std::string& name) {
+    if (access_ == Access::kReadOnly) return;
+    const std::string path = JoinPath(directory, name);
+    const std::string aside = JoinPath(directory, "." + name + ".refused");
+    const int error = rename(path.c_str(), aside.c_str()) == 0 ? 0 : errno;
+    log_.error("The event %@ is larger than any; %@", path,
+               error == 0 ? "it was moved aside" : "it cannot be moved aside: " + ErrnoText(error));
   }
 
   int readSwapUsage(std::span<std::byte> buffer, std::size_t& length) const {
@@ -123,6 +146,7 @@ class LinuxKernelParameters : public KernelParameters {
   const Root root_;
   const Access access_;
   SystemLog& log_;
+  std::map<std::string, std::vector<std::string>, std::less<>> taken_;  // by queue
 };
 
 }  // namespace

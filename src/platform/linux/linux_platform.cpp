@@ -31,15 +31,16 @@ std::vector<std::unique_ptr<EntrySource>> EntrySources(const Root& root, SystemL
 
 // Every service comes after those that it borrows, so destruction in reverse order is safe.
 struct LinuxPlatform::Services {
-  Services(Root givenRoot, Access access, std::unique_ptr<SystemLog> givenLog)
+  Services(Root givenRoot, Access access, std::unique_ptr<SystemLog> givenLog,
+           const TallyOptions& options)
       : root(std::move(givenRoot)),
         log(givenLog ? std::move(givenLog) : MakeLinuxSystemLog(root, access, *clock)),
         preferences(MakeLinuxPreferences(root, access, *log)),
         deviceInfo(MakeLinuxDeviceInfo(root, *log)),
         environment(MakeLinuxEnvironment(root, *deviceInfo, *log)),
         queries(*deviceInfo, *environment, *log),
-        ledger(MakeTallyLedger(root, access, queries, *preferences, *log)),
-        counterStore(MakeLinuxCounterStore(*ledger, *clock)),
+        ledger(MakeTallyLedger(root, access, queries, *preferences, *log, options)),
+        counterStore(MakeLinuxCounterStore(*ledger, *clock, *log)),
         osVersion(MakeLinuxOSVersion(root, *log)),
         diagnostics(MakeLinuxDiagnostics(root, access, *clock, *preferences, *osVersion, *log)),
         crashSupport(MakeLinuxCrashSupport(root, access, *clock, *osVersion, *log)),
@@ -103,8 +104,9 @@ struct LinuxPlatform::Services {
                   .standardError = *standardError};
 };
 
-LinuxPlatform::LinuxPlatform(Root root, Access access, std::unique_ptr<SystemLog> log)
-    : services_(std::make_unique<Services>(std::move(root), access, std::move(log))) {}
+LinuxPlatform::LinuxPlatform(Root root, Access access, std::unique_ptr<SystemLog> log,
+                             const TallyOptions& options)
+    : services_(std::make_unique<Services>(std::move(root), access, std::move(log), options)) {}
 
 LinuxPlatform::~LinuxPlatform() = default;
 

@@ -15,8 +15,9 @@ namespace quorlet {
 // pending preference changes durable.
 class LinuxPlatform {
  public:
-  // `log` replaces the root's system log when it is given.
-  LinuxPlatform(Root root, Access access, std::unique_ptr<SystemLog> log = nullptr);
+  // `log` replaces the root's system log when it is given. `options`: of the counter store.
+  LinuxPlatform(Root root, Access access, std::unique_ptr<SystemLog> log = nullptr,
+                const TallyOptions& options = {});
   LinuxPlatform(const LinuxPlatform&) = delete;
   LinuxPlatform& operator=(const LinuxPlatform&) = delete;
   ~LinuxPlatform();

@@ -11,11 +11,12 @@ class LinuxPassLock : public PassLock {
  public:
   LinuxPassLock(const Root& root, SystemLog& log) : path_(root.path(kLockPath)), log_(log) {}
 
-  void lock() override {
+  bool lock() override {
     lock_.emplace(path_);
-    if (lock_->error() != 0) {
-      log_.error("Cannot lock %@, going on without: %@", path_, ErrnoText(lock_->error()));
-    }
+    if (lock_->error() == 0) return true;
+    log_.error("Cannot lock %@: %@", path_, ErrnoText(lock_->error()));
+    lock_.reset();
+    return false;
   }
   void unlock() override { lock_.reset(); }
 
@@ -27,7 +28,7 @@ class LinuxPassLock : public PassLock {
 
 class NoPassLock : public PassLock {
  public:
-  void lock() override {}
+  bool lock() override { return true; }
   void unlock() override {}
 };
 

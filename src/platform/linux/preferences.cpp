@@ -11,6 +11,7 @@
 #include <cerrno>
 #include <cstdio>
 #include <exception>
+#include <limits>
 #include <map>
 #include <mutex>
 #include <set>
@@ -57,15 +58,33 @@ FileVersion VersionOf(const std::string& path) {
   return version;
 }
 
-// A domain's dictionary from its file, or why there is none.
-std::variant<Dictionary, std::string> ReadDomainFile(const std::string& path) {
+// Why a domain's file gives no dictionary.
+struct ReadFailure {
+  std::string why;
+  bool isDamage;  // its bytes were read, and are no dictionary; otherwise they could not be read
+};
+
+std::variant<Dictionary, ReadFailure> ReadDomainFile(const std::string& path) {
   const auto bytes = ReadWholeFile(path, kMaxPropertyListBytes);
-  if (const int* error = std::get_if<int>(&bytes)) return ErrnoText(*error);
+  if (const int* error = std::get_if<int>(&bytes)) return ReadFailure{ErrnoText(*error), false};
   auto document = ReadPropertyList(std::string_view(std::get<std::string>(bytes)));
-  if (const auto* error = std::get_if<PropertyListError>(&document)) return error->description;
+  if (const auto* error = std::get_if<PropertyListError>(&document)) {
+    return ReadFailure{error->description, true};
+  }
   const Dictionary* dictionary = std::get<PropertyValue>(document).asDictionary();
-  if (dictionary == nullptr) return std::string("it holds no dictionary");
+  if (dictionary == nullptr) return ReadFailure{"it holds no dictionary", true};
   return *dictionary;
+}
+
+// Nothing where the change comes to nothing.
+std::optional<std::int64_t> Added(const PropertyValue* value, std::int64_t delta) {
+  const Number* number = value != nullptr ? value->asNumber() : nullptr;
+  if (delta == 0 || (number == nullptr && delta < 0)) return std::nullopt;
+  std::int64_t sum = 0;
+  if (__builtin_add_overflow(number != nullptr ? number->toInt64() : 0, delta, &sum)) {
+    sum = delta > 0 ? std::numeric_limits<std::int64_t>::max() : 0;
+  }
+  return std::max<std::int64_t>(sum, 0);
 }
 
 // The document, or why it cannot be written. One that could not be read again is not written.
@@ -128,7 +147,36 @@ class LinuxPreferences : public Preferences {
     }
     refresh(domain, *found);
     const PropertyValue* value = found->stored.find(stored);
+    if (const auto added = found->added.find(stored); added != found->added.end()) {
+      if (const auto sum = Added(value, added->second)) return Int64(*sum);
+    }
     return value != nullptr ? std::optional(*value) : std::nullopt;
+  }
+
+  void addToInteger(std::string_view key, std::int64_t delta, std::string_view domain) override {
+    const std::lock_guard lock(mutex_);
+    Domain* found = findDomain(domain);
+    if (found == nullptr) return;
+    const std::string stored = StorableKey(key);
+    if (const auto change = found->pending.find(stored); change != found->pending.end()) {
+      const PropertyValue* value = change->second ? &*change->second : nullptr;
+      if (const auto sum = Added(value, delta)) change->second = Int64(*sum);
+      return;
+    }
+    std::int64_t& added = found->added[stored];
+    if (__builtin_add_overflow(added, delta, &added)) {
+      added = delta > 0 ? std::numeric_limits<std::int64_t>::max()
+                        : std::numeric_limits<std::int64_t>::min();
+    }
+    if (added == 0) found->added.erase(stored);
+  }
+
+  bool isReadable(std::string_view domain) override {
+    const std::lock_guard lock(mutex_);
+    Domain* found = findDomain(domain);
+    if (found == nullptr) return false;
+    refresh(domain, *found);
+    return !found->unreadable;
   }
 
   void DGWPreferencesSetValue(std::string_view key, std::optional<PropertyValue> value,
@@ -137,7 +185,9 @@ class LinuxPreferences : public Preferences {
     Domain* found = findDomain(domain);
     if (found == nullptr) return;
     found->hasFailed = false;
-    found->pending.insert_or_assign(StorableKey(key), std::move(value));
+    const std::string stored = StorableKey(key);
+    found->added.erase(stored);
+    found->pending.insert_or_assign(stored, std::move(value));
   }
 
   bool DGWPreferencesSynchronize(std::string_view domain) override {
@@ -152,8 +202,10 @@ class LinuxPreferences : public Preferences {
   struct Domain {
     std::optional<FileVersion> version;  // of `stored`; none before the first reading
     Dictionary stored;
-    bool damaged = false;    // there is a file, but `stored` is not from it
-    Changes pending;         // no value: the key is to be removed
+    bool damaged = false;     // there is a file, but `stored` is not from it
+    bool unreadable = false;  // nor can it be known what the file holds
+    Changes pending;          // no value: the key is to be removed
+    std::map<std::string, std::int64_t, std::less<>> added;  // to the value that the file holds
     bool hasFailed = false;  // the pending changes could not be written, and that was said
   };
 
@@ -186,6 +238,7 @@ class LinuxPreferences : public Preferences {
     // Taken before the file is read: a change in between only leads to one more reading.
     const FileVersion version = VersionOf(path(name));
     if (domain.version == version) return;
+    const bool wasUnreadable = std::exchange(domain.unreadable, false);
     domain.version = version;
     domain.stored = Dictionary();
     domain.damaged = false;
@@ -195,9 +248,13 @@ class LinuxPreferences : public Preferences {
       domain.stored = *dictionary;
       return;
     }
-    domain.damaged = true;
-    log_.error("Cannot read the preferences %@, taking them as empty: %@", path(name),
-               std::get<std::string>(read));
+    const ReadFailure& failure = std::get<ReadFailure>(read);
+    domain.damaged = failure.isDamage;
+    domain.unreadable = !failure.isDamage;
+    // What could not be read just now may be readable a moment later.
+    if (domain.unreadable) domain.version.reset();
+    if (domain.unreadable && wasUnreadable) return;
+    log_.error("Cannot read the preferences %@, taking them as empty: %@", path(name), failure.why);
   }
 
   // As DGWPreferencesSynchronize. What fails again is not said again.
@@ -216,18 +273,24 @@ class LinuxPreferences : public Preferences {
       }
       return false;
     }
-    return isSettled(name, domain) || writeMerged(name, domain);
+    if (isSettled(name, domain)) return true;
+    return !domain.unreadable && writeMerged(name, domain);
   }
 
   // Drops the pending changes when the file already holds them all.
   bool isSettled(std::string_view name, Domain& domain) {
-    if (domain.pending.empty()) return true;
+    if (domain.pending.empty() && domain.added.empty()) return true;
     refresh(name, domain);
-    const bool settled = std::ranges::all_of(domain.pending, [&](const auto& change) {
-      const PropertyValue* stored = domain.stored.find(change.first);
-      if (stored == nullptr || !change.second) return stored == nullptr && !change.second;
-      return IsWrittenAlike(*stored, *change.second);
+    if (domain.unreadable) return false;
+    std::erase_if(domain.added, [&](const auto& change) {
+      return !Added(domain.stored.find(change.first), change.second);
     });
+    const bool settled =
+        domain.added.empty() && std::ranges::all_of(domain.pending, [&](const auto& change) {
+          const PropertyValue* stored = domain.stored.find(change.first);
+          if (stored == nullptr || !change.second) return stored == nullptr && !change.second;
+          return IsWrittenAlike(*stored, *change.second);
+        });
     if (settled) domain.pending.clear();
     return settled;
   }
@@ -242,6 +305,9 @@ class LinuxPreferences : public Preferences {
       } else {
         merged.remove(key);
       }
+    }
+    for (const auto& [key, delta] : domain.added) {
+      if (const auto sum = Added(merged.find(key), delta)) merged[key] = Int64(*sum);
     }
     return merged;
   }
@@ -266,7 +332,7 @@ class LinuxPreferences : public Preferences {
     auto document = Document(merge(domain, refused));
     if (std::holds_alternative<PropertyListError>(document)) {
       refused = findUnwritable(name, domain);
-      if (refused.size() == domain.pending.size()) return true;
+      if (refused.size() == domain.pending.size() && domain.added.empty()) return true;
       if (!refused.empty()) document = Document(merge(domain, refused));
     }
     if (const auto* error = std::get_if<PropertyListError>(&document)) {
@@ -280,6 +346,7 @@ class LinuxPreferences : public Preferences {
       return false;
     }
     domain.pending = std::move(refused);
+    domain.added.clear();
     domain.version.reset();  // values read back as the file holds them
     return true;
   }
@@ -289,8 +356,9 @@ class LinuxPreferences : public Preferences {
     if (const int error = file.open()) return error;
     if (const int error = file.write(document)) return error;
     // Only now, so that a full disk leaves the damaged file where it is.
-    if (keepDamaged && rename(path(name).c_str(), (path(name) + ".damaged").c_str()) != 0) {
-      return errno;
+    std::string aside;
+    if (keepDamaged) {
+      if (const int error = MoveAsideAsDamaged(path(name), aside)) return error;
     }
     return file.publish(std::string(name) + ".plist");
   }

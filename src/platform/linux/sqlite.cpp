@@ -8,30 +8,31 @@
 namespace quorlet {
 namespace {
 
-constexpr std::chrono::seconds kLongestWait{5};
 // SQLite's own handler sleeps ever longer, and then starves among writers that come again at once.
 constexpr std::chrono::milliseconds kWaitStep{1};
 // Larger strings and rows than any of ours are a sign of damage; they are not allocated.
 constexpr int kLongestValue = 1 << 20;
 
 // Called while another connection holds the lock; 0 gives up.
-int WaitForLock(void*, int calls) {
+int WaitForLock(void* context, int calls) {
+  LockPatience& patience = *static_cast<LockPatience*>(context);
   thread_local std::chrono::steady_clock::time_point deadline;
   const auto now = std::chrono::steady_clock::now();
-  if (calls == 0) deadline = now + kLongestWait;
-  if (now >= deadline) return 0;
+  if (calls == 0) deadline = now + patience.longest();
+  if (now >= deadline) {
+    patience.noteWait(/*inVain=*/true);
+    return 0;
+  }
   std::this_thread::sleep_for(kWaitStep);
   return 1;
 }
 
-// SQLite syncs the directory whenever it opens a journal that it might have to create: a third of
-// what a transaction syncs. Our journals stay between transactions, empty; one that is there needs
-// no creating.
-int OpenExistingJournal(sqlite3_vfs*, const char* name, sqlite3_file* file, int flags,
-                        int* outFlags) {
+// SQLite syncs the directory when it first syncs a journal or log that it might have had to create.
+// Ours stays between transactions; one that is there needs no creating.
+int OpenExistingLog(sqlite3_vfs*, const char* name, sqlite3_file* file, int flags, int* outFlags) {
   sqlite3_vfs* system = sqlite3_vfs_find(nullptr);
   const bool mayCreate = (flags & SQLITE_OPEN_CREATE) != 0;
-  if ((flags & SQLITE_OPEN_MAIN_JOURNAL) != 0 && mayCreate && access(name, F_OK) == 0) {
+  if ((flags & SQLITE_OPEN_WAL) != 0 && mayCreate && access(name, F_OK) == 0) {
     const int code = system->xOpen(system, name, file, flags & ~SQLITE_OPEN_CREATE, outFlags);
     if (code == SQLITE_OK) return code;
   }
@@ -43,7 +44,7 @@ const char* FileAccess() {
   static sqlite3_vfs access = [] {
     sqlite3_vfs copy = *sqlite3_vfs_find(nullptr);
     copy.zName = "quorlet";
-    copy.xOpen = OpenExistingJournal;
+    copy.xOpen = OpenExistingLog;
     return copy;
   }();
   static const int registered = sqlite3_vfs_register(&access, /*makeDflt=*/0);
@@ -52,19 +53,19 @@ const char* FileAccess() {
 
 }  // namespace
 
-int SqliteDatabase::open(const std::string& path, int flags) {
+int SqliteDatabase::open(const std::string& path, int flags, LockPatience& patience) {
   sqlite3* handle = nullptr;
   // A relative path must not be taken for a URI.
   const std::string name = path.starts_with('/') ? path : "./" + path;
-  const int code =
-      sqlite3_open_v2(name.c_str(), &handle, flags | SQLITE_OPEN_NOMUTEX, FileAccess());
+  const int code = sqlite3_open_v2(
+      name.c_str(), &handle, flags | SQLITE_OPEN_NOMUTEX | SQLITE_OPEN_NOFOLLOW, FileAccess());
   handle_.reset(handle);
   if (code != SQLITE_OK) {
     handle_.reset();
     return code;
   }
   sqlite3_extended_result_codes(handle, 1);
-  sqlite3_busy_handler(handle, WaitForLock, nullptr);
+  sqlite3_busy_handler(handle, WaitForLock, &patience);
   sqlite3_limit(handle, SQLITE_LIMIT_LENGTH, kLongestValue);
   // The file may have been edited by anyone: nothing that it brings along is run.
   sqlite3_db_config(handle, SQLITE_DBCONFIG_DEFENSIVE, 1, nullptr);
@@ -72,6 +73,15 @@ int SqliteDatabase::open(const std::string& path, int flags) {
   sqlite3_db_config(handle, SQLITE_DBCONFIG_ENABLE_VIEW, 0, nullptr);
   sqlite3_db_config(handle, SQLITE_DBCONFIG_TRUSTED_SCHEMA, 0, nullptr);
   return SQLITE_OK;
+}
+
+int SqliteDatabase::openInMemory() {
+  sqlite3* handle = nullptr;
+  const int code =
+      sqlite3_open_v2(":memory:", &handle,
+                      SQLITE_OPEN_READWRITE | SQLITE_OPEN_CREATE | SQLITE_OPEN_NOMUTEX, nullptr);
+  handle_.reset(handle);
+  return code;
 }
 
 int SqliteDatabase::execute(const char* sql) {

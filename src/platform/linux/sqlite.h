@@ -4,6 +4,9 @@
 
 #include <sqlite3.h>
 
+#include <algorithm>
+#include <atomic>
+#include <chrono>
 #include <cstdint>
 #include <memory>
 #include <string>
@@ -11,11 +14,31 @@
 
 namespace quorlet {
 
+// How long a process waits for the locks of others. After a wait in vain the next ones are short,
+// until one succeeds: whoever stands in the way is likely to stand there still, and a pass with
+// many steps must come to its end. Shared by the process's connections; they must not outlive it.
+class LockPatience {
+ public:
+  explicit LockPatience(std::chrono::milliseconds longest) : longest_(longest) {}
+
+  std::chrono::milliseconds longest() const {
+    return isSpent_ ? std::min(longest_, kShortWait) : longest_;
+  }
+  void noteWait(bool inVain) { isSpent_ = inVain; }
+
+ private:
+  static constexpr std::chrono::milliseconds kShortWait{500};
+  const std::chrono::milliseconds longest_;
+  std::atomic<bool> isSpent_ = false;
+};
+
 // One connection. Codes are SQLite's extended result codes. Not for two threads at once.
 class SqliteDatabase {
  public:
-  // `flags`: SQLITE_OPEN_... . Waits up to 5 s for other connections' locks.
-  [[nodiscard]] int open(const std::string& path, int flags);
+  // `flags`: SQLITE_OPEN_... . A link in the last part of the path is refused.
+  [[nodiscard]] int open(const std::string& path, int flags, LockPatience& patience);
+  // An empty one that is nobody else's.
+  [[nodiscard]] int openInMemory();
   void close() { handle_.reset(); }
   bool isOpen() const { return handle_ != nullptr; }
   sqlite3* handle() const { return handle_.get(); }

@@ -5,6 +5,11 @@
 // 2. The new log replaces the log. Its inode is another one then: the move counts from here on.
 // 3. The staged days' files get their names.
 //
+// Publishing staged lines: their file is renamed to .structured.staged.<inode>.<size> of the log,
+// the lines are appended, and the file is removed. Whoever finds it so named cuts the same log back
+// to that size and appends again; another log has them already, since only a log without that file
+// beside it is replaced.
+//
 // Files found staged are given their names when the log has another inode by then, and removed when
 // it has not.
 #include "platform/linux/structured_log.h"
@@ -20,6 +25,7 @@
 #include <functional>
 #include <nlohmann/json.hpp>
 #include <set>
+#include <variant>
 #include <vector>
 
 #include "platform/linux/descriptor.h"
@@ -171,12 +177,115 @@ int StructuredLog::append(std::string_view line) const {
   return error;
 }
 
+int StructuredLog::openLog(Descriptor& log, off_t& size) const {
+  struct stat status = {};
+  constexpr int kFlags = O_RDWR | O_CREAT | O_APPEND | O_NOFOLLOW;
+  const int error = OpenRegularFile(path(), kFlags, log, status);
+  size = status.st_size;
+  return error;
+}
+
+int StructuredLog::sync() const {
+  Descriptor log;
+  off_t size = 0;
+  if (const int error = openLog(log, size)) return error;
+  if (Uninterrupted([&] { return fsync(log.get()); }) != 0) return errno;
+  // The log may be new, and staged lines that were put into it must not be put there again.
+  return SyncDirectory(directory_);
+}
+
+int StructuredLog::beginStaging() const {
+  const FileLock lock(lockPath());
+  if (lock.error() != 0) return lock.error();
+  // What was being published is published first: it counts.
+  if (const int error = publishMarked()) return error;
+  return unlink(stagedPath().c_str()) == 0 || errno == ENOENT ? 0 : errno;
+}
+
+int StructuredLog::stageLine(std::string_view line) const {
+  const FileLock lock(lockPath());
+  if (lock.error() != 0) return lock.error();
+  Descriptor staged;
+  struct stat status = {};
+  constexpr int kFlags = O_WRONLY | O_CREAT | O_APPEND | O_NOFOLLOW;
+  if (const int error = OpenRegularFile(stagedPath(), kFlags, staged, status)) return error;
+  const int error = WriteFully(staged.get(), std::string(line) + '\n');
+  if (error != 0 && ftruncate(staged.get(), status.st_size) != 0) return errno;
+  return error;
+}
+
+int StructuredLog::publishStaged() const {
+  const FileLock lock(lockPath());
+  if (lock.error() != 0) return lock.error();
+  if (const int error = publishMarked()) return error;
+  struct stat status = {};
+  if (lstat(stagedPath().c_str(), &status) != 0) return errno == ENOENT ? 0 : errno;
+  Descriptor log;
+  off_t size = 0;
+  if (const int error = openLog(log, size)) return error;
+  if (fstat(log.get(), &status) != 0) return errno;
+  const std::string marked =
+      stagedPath() + "." + std::to_string(status.st_ino) + "." + std::to_string(size);
+  if (rename(stagedPath().c_str(), marked.c_str()) != 0) return errno;
+  return publishMarked();
+}
+
+// Brings a publication that has begun to its end.
+int StructuredLog::publishMarked() const {
+  const auto names = ReadDirectory(directory_);
+  if (const int* error = std::get_if<int>(&names)) return *error;
+  const std::string prefix = stagedPath().substr(directory_.size() + 1) + ".";
+  for (const std::string& name : std::get<std::vector<std::string>>(names)) {
+    if (!name.starts_with(prefix)) continue;
+    const std::string marked = JoinPath(directory_, name);
+    unsigned long long inode = 0;
+    unsigned long long size = 0;
+    if (std::sscanf(name.c_str() + prefix.size(), "%llu.%llu", &inode, &size) != 2) continue;
+    Descriptor log;
+    off_t length = 0;
+    struct stat status = {};
+    if (const int error = openLog(log, length)) return error;
+    if (fstat(log.get(), &status) != 0) return errno;
+    if (status.st_ino == inode) {
+      const off_t start = std::min(length, static_cast<off_t>(size));
+      if (const int error = appendStaged(marked, log, start)) return error;
+    }
+    if (unlink(marked.c_str()) != 0) return errno;
+  }
+  return 0;
+}
+
+// Appends the lines of `marked` to the first `size` bytes of the log. Nothing is synced: a power
+// cut may lose the lines, or bring the file back, which doubles nothing. What is logged later and
+// has to last is synced with the directory, and so with the file's removal.
+int StructuredLog::appendStaged(const std::string& marked, const Descriptor& log,
+                                off_t size) const {
+  Descriptor staged;
+  struct stat status = {};
+  if (const int error = OpenRegularFile(marked, O_RDONLY | O_NOFOLLOW, staged, status)) {
+    return error;
+  }
+  if (Uninterrupted([&] { return ftruncate(log.get(), size); }) != 0) return errno;
+  char last = '\n';
+  if (size > 0 && Uninterrupted([&] { return pread(log.get(), &last, 1, size - 1); }) < 0) {
+    return errno;
+  }
+  int error = last == '\n' ? 0 : WriteFully(log.get(), "\n");
+  if (error == 0) {
+    error = ReadRange(staged.get(), 0, status.st_size,
+                      [&](std::string_view bytes) { return WriteFully(log.get(), bytes); });
+  }
+  return error;
+}
+
 int StructuredLog::moveOldLines(Date now) {
   struct stat status = {};
   if (lstat(path().c_str(), &status) != 0) return errno == ENOENT ? 0 : errno;
   const FileLock lock(lockPath());
   if (lock.error() != 0) return lock.error();
   if (const int error = finishMove()) return error;
+  // The log that lines are being published to must not be replaced before they are in it.
+  if (const int error = publishMarked()) return error;
   Move move;
   if (const int error = planMove(DayOf(Rfc3339(now)), move)) return error;
   if (move.days.empty()) return 0;
@@ -240,7 +349,9 @@ int StructuredLog::finishMove() const {
   struct stat status = {};
   if (lstat(path().c_str(), &status) != 0) return errno;
   const std::string inode = std::to_string(status.st_ino);
-  for (const std::string& name : ListDirectory(directory_)) {
+  const auto names = ReadDirectory(directory_);
+  if (const int* error = std::get_if<int>(&names)) return *error;
+  for (const std::string& name : std::get<std::vector<std::string>>(names)) {
     const std::string staged = directory_ + "/" + name;
     if (staged == newLogPath() && unlink(staged.c_str()) != 0) return errno;
     std::string_view rest = name;

@@ -23,7 +23,11 @@ std::int64_t DGWPreferencesGetIntegerValue(quorlet::Preferences& preferences, co
 
 void DGWPreferencesSetValue(quorlet::Preferences& preferences, const char* key, std::int64_t value,
                             const char* domain) {
-  preferences.DGWPreferencesSetValue(key, quorlet::Int64(value), domain);
+  // As a change of what was read, so that what another process counts meanwhile is not lost.
+  const std::int64_t read = preferences.DGWPreferencesGetIntegerValue(key, domain);
+  std::int64_t change = 0;
+  if (__builtin_sub_overflow(value, read, &change)) return;
+  preferences.addToInteger(key, change, domain);
 }
 
 }  // extern "C"

@@ -2,18 +2,25 @@
 // sequences  one row for each distribution: its day, its key, and the number of its blocks' series
 // blocks     the packed values (tally_blocks.h), identified by series and position
 //
+// notes      what the program itself has to remember in one transaction with the counters, in parts
+//
 // Rows of one day lie together in key order, which is how the daily pass reads them.
 //
-// A rollback journal, not a write-ahead log: most writers are processes that record one thing and
-// end, each of which would have to empty the log again, and a reader leaves no file behind.
+// A write-ahead log: a commit is one sync, and readers and writers do not wait for each other. The
+// log stays beside the database and is emptied when it has grown, not whenever the last user
+// leaves: most writers record one thing and end.
 #include "platform/linux/tally_database.h"
 
+#include <stdlib.h>
 #include <sys/stat.h>
 
 #include <algorithm>
-#include <limits>
+#include <cerrno>
+#include <memory>
+#include <utility>
+#include <vector>
 
-#include "platform/linux/descriptor.h"
+#include "platform/linux/files.h"
 #include "platform/linux/tally_blocks.h"
 #include "platform/linux/tally_private_copy.h"
 
@@ -24,6 +31,7 @@ namespace {
 constexpr std::int64_t kApplicationId = 0x51546c79;
 constexpr std::int64_t kTablesVersion = 1;
 constexpr char kCreateTables[] =
+    "PRAGMA page_size = 4096;"
     "CREATE TABLE scalars(day INTEGER NOT NULL, key BLOB NOT NULL, value INTEGER NOT NULL,"
     " PRIMARY KEY(day, key)) WITHOUT ROWID;"
     "CREATE TABLE sequences(day INTEGER NOT NULL, key BLOB NOT NULL, id INTEGER NOT NULL,"
@@ -31,15 +39,25 @@ constexpr char kCreateTables[] =
     "CREATE TABLE blocks(id INTEGER PRIMARY KEY, samples BLOB NOT NULL);"
     "PRAGMA application_id = 0x51546c79;"
     "PRAGMA user_version = 1;";
+// A database of an earlier release gets this table with its first note.
+constexpr char kCreateNotes[] =
+    "CREATE TABLE IF NOT EXISTS notes(name BLOB NOT NULL, part INTEGER NOT NULL,"
+    " value BLOB NOT NULL, PRIMARY KEY(name, part)) WITHOUT ROWID;";
+// A note may be larger than a value may be.
+constexpr std::size_t kNotePart = std::size_t{1} << 19;
 
+// FULL is what makes a commit durable: the log is synced before it returns. EXTRA is the same, and
+// keeps the promise where an old journal could not be given up yet because somebody reads.
+// 256 pages of log are a millisecond's reading for whoever opens the database first.
 constexpr char kWriterSettings[] =
-    "PRAGMA page_size = 4096;"
     "PRAGMA cache_size = -2048;"
     "PRAGMA cell_size_check = ON;"
     "PRAGMA secure_delete = OFF;"
-    "PRAGMA journal_mode = TRUNCATE;"
-    "PRAGMA synchronous = NORMAL;";
+    "PRAGMA synchronous = EXTRA;"
+    "PRAGMA wal_autocheckpoint = 256;"
+    "PRAGMA journal_size_limit = 1048576;";
 static_assert(kTallyPageSize == 4096);
+constexpr char kWriteAheadLog[] = "PRAGMA journal_mode = WAL;";
 constexpr char kReaderSettings[] =
     "PRAGMA cache_size = -1024;"
     "PRAGMA cell_size_check = ON;";
@@ -54,20 +72,30 @@ std::int64_t LastBlock(std::int64_t sequence) {
   return FirstBlock(sequence) + kBlocksPerSequence - 1;
 }
 
-// How the file says it is to be written and read (bytes 18 and 19 of a database): 1 with a rollback
-// journal, 2 with a write-ahead log. A new file has neither.
-struct FileFormat {
-  unsigned char writing = 1;
-  unsigned char reading = 1;
+// What the start of a database says. Read through the connection: a descriptor of our own would,
+// when closed, take all of this process's locks on the file with it.
+struct FileHeader {
+  bool isDatabase = false;
+  bool isEmpty = false;
+  // How it is to be written: with a rollback journal (1) or with a write-ahead log (2).
+  unsigned char format = 0;
 };
 
-FileFormat FormatOf(SqliteDatabase& database) {
+FileHeader HeaderOf(SqliteDatabase& database) {
+  constexpr std::string_view kMagic("SQLite format 3\0", 16);
+  constexpr int kWriteFormat = 18, kReadFormat = 19;
   sqlite3_file* file = nullptr;
-  unsigned char bytes[2];
+  char bytes[20] = {};
+  sqlite3_int64 size = 0;
   sqlite3_file_control(database.handle(), "main", SQLITE_FCNTL_FILE_POINTER, &file);
   if (file == nullptr || file->pMethods == nullptr) return {};
-  if (file->pMethods->xRead(file, bytes, sizeof(bytes), 18) != SQLITE_OK) return {};
-  return {bytes[0], bytes[1]};
+  if (file->pMethods->xFileSize(file, &size) != SQLITE_OK) return {};
+  if (size == 0) return {.isEmpty = true};
+  if (file->pMethods->xRead(file, bytes, sizeof(bytes), 0) != SQLITE_OK) return {};
+  const auto format = static_cast<unsigned char>(bytes[kWriteFormat]);
+  const bool isKnown = (format == 1 || format == 2) && bytes[kReadFormat] == bytes[kWriteFormat];
+  return {.isDatabase = isKnown && std::string_view(bytes, kMagic.size()) == kMagic,
+          .format = format};
 }
 
 class BlobHandle {
@@ -94,10 +122,27 @@ class BlobHandle {
 
 }  // namespace
 
-std::optional<FileIdentity> IdentityOf(const std::string& path) {
+int FindIdentity(const std::string& path, FileIdentity& identity) {
   struct stat status {};
-  if (stat(path.c_str(), &status) != 0) return std::nullopt;
-  return FileIdentity{status.st_dev, status.st_ino};
+  if (lstat(path.c_str(), &status) != 0) return errno;
+  identity = {status.st_dev, status.st_ino};
+  return 0;
+}
+
+std::string NewTallyDatabase() {
+  // How a database says that a write-ahead log belongs to it; in memory there is none to set up.
+  constexpr std::size_t kWriteFormat = 18, kReadFormat = 19;
+  SqliteDatabase database;
+  if (database.openInMemory() != SQLITE_OK) return "";
+  if (database.execute(kCreateTables) != SQLITE_OK) return "";
+  if (database.execute(kCreateNotes) != SQLITE_OK) return "";
+  sqlite3_int64 size = 0;
+  unsigned char* bytes = sqlite3_serialize(database.handle(), "main", &size, 0);
+  if (bytes == nullptr) return "";
+  std::string text(reinterpret_cast<const char*>(bytes), static_cast<std::size_t>(size));
+  sqlite3_free(bytes);
+  text.at(kWriteFormat) = text.at(kReadFormat) = 2;
+  return text;
 }
 
 bool IsDamage(int code) {
@@ -109,6 +154,7 @@ bool IsDamage(int code) {
 bool IsMoved(int code) { return code == SQLITE_READONLY_DBMOVED; }
 
 std::string TallyDatabase::message(int code) const {
+  if (!refusal_.empty()) return refusal_;
   // The connection knows more only about what it has reported itself.
   if (isOpen() && sqlite3_extended_errcode(database_.handle()) == code) {
     return sqlite3_errmsg(database_.handle());
@@ -116,22 +162,52 @@ std::string TallyDatabase::message(int code) const {
   return sqlite3_errstr(code);
 }
 
-int TallyDatabase::openFile(const std::string& path, int flags) {
-  close();
+int TallyDatabase::refuse(std::string why) {
+  refusal_ = std::move(why);
+  return SQLITE_CANTOPEN;
+}
+
+// Neither the database nor a file beside it may be anything that others have a hand in: a link, a
+// second name of some other file, a FIFO that would be waited for.
+int TallyDatabase::checkFiles(const std::string& path) {
   struct stat status {};
-  const bool exists = stat(path.c_str(), &status) == 0;
-  // Opening a FIFO might wait forever.
-  if (exists && !S_ISREG(status.st_mode)) return SQLITE_CANTOPEN;
-  if (const int code = database_.open(path, flags); code != SQLITE_OK) return code;
-  // Looked at before the file was opened: if it was replaced in between, the old identity only
-  // makes the next user open it once more.
-  if (exists) {
-    identity_ = {status.st_dev, status.st_ino};
-  } else if (const std::optional<FileIdentity> created = IdentityOf(path)) {
-    identity_ = *created;
+  if (lstat(path.c_str(), &status) != 0) return refuse(ErrnoText(errno));
+  identity_ = {status.st_dev, status.st_ino};
+  const auto isOurs = [](const struct stat& file) {
+    return S_ISREG(file.st_mode) && file.st_nlink == 1;
+  };
+  if (!isOurs(status)) return refuse("it is not a file with one name");
+  for (const char* suffix : kTallySideFiles) {
+    if (lstat((path + suffix).c_str(), &status) == 0) {
+      if (!isOurs(status)) return refuse(path + suffix + " is not a file with one name");
+    } else if (errno != ENOENT) {
+      return refuse(ErrnoText(errno));
+    }
   }
-  // SQLite would take any other format for one that may only be read.
-  return FormatOf(database_).writing <= 2 ? SQLITE_OK : SQLITE_NOTADB;
+  return SQLITE_OK;
+}
+
+int TallyDatabase::openFile(const std::string& path, LockPatience& patience) {
+  close();
+  path_ = path;
+  // SQLite refuses links in every part of the path; directories may be links.
+  const std::size_t name = path.rfind('/') + 1;
+  const std::unique_ptr<char, decltype(&free)> directory(
+      realpath(path.substr(0, name).c_str(), nullptr), &free);
+  if (directory == nullptr) return refuse(ErrnoText(errno));
+  if (const int code = checkFiles(path); code != SQLITE_OK) return code;
+  const std::string resolved = JoinPath(directory.get(), path.substr(name));
+  if (const int code = database_.open(resolved, SQLITE_OPEN_READWRITE, patience);
+      code != SQLITE_OK) {
+    return code;
+  }
+  // The log stays when the last connection closes, and is not copied back then: see above.
+  int on = 1;
+  sqlite3_file_control(database_.handle(), "main", SQLITE_FCNTL_PERSIST_WAL, &on);
+  sqlite3_db_config(database_.handle(), SQLITE_DBCONFIG_NO_CKPT_ON_CLOSE, 1, nullptr);
+  // With a log beside it SQLite may not even look at the file's own first page.
+  const FileHeader header = HeaderOf(database_);
+  return header.isEmpty || header.isDatabase ? SQLITE_OK : SQLITE_NOTADB;
 }
 
 int TallyDatabase::setUp(const char* settings) {
@@ -141,51 +217,52 @@ int TallyDatabase::setUp(const char* settings) {
   return code == SQLITE_ERROR ? SQLITE_NOTADB : code;
 }
 
-int TallyDatabase::openForWriting(const std::string& path) {
-  // SQLite would make the file readable for everybody. What goes wrong here it finds out as well.
-  const Descriptor made(open(path.c_str(), O_RDONLY | O_CREAT | O_CLOEXEC | O_NONBLOCK, 0640));
-  const int code = openFile(path, SQLITE_OPEN_READWRITE | SQLITE_OPEN_CREATE);
-  return code == SQLITE_OK ? setUp(kWriterSettings) : code;
+int TallyDatabase::openForWriting(const std::string& path, LockPatience& patience) {
+  int code = openFile(path, patience);
+  if (code == SQLITE_OK) code = setUp(kWriterSettings);
+  if (code != SQLITE_OK || isBlank_ || HeaderOf(database_).format == 2) return code;
+  // A database of an earlier release. While somebody reads it, it stays as it is.
+  code = database_.execute(kWriteAheadLog);
+  return (code & 0xff) == SQLITE_BUSY ? SQLITE_OK : code;
 }
 
-int TallyDatabase::openForReading(const std::string& path, bool untouched) {
-  int code = openFile(path, untouched ? SQLITE_OPEN_READONLY : SQLITE_OPEN_READWRITE);
-  if (code != SQLITE_OK) return code;
-  // Somebody switched to a write-ahead log, with which even reading makes files. (A writer switches
-  // back.)
-  if (untouched && FormatOf(database_).reading == 2) return SQLITE_CANTOPEN;
-  code = setUp(kReaderSettings);
-  return untouched && code == SQLITE_READONLY_ROLLBACK ? openPrivateCopy(path) : code;
+int TallyDatabase::openForReading(const std::string& path, bool untouched, LockPatience& patience) {
+  if (untouched) return openPrivateCopy(path, patience);
+  int code = openFile(path, patience);
+  if (code == SQLITE_OK) code = setUp(kReaderSettings);
+  const int kind = code & 0xff;
+  const bool mayNotWrite = kind == SQLITE_READONLY || kind == SQLITE_CANTOPEN;
+  return mayNotWrite && refusal_.empty() ? openPrivateCopy(path, patience) : code;
 }
 
-int TallyDatabase::openPrivateCopy(const std::string& path) {
+int TallyDatabase::openPrivateCopy(const std::string& path, LockPatience& patience) {
+  close();
+  FileIdentity original;
+  if (const int error = FindIdentity(path, original)) return refuse(ErrnoText(error));
   const TallyPrivateCopy copy(path);
-  if (copy.path().empty()) return SQLITE_CANTOPEN;
-  const FileIdentity original = identity_;
-  const int code = openFile(copy.path(), SQLITE_OPEN_READWRITE);
+  if (copy.path().empty()) return refuse("no copy of it can be made: " + copy.error());
+  int code = openFile(copy.path(), patience);
+  path_ = path;
   identity_ = original;
   return code == SQLITE_OK ? setUp(kCopySettings) : code;
 }
 
-// Whose tables the file holds, seen in one read transaction: another process may just be making
-// them.
+int TallyDatabase::read(const char* query, std::int64_t& value) {
+  SqliteStatement statement(query);
+  SqliteRun run(database_, statement);
+  const int code = run.next();
+  if (code == SQLITE_ROW) value = run.integer(0);
+  return code == SQLITE_ROW ? SQLITE_OK : code;
+}
+
+// Whose tables the file holds, seen in one read transaction.
 int TallyDatabase::checkTables() {
-  SqliteStatement application("PRAGMA application_id");
-  SqliteStatement version("PRAGMA user_version");
-  SqliteStatement tables("SELECT count(*) FROM sqlite_schema");
-  const auto read = [this](SqliteStatement& statement, std::int64_t& value) {
-    SqliteRun run(database_, statement);
-    const int code = run.next();
-    if (code == SQLITE_ROW) value = run.integer(0);
-    return code == SQLITE_ROW ? SQLITE_OK : code;
-  };
-  const bool joins = database_.inTransaction();
   std::int64_t applicationId = 0, tablesVersion = 0, tableCount = 0;
-  int code = joins ? SQLITE_OK : database_.execute("BEGIN");
-  if (code == SQLITE_OK) code = read(tables, tableCount);
-  if (code == SQLITE_OK) code = read(application, applicationId);
-  if (code == SQLITE_OK) code = read(version, tablesVersion);
-  if (!joins) database_.rollback();
+  int code = database_.execute("BEGIN");
+  if (code == SQLITE_OK) code = read("SELECT count(*) FROM sqlite_schema", tableCount);
+  if (code == SQLITE_OK) code = read("PRAGMA application_id", applicationId);
+  if (code == SQLITE_OK) code = read("PRAGMA user_version", tablesVersion);
+  database_.rollback();
   if (code != SQLITE_OK) return code;
   isBlank_ = applicationId == 0 && tablesVersion == 0 && tableCount == 0;
   const bool isOurs = applicationId == kApplicationId && tablesVersion == kTablesVersion;
@@ -193,18 +270,12 @@ int TallyDatabase::checkTables() {
 }
 
 int TallyDatabase::begin() {
-  int code = database_.execute("BEGIN IMMEDIATE");
-  if (code == SQLITE_OK && isBlank_) {
-    code = checkTables();
-    if (code == SQLITE_OK && isBlank_) code = database_.execute(kCreateTables);
-  }
-  return code;
-}
-
-void TallyDatabase::rollback() {
-  database_.rollback();
-  // The tables may be gone again; begin() looks.
-  isBlank_ = true;
+  const int code = database_.execute("BEGIN IMMEDIATE");
+  if (code != SQLITE_OK) return code;
+  // While we waited, another process may have found the database damaged and moved it aside.
+  FileIdentity named;
+  const bool isNamed = FindIdentity(path_, named) == 0 && named == identity_;
+  return isNamed ? SQLITE_OK : SQLITE_READONLY_DBMOVED;
 }
 
 int TallyDatabase::setScalar(std::string_view key, std::int32_t day, std::int64_t value) {
@@ -314,9 +385,6 @@ int TallyDatabase::addBlock(std::int64_t block, std::uint64_t& before,
 
 int TallyDatabase::hasDaysBefore(std::int32_t firstDay, bool& has) {
   has = false;
-  if (isBlank_) {
-    if (const int code = checkTables(); code != SQLITE_OK || isBlank_) return code;
-  }
   SqliteStatement query(
       "SELECT EXISTS(SELECT 1 FROM scalars WHERE day < ?1)"
       " OR EXISTS(SELECT 1 FROM sequences WHERE day < ?1)");
@@ -346,6 +414,80 @@ int TallyDatabase::dropDaysBefore(std::int32_t firstDay) {
   }
   if (code != SQLITE_DONE) return code;
   return SqliteRun(database_, sequences, day).finish();
+}
+
+int TallyDatabase::dropCounters() {
+  return database_.execute("DELETE FROM scalars; DELETE FROM sequences; DELETE FROM blocks;");
+}
+
+int TallyDatabase::setNote(std::string_view name, const std::optional<std::string>& value) {
+  if (const int code = database_.execute(kCreateNotes); code != SQLITE_OK) return code;
+  SqliteStatement remove("DELETE FROM notes WHERE name = ?1");
+  SqliteStatement put("INSERT INTO notes(name, part, value) VALUES(?1, ?2, ?3)");
+  int code = SqliteRun(database_, remove, name).finish();
+  if (!value) return code;
+  std::string_view rest = *value;
+  for (std::int64_t part = 0; code == SQLITE_OK && (part == 0 || !rest.empty()); ++part) {
+    const std::string_view bytes = rest.substr(0, kNotePart);
+    code = SqliteRun(database_, put, name, part, bytes).finish();
+    rest.remove_prefix(bytes.size());
+  }
+  return code;
+}
+
+int TallyDatabase::readNote(std::string_view name, std::optional<std::string>& value) {
+  value.reset();
+  std::int64_t tables = 0;
+  int code = read("SELECT count(*) FROM sqlite_schema WHERE name = 'notes'", tables);
+  if (code != SQLITE_OK || tables == 0) return code;
+  SqliteStatement query("SELECT value FROM notes WHERE name = ?1 ORDER BY part");
+  SqliteRun run(database_, query, name);
+  while ((code = run.next()) == SQLITE_ROW) {
+    if (!value) value.emplace();
+    value->append(run.bytes(0));
+  }
+  return code == SQLITE_DONE ? SQLITE_OK : code;
+}
+
+int TallyDatabase::examine(bool values) {
+  {
+    SqliteStatement check("PRAGMA quick_check(1)");
+    SqliteRun run(database_, check);
+    const int code = run.next();
+    if (code != SQLITE_ROW) return code == SQLITE_DONE ? SQLITE_CORRUPT : code;
+    if (run.bytes(0) != "ok") return SQLITE_CORRUPT;
+  }
+  // What quick_check takes for granted: that every sequence has its blocks.
+  std::int64_t lost = 0;
+  int code = read(
+      "SELECT EXISTS(SELECT 1 FROM sequences WHERE id < 0 OR id >= 4398046511104"
+      " OR NOT EXISTS(SELECT 1 FROM blocks WHERE blocks.id = sequences.id * 1048576))",
+      lost);
+  if (code == SQLITE_OK && lost != 0) code = SQLITE_CORRUPT;
+  return code == SQLITE_OK && values ? checkValues() : code;
+}
+
+// Every block of every sequence, as a reader would see it.
+int TallyDatabase::checkValues() {
+  static_assert(kLastSequence == 4398046511103 && kBlocksPerSequence == 1048576);
+  SqliteStatement query("SELECT id, samples FROM blocks ORDER BY id");
+  SqliteRun run(database_, query);
+  std::vector<DistributionSample> samples;
+  std::int64_t next = -1;
+  std::uint64_t before = 0;
+  int code = SQLITE_OK;
+  while ((code = run.next()) == SQLITE_ROW) {
+    const std::int64_t block = run.integer(0);
+    if (block % kBlocksPerSequence == 0) {
+      before = 0;
+    } else if (block != next) {
+      return SQLITE_CORRUPT;
+    }
+    if (!UnpackBlock(run.bytes(1), before, samples)) return SQLITE_CORRUPT;
+    before += samples.size();
+    next = block + 1;
+  }
+  return code == SQLITE_DONE ? SQLITE_OK : code;
 }
 
 }  // namespace quorlet

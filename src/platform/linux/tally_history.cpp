@@ -50,6 +50,7 @@ class BlockEnumerator : public TLHistoryDistributionEnumerator {
 
   // SQLITE_OK, or what ended the values early.
   int failure() const { return failure_; }
+  bool failed() const override { return failure_ != SQLITE_OK; }
 
  protected:
   std::span<const DistributionSample> nextBlock() override {
@@ -76,7 +77,11 @@ class BlockEnumerator : public TLHistoryDistributionEnumerator {
 class TallyHistory : public TLHistory {
  public:
   TallyHistory(TallyDatabase database, TallyReadFailure onFailure)
-      : database_(std::move(database)), onFailure_(std::move(onFailure)) {}
+      : database_(std::move(database)),
+        onFailure_(std::move(onFailure)),
+        failed_(!database_.isOpen()) {}
+
+  bool failed() const override { return failed_; }
 
   void scalarsForKeyPrefixMinDaysSince1970MaxDaysSince1970RowHandler(
       std::string_view keyPrefix, std::int32_t minDay, std::int32_t maxDay,
@@ -110,7 +115,9 @@ class TallyHistory : public TLHistory {
                  const Handler& handler) {
     if (!database_.isOpen() || selection.isEmpty()) return;
     const int code = visitRows(selection, column, table, handler);
-    if (code != SQLITE_OK) onFailure_(database_, code);
+    if (code == SQLITE_OK) return;
+    failed_ = true;
+    onFailure_(database_, code);
   }
 
   template <typename Handler>
@@ -134,6 +141,7 @@ class TallyHistory : public TLHistory {
 
   TallyDatabase database_;
   TallyReadFailure onFailure_;
+  bool failed_;
 };
 
 }  // namespace

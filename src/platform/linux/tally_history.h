@@ -14,7 +14,8 @@ namespace quorlet {
 // go of the database by then. May close it: later enumerations then give no rows.
 using TallyReadFailure = std::function<void(TallyDatabase& database, int code)>;
 
-// Reads through `database`, which is open for reading and has its tables.
+// Reads through `database`, which is open for reading and has its tables; one that is not open
+// makes a reader that has failed.
 std::unique_ptr<TLHistory> MakeTallyHistory(TallyDatabase database, TallyReadFailure onFailure);
 
 }  // namespace quorlet

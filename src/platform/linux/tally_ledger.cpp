@@ -4,11 +4,12 @@
 
 #include <cerrno>
 #include <cstdio>
-#include <limits>
 #include <mutex>
 #include <optional>
 #include <utility>
 
+#include "platform/linux/descriptor.h"
+#include "platform/linux/lock_holder.h"
 #include "platform/linux/tally_database.h"
 #include "platform/linux/tally_history.h"
 
@@ -20,12 +21,24 @@ constexpr char kDatabaseName[] = "/TLDataStore.sqlitedb";
 constexpr char kLockName[] = "/.TLDataStore.lock";
 constexpr char kCorruptionCountKey[] = "DatabaseCorruptionCount";
 constexpr char kCorruptionCountDomain[] = "nuvex.aggregated";
+// Which file was counted last; there while it is being moved aside.
+constexpr char kCountedFileKey[] = "DatabaseCorruptionCounted";
 
 class LinuxTallyLedger final : public TallyLedger {
  public:
   LinuxTallyLedger(const Root& root, Access access, EnvironmentQueries& queries,
-                   Preferences& preferences, SystemLog& log)
-      : root_(root), access_(access), queries_(queries), preferences_(preferences), log_(log) {}
+                   Preferences& preferences, SystemLog& log, const TallyOptions& options)
+      : root_(root),
+        access_(access),
+        queries_(queries),
+        preferences_(preferences),
+        log_(log),
+        copiesBack_(options.copiesBack),
+        patience_(options.patience) {}
+
+  ~LinuxTallyLedger() override {
+    if (copiesBack_ && writer_.isOpen()) writer_.copyBack();
+  }
 
   bool takesKey(std::string_view key) override {
     if (key.size() <= kLongestTallyKey) return true;
@@ -44,8 +57,15 @@ class LinuxTallyLedger final : public TallyLedger {
     if (samples.empty()) return true;
     return write(key, [&] { return writer_.recordValues(key, day, samples); });
   }
+  bool setNote(std::string_view name, const std::optional<std::string>& value) override {
+    return write(name, [&] { return writer_.setNote(name, value); });
+  }
+  bool dropCounters() override {
+    return write({}, [&] { return writer_.dropCounters(); });
+  }
+  bool readNote(std::string_view name, std::optional<std::string>& value) override;
   bool inTransaction(const std::function<bool()>& work) override;
-  bool dropDaysBefore(std::int32_t firstDay) override;
+  bool checkpoint(std::int32_t firstDay) override;
   std::unique_ptr<TLHistory> openHistory() override;
 
  private:
@@ -54,13 +74,18 @@ class LinuxTallyLedger final : public TallyLedger {
   bool findPath();
   bool mayWrite();
   int openWriter();
+  int openOrCreate();
   int begin();
   bool write(std::string_view key, const Work& work);
   bool writeJoined(const Work& work);
+  std::string reasonOf(int code) const;
   bool recover(int code, bool mayTryAgain);
   bool replaceDamaged(const FileIdentity& damaged, const std::string& why);
-  void countCorruption();
-  bool startNewDatabase();
+  bool moveAside(const FileIdentity& damaged, const std::string& why);
+  void countCorruption(const FileIdentity& damaged);
+  int startNewDatabase();
+  int placeNewDatabase();
+  int lockFailed(const FileLock& lock);
   void handleReadFailure(TallyDatabase& reader, int code);
 
   const Root root_;
@@ -68,12 +93,14 @@ class LinuxTallyLedger final : public TallyLedger {
   EnvironmentQueries& queries_;
   Preferences& preferences_;
   SystemLog& log_;
+  const bool copiesBack_;
   // Recursive: the work of a transaction calls the writing operations.
   std::recursive_mutex mutex_;
   std::string directory_;
   std::string path_;
+  LockPatience patience_;
   TallyDatabase writer_;
-  std::string directoryError_;
+  std::string fileError_;  // what kept the writer from being opened
   bool inTransaction_ = false;
   bool transactionFailed_ = false;
 };
@@ -95,19 +122,42 @@ bool LinuxTallyLedger::mayWrite() {
 }
 
 int LinuxTallyLedger::openWriter() {
+  FileIdentity file;
+  int error = FindIdentity(path_, file);
   // Another process may have replaced a damaged database meanwhile.
-  if (writer_.isOpen() && IdentityOf(path_) != writer_.identity()) writer_.close();
+  if (writer_.isOpen() && (error != 0 || file != writer_.identity())) writer_.close();
   if (writer_.isOpen()) return SQLITE_OK;
-  if (const int error = MakeDirectories(directory_); error != 0) {
-    directoryError_ = ErrnoText(error);
+  if (error == ENOENT) error = MakeDirectories(directory_);
+  if (error != 0) {
+    fileError_ = ErrnoText(error);
     return SQLITE_CANTOPEN;
   }
-  return writer_.openForWriting(path_);
+  int code = openOrCreate();
+  if (code == SQLITE_CANTOPEN) {
+    // Another process may just be moving it aside: that is over when it lets go of the lock.
+    { const FileLock waited(directory_ + kLockName); }
+    code = openOrCreate();
+  }
+  return code;
+}
+
+int LinuxTallyLedger::openOrCreate() {
+  FileIdentity file;
+  fileError_.clear();
+  const bool isMissing = FindIdentity(path_, file) == ENOENT;
+  int code = isMissing ? SQLITE_OK : writer_.openForWriting(path_, patience_);
+  if (code == SQLITE_OK && (isMissing || writer_.isBlank())) {
+    code = startNewDatabase();
+    if (code == SQLITE_OK) code = writer_.openForWriting(path_, patience_);
+  }
+  return code;
 }
 
 int LinuxTallyLedger::begin() {
-  const int code = openWriter();
-  return code == SQLITE_OK ? writer_.begin() : code;
+  int code = openWriter();
+  if (code == SQLITE_OK) code = writer_.begin();
+  if (code == SQLITE_OK) patience_.noteWait(/*inVain=*/false);
+  return code;
 }
 
 bool LinuxTallyLedger::write(std::string_view key, const Work& work) {
@@ -157,14 +207,35 @@ bool LinuxTallyLedger::inTransaction(const std::function<bool()>& work) {
   return code == SQLITE_OK;
 }
 
-bool LinuxTallyLedger::dropDaysBefore(std::int32_t firstDay) {
+bool LinuxTallyLedger::readNote(std::string_view name, std::optional<std::string>& value) {
+  const std::lock_guard lock(mutex_);
+  value.reset();
+  FileIdentity file;
+  if (!findPath()) return false;
+  if (FindIdentity(path_, file) == ENOENT) return true;
+  for (const bool mayTryAgain : {true, false}) {
+    TallyDatabase reader;
+    int code = reader.openForReading(path_, access_ == Access::kReadOnly, patience_);
+    if (code == SQLITE_OK && reader.isBlank()) return true;
+    if (code == SQLITE_OK) code = reader.readNote(name, value);
+    if (code == SQLITE_OK) return true;
+    handleReadFailure(reader, code);
+    if (!mayTryAgain || !IsDamage(code) || access_ == Access::kReadOnly) break;
+  }
+  value.reset();
+  return false;
+}
+
+bool LinuxTallyLedger::checkpoint(std::int32_t firstDay) {
   const std::lock_guard lock(mutex_);
   if (!mayWrite()) return false;
-  if (!IdentityOf(path_)) return true;
+  FileIdentity file;
+  if (FindIdentity(path_, file) == ENOENT) return true;
   for (const bool mayTryAgain : {true, false}) {
-    // Looking first spares the usual case the write lock and its syncs.
+    // Looking first spares the usual case the write lock and its sync.
     bool has = false;
     int code = openWriter();
+    if (code == SQLITE_OK) code = writer_.examine(/*values=*/false);
     if (code == SQLITE_OK) code = writer_.hasDaysBefore(firstDay, has);
     if (code == SQLITE_OK && !has) return true;
     if (code == SQLITE_OK) return write({}, [&] { return writer_.dropDaysBefore(firstDay); });
@@ -173,12 +244,22 @@ bool LinuxTallyLedger::dropDaysBefore(std::int32_t firstDay) {
   return false;
 }
 
+std::string LinuxTallyLedger::reasonOf(int code) const {
+  if (!fileError_.empty()) return fileError_;
+  std::string why = writer_.message(code);
+  // Of a write-ahead log, the lock that its one writer holds.
+  constexpr std::uint64_t kWriterByte = 120;
+  if ((code & 0xff) != SQLITE_BUSY) return why;
+  const std::optional<int> holder = LockHolder(path_ + "-shm", kWriterByte);
+  return holder ? why + " by process " + std::to_string(*holder) : why;
+}
+
 // Ends the failed transaction. Returns whether the operation should be tried once more, which the
 // caller can; otherwise there is one error line.
 bool LinuxTallyLedger::recover(int code, bool mayTryAgain) {
-  const std::string why =
-      directoryError_.empty() ? writer_.message(code) : std::exchange(directoryError_, {});
+  const std::string why = reasonOf(code);
   const FileIdentity file = writer_.identity();
+  fileError_.clear();
   // Drops what was not committed. It may also never have opened properly.
   writer_.close();
   if (mayTryAgain && IsDamage(code)) return replaceDamaged(file, why);
@@ -187,7 +268,13 @@ bool LinuxTallyLedger::recover(int code, bool mayTryAgain) {
   return false;
 }
 
-// Moves the damaged database aside and starts a new one. Returns whether there is a good one now.
+int LinuxTallyLedger::lockFailed(const FileLock& lock) {
+  fileError_ = directory_ + kLockName + " cannot be locked: " + ErrnoText(lock.error());
+  return SQLITE_CANTOPEN;
+}
+
+// Moves the damaged database aside, unless a second look finds it sound. Returns whether there may
+// be a good one now; otherwise there is one error line.
 bool LinuxTallyLedger::replaceDamaged(const FileIdentity& damaged, const std::string& why) {
   if (access_ == Access::kReadOnly) {
     log_.error("The counter store %@ is damaged: %@", path_, why);
@@ -203,43 +290,90 @@ bool LinuxTallyLedger::replaceDamaged(const FileIdentity& damaged, const std::st
     return false;
   }
   // Another process found the damage as well, and was faster.
-  if (IdentityOf(path_) != damaged) return true;
-  // The journal goes first: left behind, it would be played back into the new database.
-  unlink((path_ + "-journal").c_str());
-  if (rename(path_.c_str(), (path_ + ".damaged").c_str()) != 0) {
+  FileIdentity file;
+  if (FindIdentity(path_, file) != 0 || file != damaged) return true;
+  TallyDatabase second;
+  int code = second.openForWriting(path_, patience_);
+  if (code == SQLITE_OK && !second.isBlank()) code = second.examine(/*values=*/true);
+  if (IsDamage(code)) {
+    second.close();
+    return moveAside(damaged, why);
+  }
+  if (code != SQLITE_OK) {
+    log_.error("Cannot read the counter store %@: %@", path_, second.message(code));
+  }
+  return code == SQLITE_OK;
+}
+
+// With the lock held. A kill at any point leaves what the next process brings to its end: the
+// damage is counted once, and what lies beside the database goes when the new one is made.
+bool LinuxTallyLedger::moveAside(const FileIdentity& damaged, const std::string& why) {
+  countCorruption(damaged);
+  std::string aside;
+  if (const int error = MoveAsideAsDamaged(path_, aside)) {
     log_.error("The counter store %@ is damaged (%@) and cannot be moved aside: %@", path_, why,
-               ErrnoText(errno));
+               ErrnoText(error));
     return false;
+  }
+  // With its log, which may hold what the database lost. What cannot be kept is no loss.
+  for (const char* suffix : kTallySideFiles) {
+    unlink((aside + suffix).c_str());
+    static_cast<void>(rename((path_ + suffix).c_str(), (aside + suffix).c_str()));
   }
   log_.error("The counter store %@ is damaged (%@); it was moved aside and a new one started",
              path_, why);
-  countCorruption();
-  return startNewDatabase();
+  preferences_.DGWPreferencesSetValue(kCountedFileKey, std::nullopt, kCorruptionCountDomain);
+  return placeNewDatabase() == SQLITE_OK || recover(SQLITE_CANTOPEN, /*mayTryAgain=*/false);
 }
 
-void LinuxTallyLedger::countCorruption() {
-  const std::int64_t count =
-      preferences_.DGWPreferencesGetIntegerValue(kCorruptionCountKey, kCorruptionCountDomain);
-  if (count == std::numeric_limits<std::int64_t>::max()) return;
-  preferences_.DGWPreferencesSetValue(kCorruptionCountKey, Int64(count + 1),
-                                      kCorruptionCountDomain);
-  // At once, so that the next process that finds damage counts on from here.
+// Together with which file was counted, so that nobody counts it again who finds it still there.
+void LinuxTallyLedger::countCorruption(const FileIdentity& damaged) {
+  const PropertyValue file(std::to_string(damaged.device) + ":" + std::to_string(damaged.inode));
+  const auto counted = preferences_.DGWPreferencesGetValue(kCountedFileKey, kCorruptionCountDomain);
+  if (counted && *counted == file) return;
+  preferences_.DGWPreferencesSetValue(kCountedFileKey, file, kCorruptionCountDomain);
+  preferences_.addToInteger(kCorruptionCountKey, 1, kCorruptionCountDomain);
   preferences_.DGWPreferencesSynchronize(kCorruptionCountDomain);
 }
 
-bool LinuxTallyLedger::startNewDatabase() {
-  int code = begin();
-  if (code == SQLITE_OK) code = writer_.commit();
-  return code == SQLITE_OK || recover(code, /*mayTryAgain=*/false);
+// Puts a new database where there is none, or one without tables: all of it at once, so that no
+// process ever meets half of it.
+int LinuxTallyLedger::startNewDatabase() {
+  writer_.close();
+  const FileLock lock(directory_ + kLockName);
+  if (lock.error() != 0) return lockFailed(lock);
+  FileIdentity file;
+  if (FindIdentity(path_, file) == 0) {
+    TallyDatabase there;
+    const int code = there.openForWriting(path_, patience_);
+    // Another process was faster, or has damaged it: the caller finds out.
+    if (code != SQLITE_OK || !there.isBlank()) return SQLITE_OK;
+  }
+  return placeNewDatabase();
+}
+
+// With the lock held.
+int LinuxTallyLedger::placeNewDatabase() {
+  // What an earlier database left beside it would be played into the new one.
+  bool hasLeftOvers = false;
+  for (const char* suffix : kTallySideFiles) {
+    hasLeftOvers |= unlink((path_ + suffix).c_str()) == 0;
+  }
+  int error = hasLeftOvers ? SyncDirectory(directory_) : 0;
+  if (error == 0) error = WriteWholeFile(path_, NewTallyDatabase());
+  if (error == 0) return SQLITE_OK;
+  fileError_ = ErrnoText(error);
+  return SQLITE_CANTOPEN;
 }
 
 std::unique_ptr<TLHistory> LinuxTallyLedger::openHistory() {
   const std::lock_guard lock(mutex_);
   if (!findPath()) return nullptr;
   for (int attempt = 0; attempt < 2; ++attempt) {
-    if (!IdentityOf(path_)) return nullptr;
+    FileIdentity file;
+    if (FindIdentity(path_, file) == ENOENT) return nullptr;
     TallyDatabase reader;
-    const int code = reader.openForReading(path_, access_ == Access::kReadOnly);
+    const int code = reader.openForReading(path_, access_ == Access::kReadOnly, patience_);
     if (code == SQLITE_OK) {
       if (reader.isBlank()) return nullptr;
       return MakeTallyHistory(std::move(reader), [this](TallyDatabase& database, int failure) {
@@ -247,9 +381,9 @@ std::unique_ptr<TLHistory> LinuxTallyLedger::openHistory() {
       });
     }
     handleReadFailure(reader, code);
-    if (!IsDamage(code) || access_ == Access::kReadOnly) return nullptr;
+    if (!IsDamage(code) || access_ == Access::kReadOnly) break;
   }
-  return nullptr;
+  return MakeTallyHistory(TallyDatabase(), {});
 }
 
 void LinuxTallyLedger::handleReadFailure(TallyDatabase& reader, int code) {
@@ -268,8 +402,8 @@ void LinuxTallyLedger::handleReadFailure(TallyDatabase& reader, int code) {
 
 std::unique_ptr<TallyLedger> MakeTallyLedger(const Root& root, Access access,
                                              EnvironmentQueries& queries, Preferences& preferences,
-                                             SystemLog& log) {
-  return std::make_unique<LinuxTallyLedger>(root, access, queries, preferences, log);
+                                             SystemLog& log, const TallyOptions& options) {
+  return std::make_unique<LinuxTallyLedger>(root, access, queries, preferences, log, options);
 }
 
 }  // namespace quorlet

@@ -2,9 +2,11 @@
 #ifndef QUORLET_PLATFORM_LINUX_TALLY_LEDGER_H_
 #define QUORLET_PLATFORM_LINUX_TALLY_LEDGER_H_
 
+#include <chrono>
 #include <cstdint>
 #include <functional>
 #include <memory>
+#include <optional>
 #include <span>
 #include <string>
 #include <string_view>
@@ -18,13 +20,15 @@
 
 namespace quorlet {
 
-// Opens the database lazily, on first use. A damaged database is moved aside and a new one started
-// (with one error line, and the preference that counts corruptions goes up); with read-only access
-// nothing changes and a damaged database gives no rows. All writes of an operation happen or none.
+// Opens the database lazily, on first use, and makes it when it is missing. A database that is
+// damaged, on a second look too, is moved aside and a new one started (with one error line, and the
+// preference that counts corruptions goes up); with read-only access nothing changes and a damaged
+// database gives no rows. All writes of an operation happen or none, and what was written is
+// durable when the operation returns.
 //
 // Safe to use from any thread once one operation has returned on the main thread; another thread's
-// operations wait for a transaction to end. Each reader belongs to one thread at a time, must not
-// outlive the ledger, and its row handlers must not write: the write would wait for the reader.
+// operations wait for a transaction to end. Each reader belongs to one thread at a time and must
+// not outlive the ledger.
 class TallyLedger {
  public:
   virtual ~TallyLedger() = default;
@@ -47,16 +51,36 @@ class TallyLedger {
   // once, even when the database turns out to be damaged midway.
   [[nodiscard]] virtual bool inTransaction(const std::function<bool()>& work) = 0;
 
-  // Drops the rows of days before `firstDay`.
-  [[nodiscard]] virtual bool dropDaysBefore(std::int32_t firstDay) = 0;
+  // Sets the note of that name, or removes it when there is no value. Notes are what the program
+  // has to remember in one transaction with the counters.
+  [[nodiscard]] virtual bool setNote(std::string_view name,
+                                     const std::optional<std::string>& value) = 0;
+  // Reads a note; nothing when there is none. False after an error line when it cannot be read.
+  [[nodiscard]] virtual bool readNote(std::string_view name, std::optional<std::string>& value) = 0;
+  // Drops every scalar and distribution; the notes stay.
+  [[nodiscard]] virtual bool dropCounters() = 0;
 
-  // A reader, or nullptr (no database: nullptr without a message).
+  // Looks for damage that reading would not notice, then drops the rows of days before `firstDay`.
+  [[nodiscard]] virtual bool checkpoint(std::int32_t firstDay) = 0;
+
+  // A reader, or nullptr when there is no database. One that cannot be opened gives, after an error
+  // line, a reader that has failed.
   virtual std::unique_ptr<TLHistory> openHistory() = 0;
 };
 
+struct TallyOptions {
+  // How long a writer waits for another.
+  std::chrono::milliseconds patience{5000};
+  // Whether the destructor copies the write-ahead log back, so that the database is whole without
+  // it.
+  bool copiesBack = true;
+};
+// A pass would lose a day's figures if it did not wait; and it spares itself the copy's syncs.
+inline constexpr TallyOptions kPassOptions{std::chrono::seconds(60), false};
+
 std::unique_ptr<TallyLedger> MakeTallyLedger(const Root& root, Access access,
                                              EnvironmentQueries& queries, Preferences& preferences,
-                                             SystemLog& log);
+                                             SystemLog& log, const TallyOptions& options = {});
 
 }  // namespace quorlet
 

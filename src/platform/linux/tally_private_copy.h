@@ -1,5 +1,5 @@
-// A copy of a database and its rollback journal in a directory outside of the store, for a reader
-// that must not finish what a killed writer left half done.
+// A copy of a database and its journal or write-ahead log in a directory outside of the store, for
+// a reader that must not, or cannot, change anything there.
 #ifndef QUORLET_PLATFORM_LINUX_TALLY_PRIVATE_COPY_H_
 #define QUORLET_PLATFORM_LINUX_TALLY_PRIVATE_COPY_H_
 
@@ -9,7 +9,7 @@ namespace quorlet {
 
 class TallyPrivateCopy {
  public:
-  // Copies `databasePath` and "<databasePath>-journal" to a new directory in $TMPDIR or /tmp.
+  // Copies `databasePath`, "-journal" and "-wal" to a new directory in $TMPDIR or /tmp.
   explicit TallyPrivateCopy(const std::string& databasePath);
   TallyPrivateCopy(const TallyPrivateCopy&) = delete;
   TallyPrivateCopy& operator=(const TallyPrivateCopy&) = delete;
@@ -17,12 +17,14 @@ class TallyPrivateCopy {
   ~TallyPrivateCopy();
 
   // The copied database's path, empty when it could not be made, or when other processes kept
-  // changing the original meanwhile.
+  // changing the original meanwhile; error() then says why.
   const std::string& path() const { return path_; }
+  const std::string& error() const { return error_; }
 
  private:
   std::string directory_;
   std::string path_;
+  std::string error_;
 };
 
 }  // namespace quorlet
