@@ -133,10 +133,40 @@ TEST_F(QuorletctlTest, WhatCannotBeReadIsAFailureAndNotEmpty) {
   expectFailure({"logs", "show", "x.log"}, 1, "Not a directory");
   block("/var/db/drivers");
   expectFailure({"channels", "list"}, 1, device.path("/var/db/drivers") + ": Not a directory");
+  const std::string lock = device.path(kPreferences) + ".d.lock";
+  std::filesystem::create_directories(lock);
+  expectFailure({"prefs", "set", "d", "k", "1"}, 1, lock);
   block("/var/mobile/Library/Preferences");
   expectFailure({"prefs", "get", "d", "k"}, 1, "Not a directory");
   expectFailure({"prefs", "list", "d"}, 1, "Not a directory");
-  expectFailure({"prefs", "set", "d", "k", "1"}, 1, device.path(kPreferences) + ".d.lock");
+}
+
+TEST_F(QuorletctlTest, ASnapshotHeaderThatCannotBeReadIsNotAMissingOne) {
+  const auto describe = [&](const std::string& status) {
+    device.write("/var/db/drivers/a.plist",
+                 "<plist version=\"1.0\"><dict><key>EntryID</key><integer>1</integer>"
+                 "<key>ClassName</key><string>FSPStorage</string><key>ExportMethods</key><array>"
+                 "<integer>8</integer></array><key>Exports</key><array><dict><key>Selector</key>"
+                 "<integer>22</integer><key>Data</key><data>AAAA</data></dict><dict>"
+                 "<key>Selector</key><integer>145</integer><key>Data</key><data>AAAA</data>"
+                 "<key>SizeStatus</key><integer>" +
+                     status + "</integer></dict></array></dict></plist>");
+  };
+  for (const char* none : {"-536870201", "-536870160"}) {  // unsupported, not found
+    describe(none);
+    EXPECT_TRUE(outputOf({"storage", "snapshot"}).starts_with("Key: ")) << none;
+  }
+  describe("-536870212");
+  expectFailure({"storage", "snapshot"}, 1, "snapshot header: status 0xe00002bc");
+  expectFailure({"storage", "info"}, 1, "does not answer");
+}
+
+TEST_F(QuorletctlTest, ADriveThatSleepsIsSaidToSleep) {
+  device.write("/sys/class/nvme/nvme0/device/power/runtime_status", "suspended\n");
+  device.write("/dev/nvme0", "");
+  expectFailure({"storage", "info"}, 1, "the storage drive nvme0 is asleep");
+  device.write("/sys/class/nvme/nvme0/device/power/runtime_status", "active\n");
+  expectFailure({"storage", "info"}, 1, "nvme0");
 }
 
 TEST_F(QuorletctlTest, ARootThatIsNoneIsRefused) {
@@ -277,6 +307,8 @@ TEST_F(QuorletctlTest, PreferencesSurviveAsJson) {
     all[key] = Json::parse(value);
   }
   EXPECT_EQ(Json::parse(outputOf({"prefs", "list", "nuvex.test", "--json"})), all);
+  const std::string file = device.read(std::string(kPreferences) + "nuvex.test.plist");
+  EXPECT_NE(file.find("<date>0999-12-31T23:59:59Z"), std::string::npos) << file;
   outputOf({"prefs", "remove", "nuvex.test", "key 0"});
   expectFailure({"prefs", "get", "nuvex.test", "key 0"}, 1, "nuvex.test has no value for key 0");
 }
