@@ -52,6 +52,8 @@ struct ChannelsArguments {
 };
 using Arguments = std::shared_ptr<ChannelsArguments>;
 
+constexpr char kDriversDirectory[] = "/var/db/drivers";
+
 [[noreturn]] void Fail(std::string_view what, const std::optional<ErrorValue>& error) {
   std::string text(what);
   if (error) {
@@ -139,7 +141,12 @@ void Merge(const Dictionary& from, Dictionary& into) {
 
 void List(Session& session, const ChannelsArguments& arguments) {
   const auto platform = session.open(Access::kReadOnly);
+  // The registry takes a directory that it cannot read for an empty one.
+  static_cast<void>(NamesIn(platform->root().path(kDriversDirectory)));
   const Dictionary channels = Select(platform->services().driverRegistry, arguments.selection);
+  if (channels.empty() && !session.messages.errors().empty()) {
+    throw Failure(session.messages.lastErrorOr(""));
+  }
   std::optional<JsonChannels> json;
   if (arguments.json) json.emplace(session.out);
   for (Dictionary& channel : InOrder(channels)) {

@@ -29,8 +29,6 @@ constexpr auto kDirectories = std::to_array<const char*>({
     "/var/mobile/Library/TallyLedger",
 });
 
-constexpr char kDatabase[] = "/Library/TallyLedger/TLDataStore.sqlitedb";
-
 bool Exists(const std::string& path) {
   struct stat status {};
   return ::lstat(path.c_str(), &status) == 0;
@@ -61,7 +59,7 @@ void MakeFile(Session& session, const std::string& path, const std::string& byte
 void MakeCounters(Session& session, LinuxPlatform& platform) {
   const auto home = platform.services().queries.dataHomePath();
   if (!home) throw Failure(session.messages.lastErrorOr("there is no place for the counters"));
-  const std::string path = platform.root().path(*home + kDatabase);
+  const std::string path = platform.root().path(*home + kCounterStorePath);
   const bool existed = Exists(path);
   if (!existed) {
     const std::int32_t today = platform.services().counterStore.TLDaysSince1970();

@@ -8,6 +8,7 @@
 #include <CLI/CLI.hpp>
 #include <algorithm>
 #include <array>
+#include <cerrno>
 #include <memory>
 #include <tuple>
 #include <vector>
@@ -15,6 +16,7 @@
 #include "ctl/json_value.h"
 #include "ctl/options.h"
 #include "ctl/session.h"
+#include "platform/linux/descriptor.h"
 #include "values/property_list.h"
 #include "values/text.h"
 
@@ -28,7 +30,7 @@ constexpr std::array<std::string_view, 2> kStages = {"pending", "outbox"};
 constexpr std::size_t kMaxLogBytes = 64 << 20;
 constexpr std::size_t kMaxHeaderBytes = 1 << 20;
 constexpr std::string_view kLatest = "latest";
-// Of the logs that one pass writes, this one is the last.
+// The log of a day; a pass writes others beside it.
 constexpr std::string_view kAggregatedType = "193";
 
 struct LogsArguments {
@@ -42,7 +44,6 @@ struct StoredLog {
   std::uint64_t size = 0;
   std::string created;  // RFC 3339
   std::string type;     // empty: the header cannot be read
-  timespec modified{};
 };
 
 std::string StageDirectory(std::string_view stage) {
@@ -64,54 +65,64 @@ std::string StringMember(const Dictionary& header, std::string_view name) {
 }
 
 // The first bytes of an open file, up to the end of its first line or kMaxHeaderBytes.
-std::string ReadFirstLine(int descriptor) {
+std::string ReadFirstLine(int descriptor, const std::string& path) {
   std::string bytes;
   std::array<char, 4096> block;
   while (bytes.size() < kMaxHeaderBytes && bytes.find('\n') == std::string::npos) {
     const ssize_t size = ::read(descriptor, block.data(), block.size());
-    if (size <= 0) break;
+    if (size < 0) throw Failure("cannot read " + path + ": " + ErrnoText(errno));
+    if (size == 0) break;
     bytes.append(block.data(), static_cast<std::size_t>(size));
   }
   return bytes;
 }
 
+[[noreturn]] void FailReading(const std::string& path, int error) {
+  throw Failure("cannot read " + path + ": " + ErrnoText(error));
+}
+
 // Nothing for what is not a regular file, or has gone meanwhile.
 std::optional<StoredLog> Examine(std::string_view stage, const std::string& name) {
   const std::string path = StageDirectory(stage) + "/" + name;
-  const int descriptor = ::open(path.c_str(), O_RDONLY | O_NONBLOCK | O_NOFOLLOW | O_CLOEXEC);
-  if (descriptor < 0) return std::nullopt;
-  struct stat status {};
-  std::optional<StoredLog> log;
-  if (::fstat(descriptor, &status) == 0 && S_ISREG(status.st_mode)) {
-    const Dictionary header = ParseHeader(ReadFirstLine(descriptor)).value_or(Dictionary());
-    log = StoredLog{std::string(stage),
-                    name,
-                    static_cast<std::uint64_t>(status.st_size),
-                    StringMember(header, "created"),
-                    StringMember(header, "type"),
-                    status.st_mtim};
-    // A text of another form would upset the order of creation.
-    if (log->created.size() != Rfc3339({}).size()) {
-      log->created = Rfc3339({static_cast<double>(status.st_mtim.tv_sec)});
-    }
+  const Descriptor file(::open(path.c_str(), O_RDONLY | O_NONBLOCK | O_NOFOLLOW | O_CLOEXEC));
+  if (!file.isOpen()) {
+    const bool isNoLog = errno == ENOENT || errno == ELOOP || errno == ENXIO;
+    if (!isNoLog) FailReading(path, errno);
+    return std::nullopt;
   }
-  ::close(descriptor);
+  struct stat status {};
+  if (::fstat(file.get(), &status) != 0) FailReading(path, errno);
+  if (!S_ISREG(status.st_mode)) return std::nullopt;
+  const Dictionary header = ParseHeader(ReadFirstLine(file.get(), path)).value_or(Dictionary());
+  StoredLog log{std::string(stage), name, static_cast<std::uint64_t>(status.st_size),
+                StringMember(header, "created"), StringMember(header, "type")};
+  // A text of another form would upset the order of creation.
+  if (log.created.size() != Rfc3339({}).size()) {
+    log.created = Rfc3339({static_cast<double>(status.st_mtim.tv_sec)});
+  }
   return log;
+}
+
+// The number at the end of "<log name>-<time>-<number>.log", or 0.
+std::uint64_t NumberOf(std::string_view name) {
+  constexpr std::string_view kSuffix = ".log";
+  if (!name.ends_with(kSuffix)) return 0;
+  name.remove_suffix(kSuffix.size());
+  return ParseNumber<std::uint64_t>(name.substr(name.rfind('-') + 1)).value_or(0);
 }
 
 // Every log, the newest last.
 std::vector<StoredLog> FindLogs() {
   std::vector<StoredLog> logs;
   for (const std::string_view stage : kStages) {
-    for (const std::string& name : ListDirectory(StageDirectory(stage))) {
+    for (const std::string& name : NamesIn(StageDirectory(stage))) {
       // Temporary files are hidden.
       if (name.starts_with('.')) continue;
       if (auto log = Examine(stage, name)) logs.push_back(std::move(*log));
     }
   }
   std::ranges::sort(logs, {}, [](const StoredLog& log) {
-    return std::tuple(log.created, log.type == kAggregatedType, log.modified.tv_sec,
-                      log.modified.tv_nsec, log.name);
+    return std::tuple(log.created, NumberOf(log.name), log.name);
   });
   return logs;
 }
@@ -143,9 +154,7 @@ void List(Session& session, const LogsArguments& arguments) {
 
 std::string ReadLog(const std::string& path) {
   auto bytes = ReadWholeFile(path, kMaxLogBytes);
-  if (const int* error = std::get_if<int>(&bytes)) {
-    throw Failure("cannot read " + path + ": " + ErrnoText(*error));
-  }
+  if (const int* error = std::get_if<int>(&bytes)) FailReading(path, *error);
   return std::get<std::string>(std::move(bytes));
 }
 
@@ -155,6 +164,7 @@ std::string ReadNamedLog(const std::string& name) {
   for (const std::string_view stage : kStages) {
     const std::string path = StageDirectory(stage) + "/" + name;
     if (::access(path.c_str(), F_OK) == 0) return ReadLog(path);
+    if (errno != ENOENT) FailReading(path, errno);
   }
   throw Failure("neither pending nor outbox has a log " + name);
 }
@@ -164,7 +174,9 @@ std::string ReadRequestedLog(const std::string& file) {
   if (file != kLatest) return ReadNamedLog(file);
   const std::vector<StoredLog> logs = FindLogs();
   if (logs.empty()) throw Failure("there is no log yet");
-  return ReadNamedLog(logs.back().name);
+  const auto last =
+      std::ranges::find(logs.rbegin(), logs.rend(), kAggregatedType, &StoredLog::type);
+  return ReadNamedLog(last != logs.rend() ? last->name : logs.back().name);
 }
 
 void Show(Session& session, const LogsArguments& arguments) {

@@ -2,7 +2,10 @@
 //
 // Exit status: 0, 1 when the command failed, 2 when the command line makes no sense. Both of the
 // latter come with exactly one line on standard error.
+#include <sys/stat.h>
+
 #include <CLI/CLI.hpp>
+#include <cerrno>
 #include <csignal>
 #include <cstdlib>
 
@@ -62,6 +65,20 @@ int Parse(CLI::App& app, Session& session, int argc, char** argv) {
   return 0;
 }
 
+// A root that is mistyped must not look like one that is empty. Only `init` makes a new one.
+void CheckRoot(bool mayBeNew) {
+  const char* variable = ::secure_getenv("QUORLET_ROOT");
+  if (variable == nullptr || *variable == '\0') return;
+  const std::string root = variable;
+  if (!root.starts_with('/')) throw Failure("QUORLET_ROOT is not an absolute path: " + root);
+  struct stat status {};
+  if (::stat(root.c_str(), &status) != 0) {
+    if (errno == ENOENT && mayBeNew) return;
+    throw Failure("QUORLET_ROOT cannot be used: " + root + ": " + ErrnoText(errno));
+  }
+  if (!S_ISDIR(status.st_mode)) throw Failure("QUORLET_ROOT is not a directory: " + root);
+}
+
 int Run(int argc, char** argv) {
   Session session;
   CLI::App app("Puts counters, preferences and whitelists before quorlet and shows its logs.",
@@ -69,7 +86,12 @@ int Run(int argc, char** argv) {
   AddCommands(app, session);
   if (const int status = Parse(app, session, argc, argv)) return status;
   try {
-    if (session.command) session.command();
+    if (session.command) {
+      CheckRoot(app.got_subcommand("init"));
+      session.command();
+    }
+  } catch (const AnswerIsNo&) {
+    if (session.out.finish()) return kFailed;
   } catch (const std::exception& failure) {
     // What has been written already belongs to the result as far as it goes.
     [[maybe_unused]] const bool written = session.out.finish();

@@ -2,7 +2,12 @@
 
 #include <unistd.h>
 
+#include <algorithm>
+#include <filesystem>
+#include <system_error>
+
 #include "ctl/output.h"
+#include "platform/linux/files.h"
 #include "platform/linux/services.h"
 
 namespace quorlet {
@@ -31,6 +36,20 @@ class CollectingLog final : public SystemLog {
 };
 
 }  // namespace
+
+std::vector<std::string> NamesIn(const std::string& directory) {
+  std::error_code error;
+  std::vector<std::string> names;
+  std::filesystem::directory_iterator at(directory, error);
+  for (; !error && at != std::filesystem::directory_iterator(); at.increment(error)) {
+    names.push_back(at->path().filename().string());
+  }
+  if (error && error != std::errc::no_such_file_or_directory) {
+    throw Failure("cannot read " + directory + ": " + ErrnoText(error.value()));
+  }
+  std::ranges::sort(names);
+  return names;
+}
 
 void PrintErrorLine(std::string_view text) {
   const std::string line = "quorletctl: " + Escape(text) + "\n";

@@ -3,6 +3,7 @@
 #define QUORLET_CTL_MESSAGES_H_
 
 #include <cstddef>
+#include <exception>
 #include <memory>
 #include <stdexcept>
 #include <string>
@@ -19,6 +20,13 @@ class Failure : public std::runtime_error {
  public:
   using std::runtime_error::runtime_error;
 };
+
+// Ends a command whose answer is no: exit status 1, and nothing on standard error.
+class AnswerIsNo : public std::exception {};
+
+// The names in a directory, in byte order; none when there is no such directory. Throws Failure
+// when it cannot be read.
+std::vector<std::string> NamesIn(const std::string& directory);
 
 // "quorletctl: text" on standard error, as one line whatever `text` holds.
 void PrintErrorLine(std::string_view text);

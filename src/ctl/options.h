@@ -35,12 +35,17 @@ requires std::integral<T> || std::same_as<T, double> std::optional<T> ParseNumbe
   return value;
 }
 
-// A day number, kFirstDay to kLastDay.
-std::optional<std::int32_t> ParseDay(std::string_view text);
+// The number of the day that it is, in UTC.
+std::int32_t Today();
+// A day number, kFirstDay to today.
+std::optional<std::int32_t> ParseDayNumber(std::string_view text);
+// A DAY of the command line: a day number, "YYYY-MM-DD", "today" or "yesterday"; not before 1970
+// and not in the future. Throws CLI::ValidationError, which names `option`.
+std::int32_t ParseDay(const std::string& option, const std::string& text);
 // A second of the day, 0 to kLastSecond.
 std::optional<std::int32_t> ParseSecond(std::string_view text);
 
-// Adds "--day N"; `meaning` says what it does and what holds without it.
+// Adds "--day DAY"; `meaning` says what it does and what holds without it.
 void AddDayOption(CLI::App& command, std::optional<std::int32_t>& day, const std::string& meaning);
 
 void AddJsonFlag(CLI::App& command, bool& json);

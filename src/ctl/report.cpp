@@ -12,6 +12,8 @@
 namespace quorlet {
 namespace {
 
+constexpr std::int32_t kDaysKept = 30;
+
 struct PreviewArguments {
   std::optional<std::int32_t> day;
   bool json = false;
@@ -84,6 +86,11 @@ void Preview(Session& session, const PreviewArguments& arguments) {
   } else {
     session.out.write(*diagnostics.body());
   }
+  if (day < services.counterStore.TLDaysSince1970() - kDaysKept) {
+    session.messages.add(LogLevel::kDefault, "note: day " + std::to_string(day) +
+                                                 " is more than 30 days old, a pass would drop it "
+                                                 "before it writes a log");
+  }
   if (!services.diagnostics.DiagnosticLogSubmissionEnabled()) {
     session.messages.add(LogLevel::kDefault,
                          "note: submission is disabled, a pass would not write this log");
@@ -98,7 +105,7 @@ void AddReportCommands(CLI::App& app, Session& session) {
   CLI::App* preview =
       AddCommand(*report, "preview", "Print the log that a pass for a day would write",
                  "Nothing changes.", "quorletctl report preview --day 20516");
-  AddDayOption(*preview, arguments->day, "Day number (without it: yesterday)");
+  AddDayOption(*preview, arguments->day, "The day (without it: yesterday)");
   AddJsonFlag(*preview, arguments->json);
   preview->callback([&session, arguments] {
     session.command = [&session, arguments] { Preview(session, *arguments); };

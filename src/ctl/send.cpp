@@ -23,6 +23,7 @@ constexpr char kServiceName[] = "nuvex.aggregated.quorlet";
 constexpr std::size_t kUuidBytes = 16;
 constexpr double kLongestWait = 86400;
 constexpr char kWaitHelp[] = "Seconds to wait for the service to appear (default: 0)";
+constexpr char kDayHelp[] = "Day number, YYYY-MM-DD, \"today\" or \"yesterday\"";
 
 struct SendArguments {
   std::int32_t day = 0;
@@ -168,13 +169,11 @@ void AddSendCommands(CLI::App& app, Session& session) {
   add("logging-status", "Announce that app info is coming", "", "quorletctl send logging-status",
       SendLoggingStatus);
   const auto parseDay = [arguments](const std::string& text) {
-    const auto day = ParseDay(text);
-    if (!day) throw CLI::ValidationError("N", "not a day number: " + text);
-    arguments->day = *day;
+    arguments->day = ParseDay("DAY", text);
   };
   add("run-day", "Run the daily pass for a day, whatever the gate says", "",
       "quorletctl send run-day 20000", SendRunDay)
-      ->add_option_function<std::string>("N", parseDay, "Day number: days since 1970-01-01")
+      ->add_option_function<std::string>("DAY", parseDay, kDayHelp)
       ->required();
   add("app-info", "Send the activated applications",
       "FILE is a JSON array of objects with \"uuid\", \"bundle_id\", \"version\" (strings) and\n"

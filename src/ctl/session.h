@@ -15,6 +15,9 @@ class App;
 
 namespace quorlet {
 
+// Below the data home.
+inline constexpr char kCounterStorePath[] = "/Library/TallyLedger/TLDataStore.sqlitedb";
+
 struct Session {
   Output out;
   Messages messages;

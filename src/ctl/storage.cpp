@@ -1,6 +1,9 @@
 // quorletctl storage: what the flash-storage controller tells.
+#include <unistd.h>
+
 #include <CLI/CLI.hpp>
 #include <algorithm>
+#include <cerrno>
 #include <memory>
 #include <variant>
 
@@ -49,6 +52,41 @@ struct StorageServices {
   Platform platform;
 };
 
+std::string FirstLineOf(const std::string& path) {
+  const auto bytes = ReadWholeFile(path, 4096);
+  const auto* text = std::get_if<std::string>(&bytes);
+  return text != nullptr ? text->substr(0, text->find('\n')) : std::string();
+}
+
+// Why a command got no answer, in words for people: what is below speaks to its own developers.
+std::string WhyNoAnswer(StorageServices& services) {
+  DriverRegistry& registry = services.platform.driverRegistry;
+  const StorageExporter* row = nullptr;
+  const RegistryHandle service = findNandExporter(registry, row);
+  if (service == 0) return "there is no storage drive that can be asked";
+  std::string name;
+  if (registry.GetEntryName(service, name) != kKernelSuccess) name.clear();
+  registry.ReleaseHandle(service);
+  const std::string drive = "the storage drive " + name;
+  // A drive of the machine's own has a controller of that name; others are described in files.
+  const Root& root = services.linux->root();
+  const std::string controller = root.kernelPath("/sys/class/nvme/" + name);
+  if (!IsSafeName(name) || ::access(controller.c_str(), F_OK) != 0) {
+    return drive + " does not answer";
+  }
+  const std::string power = FirstLineOf(controller + "/device/power/runtime_status");
+  if (power == "suspended" || power == "suspending") return drive + " is asleep";
+  const std::string device = root.path("/dev/" + name);
+  if (::access(device.c_str(), R_OK) != 0) {
+    const int error = errno;
+    return "cannot ask " + drive + ": " + device + ": " + ErrnoText(error) +
+           (error == EACCES ? " (this needs root)" : "");
+  }
+  // The kernel takes such commands from its administrator only, whatever the file's mode.
+  if (::geteuid() != 0) return "cannot ask " + drive + ": this needs root";
+  return drive + " does not answer";
+}
+
 void PrintDictionary(Session& session, const Dictionary& dictionary, bool json) {
   if (json) {
     session.out.line(JsonText(dictionary, JsonForm::kPlain));
@@ -63,8 +101,7 @@ void PrintInfo(Session& session, const StorageArguments& arguments) {
   StorageServices services(session);
   const Dictionary info = CopyNANDInfo(services.platform);
   if (info.contains(kNANDInfoErrorKey)) {
-    const std::string* message = StringEntry(info, kNANDInfoErrorMessageKey);
-    throw Failure(services.errors.firstLineOr(message != nullptr ? *message : "no information"));
+    throw Failure(WhyNoAnswer(services));
   }
   PrintDictionary(session, info, arguments.json);
 }
@@ -72,8 +109,8 @@ void PrintInfo(Session& session, const StorageArguments& arguments) {
 void PrintVMFreezer(Session& session, const StorageArguments& arguments) {
   StorageServices services(session);
   const Dictionary info = CopyVMFreezerNANDInfo(services.platform);
-  if (const std::string* message = StringEntry(info, kNANDInfoVMFreezerErrorMessageKey)) {
-    throw Failure(*message);
+  if (info.contains(kNANDInfoVMFreezerErrorKey)) {
+    throw Failure(session.messages.lastErrorOr("this system has no memory freezer that tells"));
   }
   PrintDictionary(session, info, arguments.json);
 }
@@ -86,7 +123,7 @@ void PrintAdvice(Session& session, const StorageArguments& arguments) {
   if (problem == kConnectionNotClosed) {
     session.messages.add(LogLevel::kError, problem);
   } else if (!problem.empty()) {
-    throw Failure(problem);
+    throw Failure(WhyNoAnswer(services));
   }
   if (arguments.json) {
     session.out.line(JsonText(Dictionary{{"recommendsContentDeletion", advice}}, JsonForm::kPlain));
@@ -107,11 +144,16 @@ Data ReadExportFile(const std::string& path) {
 // One export of the controller, or nothing when it has none. `name` is for errors.
 std::optional<Data> FetchExport(ExporterConnection& exporter, const SelectorPair* selectors,
                                 std::string_view name) {
+  if (selectors == nullptr || selectors->sizeQuery == kNoSelector) return std::nullopt;
   std::uint32_t size = 0;
-  if (selectors == nullptr || selectors->sizeQuery == kNoSelector ||
-      exporter.querySize(selectors, ExportFlags(false, 0), size) != kKernelSuccess || size == 0) {
-    return std::nullopt;
+  const KernelReturn answer = exporter.querySize(selectors, ExportFlags(false, 0), size);
+  if (answer == kKernelNotFound || answer == kKernelUnsupported) return std::nullopt;
+  // Any other trouble does not mean that there is none.
+  if (answer != kKernelSuccess) {
+    throw Failure("the driver does not tell the size of its " + std::string(name) + ": status " +
+                  Hexadecimal(answer));
   }
+  if (size == 0) return std::nullopt;
   const auto buffer = ExportBuffer::Allocate(size);
   if (!buffer) {
     throw Failure("the driver's " + std::string(name) + " is too large: " + Counted(size, "byte"));
@@ -136,9 +178,9 @@ Snapshot FetchSnapshot(Session& session) {
   StorageServices services(session);
   const StorageExporter* row = nullptr;
   const RegistryHandle service = findNandExporter(services.platform.driverRegistry, row);
-  if (service == 0) throw Failure("there is no storage driver");
+  if (service == 0) throw Failure(WhyNoAnswer(services));
   ExporterConnection exporter(services.platform, service, *row);
-  if (!exporter) throw Failure(services.errors.firstLineOr("the driver refuses a connection"));
+  if (!exporter) throw Failure(WhyNoAnswer(services));
   auto records = FetchExport(exporter, row->getSnapshotSelectors(), "snapshot");
   if (!records) throw Failure("the driver has no snapshot");
   return {*std::move(records),

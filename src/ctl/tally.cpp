@@ -1,6 +1,12 @@
 // quorletctl tally: counters in and out of the counter store.
+#include <fcntl.h>
+#include <sys/stat.h>
+
 #include <CLI/CLI.hpp>
+#include <array>
+#include <cerrno>
 #include <cmath>
+#include <cstdio>
 #include <memory>
 #include <vector>
 
@@ -9,6 +15,7 @@
 #include "ctl/session.h"
 #include "ctl/tally_import.h"
 #include "ctl/tally_lines.h"
+#include "platform/linux/descriptor.h"
 
 namespace quorlet {
 namespace {
@@ -62,10 +69,60 @@ void Import(Session& session, const TallyArguments& arguments) {
                    Counted(counts.values, "value"));
 }
 
+// Bytes on their way to standard output, which may be a pipe that nobody empties: while the store
+// is being read they are only kept, in memory or, when there are many, in an unnamed file.
+class KeptOutput {
+ public:
+  void write(std::string_view bytes) {
+    if (error_ != 0) return;
+    memory_ += bytes;
+    if (memory_.size() >= kMostInMemory) spill();
+  }
+
+  bool ok() const { return error_ == 0; }
+
+  // Hands everything on, in order.
+  void writeTo(Output& out) {
+    if (file_ && error_ == 0) copyFile(out);
+    if (error_ != 0) throw Failure("cannot use a temporary file: " + ErrnoText(error_));
+    out.write(memory_);
+  }
+
+ private:
+  static constexpr std::size_t kMostInMemory = 8 << 20;
+  struct Close {
+    void operator()(std::FILE* file) const { std::fclose(file); }
+  };
+
+  void spill() {
+    if (!file_) file_.reset(std::tmpfile());
+    if (!file_ || std::fwrite(memory_.data(), 1, memory_.size(), file_.get()) != memory_.size()) {
+      error_ = errno;
+    }
+    memory_.clear();
+  }
+
+  void copyFile(Output& out) {
+    if (std::fflush(file_.get()) != 0) error_ = errno;
+    std::rewind(file_.get());
+    std::array<char, 1 << 16> block;
+    while (error_ == 0 && out.ok()) {
+      const std::size_t size = std::fread(block.data(), 1, block.size(), file_.get());
+      if (size == 0) break;
+      out.write({block.data(), size});
+    }
+    if (error_ == 0 && std::ferror(file_.get())) error_ = errno;
+  }
+
+  std::string memory_;
+  std::unique_ptr<std::FILE, Close> file_;
+  int error_ = 0;
+};
+
 // Writes the rows of the store as lines or as one JSON object, row by row.
 class Dump {
  public:
-  Dump(Output& out, bool json) : out_(out), json_(json) {}
+  Dump(KeptOutput& out, bool json) : out_(out), json_(json) {}
 
   void run(TLHistory* history, std::optional<std::int32_t> day) {
     const std::int32_t above = day ? *day - 1 : kFirstDay - 1;
@@ -90,7 +147,7 @@ class Dump {
             stop = !out_.ok();
           });
     }
-    if (json_) out_.line("]}");
+    if (json_) out_.write("]}\n");
   }
 
  private:
@@ -144,18 +201,40 @@ class Dump {
     buffer_ += ']';
   }
 
-  Output& out_;
+  KeptOutput& out_;
   bool json_;
   bool isFirst_ = true;
   std::string buffer_;
 };
 
+// Whether there is a store. One that is there but cannot be opened is a failure, not emptiness.
+bool StoreExists(LinuxPlatform& platform, const Messages& messages) {
+  const auto home = platform.services().queries.dataHomePath();
+  if (!home) throw Failure(messages.lastErrorOr("there is no place for the counters"));
+  const std::string path = platform.root().path(*home + kCounterStorePath);
+  const Descriptor store(::open(path.c_str(), O_RDONLY | O_NONBLOCK | O_CLOEXEC));
+  if (!store.isOpen() && errno == ENOENT) return false;
+  struct stat status {};
+  if (!store.isOpen() || ::fstat(store.get(), &status) != 0) {
+    throw Failure("cannot read " + path + ": " + ErrnoText(errno));
+  }
+  if (!S_ISREG(status.st_mode)) throw Failure("cannot read " + path + ": it is not a file");
+  return true;
+}
+
 void DumpTallies(Session& session, const TallyArguments& arguments) {
-  const auto platform = session.open(Access::kReadOnly);
-  const auto history = platform->ledger().openHistory();
-  // A store that is not there yet holds nothing; one that cannot be read has said so.
-  Dump(session.out, arguments.json).run(history.get(), arguments.day);
-  if (!session.messages.errors().empty()) throw Failure(session.messages.lastErrorOr(""));
+  KeptOutput kept;
+  {
+    const auto platform = session.open(Access::kReadOnly);
+    const bool exists = StoreExists(*platform, session.messages);
+    const auto history = exists ? platform->ledger().openHistory() : nullptr;
+    if (exists && history == nullptr) {
+      throw Failure(session.messages.lastErrorOr("the counter store cannot be read"));
+    }
+    Dump(kept, arguments.json).run(history.get(), arguments.day);
+    if (!session.messages.errors().empty()) throw Failure(session.messages.lastErrorOr(""));
+  }  // The store is free for others while standard output takes its time.
+  kept.writeTo(session.out);
 }
 
 void AddKey(CLI::App& command, TallyArguments& arguments) {
@@ -175,7 +254,7 @@ void AddScalarCommand(CLI::App& tally, Session& session, bool add) {
     arguments->scalar = *value;
   };
   command->add_option_function<std::string>("VALUE", parse, "A whole number")->required();
-  AddDayOption(*command, arguments->day, "Day number (without it: today)");
+  AddDayOption(*command, arguments->day, "The day (without it: today)");
   command->callback([&session, arguments, add] {
     session.command = [&session, arguments, add] { ChangeScalar(session, *arguments, add); };
   });
@@ -199,7 +278,7 @@ void AddRecordCommand(CLI::App& tally, Session& session) {
       ->add_option_function<std::vector<std::string>>("VALUE", parse,
                                                       "Numbers, also inf and nan, in order")
       ->required();
-  AddDayOption(*command, arguments->day, "Day number (without it: today)");
+  AddDayOption(*command, arguments->day, "The day (without it: today)");
   const auto parseSecond = [arguments](const std::string& text) {
     arguments->second = ParseSecond(text);
     if (!arguments->second) {
@@ -237,7 +316,7 @@ void AddDumpCommand(CLI::App& tally, Session& session) {
       AddCommand(tally, "dump", "Print counters as lines that \"tally import\" reads",
                  "Scalars come first; both are ordered by key, then day.",
                  "quorletctl tally dump --day 20516");
-  AddDayOption(*command, arguments->day, "Day number (without it: every day)");
+  AddDayOption(*command, arguments->day, "The day (without it: every day)");
   AddJsonFlag(*command, arguments->json);
   command->callback([&session, arguments] {
     session.command = [&session, arguments] { DumpTallies(session, *arguments); };

@@ -22,8 +22,8 @@ namespace {
 
 // Longer than any line that a key from a command line can make.
 constexpr std::size_t kMaxLineBytes = 1 << 20;
-// Values collected before they are handed to the store.
-constexpr std::size_t kMaxPendingBytes = 4 << 20;
+// The most that an import may take up in memory: some 30 million values.
+constexpr std::size_t kMaxImportBytes = std::size_t{512} << 20;
 
 struct CloseFile {
   void operator()(std::FILE* file) const { std::fclose(file); }
@@ -32,25 +32,6 @@ using File = std::unique_ptr<std::FILE, CloseFile>;
 
 [[noreturn]] void FailReading(const std::string& file, int error) {
   throw Failure("cannot read " + file + ": " + ErrnoText(error));
-}
-
-// A pipe may take its time, and while a transaction is open nobody else can write: such input is
-// copied to an unnamed temporary file first.
-File Spool(std::FILE* from, const std::string& name) {
-  File copy(std::tmpfile());
-  if (!copy) throw Failure("cannot make a temporary file: " + ErrnoText(errno));
-  std::array<char, 1 << 16> block;
-  while (const std::size_t size = std::fread(block.data(), 1, block.size(), from)) {
-    if (std::fwrite(block.data(), 1, size, copy.get()) != size) {
-      throw Failure("cannot write a temporary file: " + ErrnoText(errno));
-    }
-  }
-  if (std::ferror(from)) FailReading(name, errno);
-  if (std::fflush(copy.get()) != 0) {
-    throw Failure("cannot write a temporary file: " + ErrnoText(errno));
-  }
-  std::rewind(copy.get());
-  return copy;
 }
 
 File OpenInput(const std::string& name) {
@@ -67,7 +48,7 @@ File OpenInput(const std::string& name) {
   struct stat status {};
   if (::fstat(descriptor, &status) != 0) FailReading(shown, errno);
   if (S_ISDIR(status.st_mode)) FailReading(shown, EISDIR);
-  return S_ISREG(status.st_mode) ? std::move(file) : Spool(file.get(), shown);
+  return file;
 }
 
 class LineReader {
@@ -117,71 +98,81 @@ class LineReader {
   std::uint64_t number_ = 0;
 };
 
-// Collects the values of each key and day and hands them to the store in large runs, in order.
-class PendingValues {
+// What the lines say, by day and key. Nothing is locked before all of it is here: a pipe may take
+// its time, and a wrong line may be the last one.
+class ImportedRows {
  public:
-  explicit PendingValues(TallyLedger& ledger) : ledger_(ledger) {}
+  ImportCounts counts;
 
-  [[nodiscard]] bool add(SampleLine line) {
-    const auto [row, isNew] = rows_.try_emplace({line.day, std::move(line.key)});
-    if (isNew) bytes_ += sizeof(*row) + row->first.second.size();
-    row->second.push_back(line.sample);
-    bytes_ += sizeof(line.sample);
-    return bytes_ < kMaxPendingBytes || flush();
+  void add(ScalarLine line) {
+    const auto [row, isNew] =
+        scalars_.insert_or_assign({line.day, std::move(line.key)}, line.value);
+    if (isNew) countRow(sizeof(*row) + row->first.second.size());
+    ++counts.scalars;
   }
 
-  [[nodiscard]] bool flush() {
-    for (const auto& [dayAndKey, samples] : rows_) {
-      if (!ledger_.recordValues(dayAndKey.second, dayAndKey.first, samples)) return false;
+  void add(SampleLine line) {
+    const auto [row, isNew] = values_.try_emplace({line.day, std::move(line.key)});
+    if (isNew) countRow(sizeof(*row) + row->first.second.size());
+    row->second.push_back(line.sample);
+    bytes_ += sizeof(line.sample);
+    ++counts.values;
+  }
+
+  bool areTooMany() const { return bytes_ > kMaxImportBytes; }
+
+  // False when the store refused a write, which it then has said itself.
+  [[nodiscard]] bool writeTo(TallyLedger& ledger) const {
+    for (const auto& [dayAndKey, value] : scalars_) {
+      if (!ledger.setScalar(dayAndKey.second, dayAndKey.first, value)) return false;
     }
-    rows_.clear();
-    bytes_ = 0;
+    for (const auto& [dayAndKey, samples] : values_) {
+      if (!ledger.recordValues(dayAndKey.second, dayAndKey.first, samples)) return false;
+    }
     return true;
   }
 
  private:
-  TallyLedger& ledger_;
-  std::map<std::pair<std::int32_t, std::string>, std::vector<DistributionSample>> rows_;
+  using DayAndKey = std::pair<std::int32_t, std::string>;
+
+  void countRow(std::size_t bytes) {
+    constexpr std::size_t kNodeBytes = 64;  // what the map and the allocator add
+    bytes_ += bytes + kNodeBytes;
+  }
+
+  std::map<DayAndKey, std::int64_t> scalars_;
+  std::map<DayAndKey, std::vector<DistributionSample>> values_;
   std::size_t bytes_ = 0;
 };
 
-// False when the store refused a write, which it then has said itself.
-bool ImportLines(LineReader& lines, TallyLedger& ledger, ImportCounts& counts) {
-  PendingValues pending(ledger);
+void ReadRows(LineReader& lines, ImportedRows& rows) {
   while (const auto line = lines.next()) {
     auto parsed = ParseTallyLine(*line);
     if (const auto* why = std::get_if<std::string>(&parsed)) {
       throw Failure(lines.wrong(line->empty() ? "is empty" : "is wrong: " + why->substr(0, 200)));
     }
-    if (const auto* scalar = std::get_if<ScalarLine>(&parsed)) {
-      if (!ledger.setScalar(scalar->key, scalar->day, scalar->value)) return false;
-      ++counts.scalars;
+    if (auto* scalar = std::get_if<ScalarLine>(&parsed)) {
+      rows.add(std::move(*scalar));
     } else {
-      if (!pending.add(std::get<SampleLine>(std::move(parsed)))) return false;
-      ++counts.values;
+      rows.add(std::get<SampleLine>(std::move(parsed)));
     }
+    if (rows.areTooMany()) throw Failure(lines.wrong("is too much for one import: split it"));
   }
-  return pending.flush();
 }
 
 }  // namespace
 
 ImportCounts ImportTallies(const std::string& file, TallyLedger& ledger, const Messages& messages) {
-  const File input = OpenInput(file);
-  LineReader lines(input.get(), file == "-" ? "standard input" : file);
-  ImportCounts counts;
-  std::optional<Failure> failure;
-  const bool kept = ledger.inTransaction([&] {
-    try {
-      return ImportLines(lines, ledger, counts);
-    } catch (const Failure& wrongLine) {  // must not pass through the store
-      failure = wrongLine;
-      return false;
-    }
-  });
-  if (failure) throw *failure;
-  if (!kept) throw Failure(messages.lastErrorOr("the counters could not be stored"));
-  return counts;
+  ImportedRows rows;
+  {
+    const File input = OpenInput(file);
+    LineReader lines(input.get(), file == "-" ? "standard input" : file);
+    ReadRows(lines, rows);
+  }
+  if (!ledger.inTransaction([&] { return rows.writeTo(ledger); })) {
+    throw Failure(messages.lastErrorOr("the counters could not be stored"));
+  }
+  return rows.counts;
 }
 
 }  // namespace quorlet

@@ -16,7 +16,8 @@ struct ImportCounts {
 };
 
 // Imports every line of the file (standard input: "-") or, after a Failure that names the line,
-// none. Memory stays bounded whatever the length of the file.
+// none. All lines are read before the store is locked; more than fits into bounded memory is
+// refused.
 ImportCounts ImportTallies(const std::string& file, TallyLedger& ledger, const Messages& messages);
 
 }  // namespace quorlet

@@ -57,8 +57,8 @@ std::variant<ScalarLine, SampleLine, std::string> ParseTallyLine(std::string_vie
                                 : "needs the five fields value, DAY, KEY, SECOND, NUMBER");
   }
   const std::string_view dayField = TakeField(rest);
-  const auto day = ParseDay(dayField);
-  if (!day) return Wrong("not a day number", dayField);
+  const auto day = ParseDayNumber(dayField);
+  if (!day) return Wrong("not a day number up to today's", dayField);
   auto key = Unescape(TakeField(rest));
   if (!key) return std::string("the key has a backslash that is not \\t, \\n, \\r, \\\\ or \\xNN");
   if (isScalar) {

@@ -1,6 +1,6 @@
 // The line format in which counters are imported and dumped. Fields are separated by one tab:
 //
-//   scalar DAY KEY VALUE           VALUE: signed 64-bit integer
+//   scalar DAY KEY VALUE           DAY: a number, not in the future; VALUE: signed 64-bit integer
 //   value  DAY KEY SECOND NUMBER   SECOND: 0 to 86399; NUMBER: also "inf", "-inf", "nan"
 //
 // A key is written with backslash escapes (ctl/output.h), so it may hold any bytes. A number is

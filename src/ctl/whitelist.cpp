@@ -142,7 +142,7 @@ void Check(Session& session, const CheckArguments& arguments) {
     const Dictionary all{{"groups", groups}, {"faults", UInt64(faults)}};
     session.out.line(JsonText(all, JsonForm::kPlain));
   }
-  if (faults != 0) throw Failure(Counted(faults, "entry") + " will not work");
+  if (faults != 0) throw AnswerIsNo();
 }
 
 }  // namespace

@@ -22,6 +22,19 @@ std::optional<Dictionary> TableNamed(std::string_view name, const KeyTables& tab
   return std::nullopt;
 }
 
+// A misspelt option is no reason to leave the key out, but its value may be reported more exactly
+// than was meant: one line for each entry says so.
+void ReportUnknownOptions(const Dictionary& table, SystemLog& log) {
+  for (const auto& [key, options] : table) {
+    for (const auto& [name, value] : *options.asDictionary()) {
+      if (const auto fault = UnknownOptionFault(name)) {
+        log.error("Whitelist entry %@: %@", key, *fault);
+        break;
+      }
+    }
+  }
+}
+
 std::vector<std::size_t> LengthsLongestFirst(const Dictionary& prefixes) {
   std::set<std::size_t, std::greater<>> lengths;
   for (const auto& [prefix, options] : prefixes) lengths.insert(prefix.size());
@@ -106,6 +119,10 @@ std::optional<TLConfig> TLConfig::init(Platform& platform) {
     }
     platform.log.error("Skipping whitelist entry %@ of keyGroup %@: it %@", fault.key, fault.group,
                        fault.reason);
+  }
+  for (const Dictionary* table : {&config._scalarKeys, &config._scalarPrefixes,
+                                  &config._distributionKeys, &config._distributionPrefixes}) {
+    ReportUnknownOptions(*table, platform.log);
   }
   config._scalarPrefixLengths = LengthsLongestFirst(config._scalarPrefixes);
   config._distributionPrefixLengths = LengthsLongestFirst(config._distributionPrefixes);

@@ -2,6 +2,7 @@
 #ifndef QUORLET_REPORT_KEY_OPTIONS_H_
 #define QUORLET_REPORT_KEY_OPTIONS_H_
 
+#include <array>
 #include <cstdint>
 #include <optional>
 #include <string>
@@ -12,8 +13,7 @@
 
 namespace quorlet {
 
-// Entries understood: "sig_fig" and "bucket_interval" (non-negative integers, scalars), "intervals"
-// (array of numbers, distributions). An empty dictionary reports the value as read.
+// An empty dictionary reports the value as read.
 using KeyOptions = Dictionary;
 
 inline constexpr std::string_view kSigFig = "sig_fig";
@@ -21,6 +21,27 @@ inline constexpr std::string_view kBucketInterval = "bucket_interval";
 inline constexpr std::string_view kIntervals = "intervals";
 
 enum class KeyKind { kScalar, kDistribution };
+enum class OptionType {
+  kRounding,   // a non-negative number
+  kIntervals,  // an array of numbers
+  kText,
+  kDate,  // or its text
+};
+
+struct OptionRule {
+  std::string_view name;
+  std::optional<KeyKind> kind;  // none: an option of any key
+  OptionType type;
+};
+
+// Every option that there is. The last two are for the people who keep the whitelist.
+inline constexpr std::array<OptionRule, 5> kOptionRules{{
+    {kSigFig, KeyKind::kScalar, OptionType::kRounding},
+    {kBucketInterval, KeyKind::kScalar, OptionType::kRounding},
+    {kIntervals, KeyKind::kDistribution, OptionType::kIntervals},
+    {"why", std::nullopt, OptionType::kText},
+    {"expires", std::nullopt, OptionType::kDate},
+}};
 
 // A rounding option (fractions truncated, larger than 64 bits saturated), or nothing when it is
 // absent or will not work.
@@ -29,7 +50,12 @@ std::optional<std::uint64_t> RoundingOption(const KeyOptions& options, std::stri
 // The "intervals" entry when every element is a number other than NaN, otherwise nothing.
 std::optional<Array> IntervalsOption(const KeyOptions& options);
 
-// One reason for each entry that will not work for a key of this kind: "\"sig_fig\" is negative".
+// What is wrong with an option's name: "\"sig_figs\" is not an option, did you mean \"sig_fig\"?".
+// Nothing when there is such an option.
+std::optional<std::string> UnknownOptionFault(std::string_view name);
+
+// One reason for each option that will not work, or not as meant, for a key of this kind:
+// "\"sig_fig\" is negative".
 std::vector<std::string> KeyOptionFaults(const KeyOptions& options, KeyKind kind);
 
 }  // namespace quorlet

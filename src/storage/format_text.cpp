@@ -1,5 +1,6 @@
 #include "storage/format_text.h"
 
+#include <algorithm>
 #include <charconv>
 
 namespace quorlet {
@@ -25,6 +26,15 @@ std::size_t TakeDigits(std::string_view& text) {
   return value;
 }
 
+// Every number is one of 32 bits here, whatever length the text says.
+void SkipLengthModifier(std::string_view& text) {
+  for (const std::string_view modifier : {"hh", "h", "ll", "l", "z", "j", "t", "L"}) {
+    if (!text.starts_with(modifier)) continue;
+    text.remove_prefix(modifier.size());
+    return;
+  }
+}
+
 // The conversion that `format` starts with, if it is one of `kinds`.
 std::optional<Conversion> ReadConversion(std::string_view format, std::string_view kinds) {
   Conversion conversion;
@@ -36,6 +46,7 @@ std::optional<Conversion> ReadConversion(std::string_view format, std::string_vi
     rest.remove_prefix(1);
     conversion.precision = TakeDigits(rest);
   }
+  SkipLengthModifier(rest);
   if (rest.empty() || kinds.find(rest.front()) == std::string_view::npos) return std::nullopt;
   conversion.kind = rest.front();
   conversion.length = format.size() - rest.size() + 1;
@@ -54,20 +65,37 @@ void AppendPadded(BoundedText& out, const Conversion& conversion, std::string_vi
 }
 
 void AppendNumber(BoundedText& out, const Conversion& conversion, std::uint32_t value) {
+  const bool isSigned = conversion.kind == 'd' || conversion.kind == 'i';
+  const bool isHexadecimal = conversion.kind == 'x' || conversion.kind == 'X';
+  const bool isOctal = conversion.kind == 'o';
   std::string_view prefix;
-  if (conversion.kind == 'd') {
+  if (isSigned) {
     const auto signedValue = static_cast<std::int32_t>(value);
     if (signedValue < 0) value = 0 - value;
     prefix = signedValue < 0 ? "-" : conversion.has('+') ? "+" : conversion.has(' ') ? " " : "";
-  } else if (conversion.kind == 'x' && conversion.has('#') && value != 0) {
-    prefix = "0x";
+  } else if (isHexadecimal && conversion.has('#') && value != 0) {
+    prefix = conversion.kind == 'X' ? "0X" : "0x";
   }
-  char buffer[10];  // a u32 in decimal
-  const auto end =
-      std::to_chars(std::begin(buffer), std::end(buffer), value, conversion.kind == 'x' ? 16 : 10)
-          .ptr;
-  std::string_view digits(buffer, end);
+  char buffer[12];  // a zero and a u32 in octal
+  buffer[0] = '0';
+  char* const first = buffer + 1;
+  char* const end = std::to_chars(first, std::end(buffer), value,
+                                  isHexadecimal ? 16
+                                  : isOctal     ? 8
+                                                : 10)
+                        .ptr;
+  if (conversion.kind == 'X') {
+    std::transform(first, end, first, [](char c) {
+      return c >= 'a' && c <= 'f' ? static_cast<char>(c - 'a' + 'A') : c;
+    });
+  }
+  std::string_view digits(first, end);
   if (value == 0 && conversion.precision == std::size_t{0}) digits = {};
+  // The flag "#" makes an octal number start with a zero, if need be by a digit more.
+  if (isOctal && conversion.has('#') && !digits.starts_with('0') &&
+      conversion.precision.value_or(0) <= digits.size()) {
+    digits = std::string_view(buffer, digits.size() + 1);
+  }
   // A precision or left-alignment switches the flag "0" off.
   const bool zeroFilled = conversion.has('0') && !conversion.has('-') && !conversion.precision;
   const std::size_t wanted = zeroFilled
@@ -103,7 +131,7 @@ void AppendFilled(BoundedText& out, std::string_view format, std::string_view ki
 
 void AppendFormatted(BoundedText& out, std::string_view format,
                      std::span<const std::uint32_t> numbers) {
-  AppendFilled(out, format, "udx", numbers.size(),
+  AppendFilled(out, format, "udixXo", numbers.size(),
                [&](const Conversion& conversion, std::size_t i) {
                  AppendNumber(out, conversion, numbers[i]);
                });

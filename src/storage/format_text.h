@@ -45,9 +45,10 @@ class BoundedText {
   bool ok_ = true;
 };
 
-// Appends `format` with its first conversions %u, %d and %x filled with `numbers`, in order; flags,
-// width and precision (up to three digits each) mean what they mean to printf. "%%" is a percent
-// sign; everything else, and conversions beyond the numbers, stay as they are.
+// Appends `format` with its first conversions %u, %d, %i, %x, %X and %o filled with `numbers`, in
+// order; flags, width and precision (up to three digits each) mean what they mean to printf, and
+// length modifiers mean nothing. "%%" is a percent sign; everything else, and conversions beyond
+// the numbers, stay as they are.
 void AppendFormatted(BoundedText& out, std::string_view format,
                      std::span<const std::uint32_t> numbers);
 

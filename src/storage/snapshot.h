@@ -27,8 +27,9 @@ std::optional<std::size_t> FSPParseSnapshotBuffer(std::span<const std::byte> rec
 // whose first field is 0. A header that is missing (empty) or cut short gives nothing.
 //
 // A format text is data, not a format: its first conversions of the kind that the field has are
-// filled (%u, %d and %x for numbers, %s for the letters of a latency field; flags, width and
-// precision of up to three digits), "%%" is a percent sign, and everything else stays as it is.
+// filled (%u, %d, %i, %x, %X and %o for numbers, %s for the letters of a latency field; flags,
+// width and precision of up to three digits, and any length modifier), "%%" is a percent sign, and
+// everything else stays as it is.
 std::optional<std::size_t> FSPParseSnapshotBufferWithInplaceParser(
     std::span<const std::byte> records, std::span<char> out, std::span<const std::byte> header);
 

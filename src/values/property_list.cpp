@@ -28,8 +28,9 @@ constexpr std::string_view kBinaryMagic = "bplist00";
 constexpr std::string_view kReplacement = "\xEF\xBF\xBD";  // U+FFFD
 // Property-list dates count from 2001-01-01T00:00:00Z.
 constexpr double kEpoch2001 = 978307200;
-constexpr double kFirstWrittenSecond = -62135596800;  // 0001-01-01T00:00:00Z
-constexpr double kLastWrittenSecond = 253402300799;   // 9999-12-31T23:59:59Z
+constexpr double kFirstWrittenSecond = -62135596800;     // 0001-01-01T00:00:00Z
+constexpr double kFirstYearOfFourDigits = -30610224000;  // 1000-01-01T00:00:00Z
+constexpr double kLastWrittenSecond = 253402300799;      // 9999-12-31T23:59:59Z
 
 struct NodeFree {
   void operator()(void* node) const { plist_free(node); }
@@ -191,6 +192,8 @@ class TreeWriter {
   }
 
   const std::string& error() const { return error_; }
+  // Whether libplist writes a year with fewer than four digits.
+  bool hasShortYears() const { return hasShortYears_; }
 
  private:
   Node refuse(std::string error) {
@@ -215,7 +218,8 @@ class TreeWriter {
     return Node(plist_new_uint(static_cast<std::uint64_t>(number.toInt64())));
   }
 
-  static Node dateNode(Date date) {
+  Node dateNode(Date date) {
+    hasShortYears_ = hasShortYears_ || date.secondsSince1970 < kFirstYearOfFourDigits;
     const double second = AsWritten(date).secondsSince1970;
     const double since2001 = second - kEpoch2001;
     if (std::abs(since2001) > std::numeric_limits<std::int32_t>::max()) {
@@ -257,8 +261,21 @@ class TreeWriter {
 
   std::size_t values_ = 0;
   std::size_t content_ = 0;
+  bool hasShortYears_ = false;
   std::string error_;
 };
+
+// The document with each year in four digits. "<date>" is an element wherever it stands.
+std::string WithWholeYears(std::string_view document) {
+  constexpr std::string_view kStart = "<date>";
+  std::string out;
+  for (std::size_t at; (at = document.find(kStart)) != std::string_view::npos;) {
+    out += document.substr(0, at + kStart.size());
+    document.remove_prefix(at + kStart.size());
+    out.append(4 - std::min<std::size_t>(document.find('-'), 4), '0');
+  }
+  return out.append(document);
+}
 
 std::string TooLarge() {
   return FormatText("the document is larger than %llu bytes", kMaxPropertyListBytes);
@@ -319,7 +336,8 @@ std::variant<std::string, PropertyListError> WriteXmlPropertyList(const Property
   const Allocated<char> document(memory);
   if (memory == nullptr) return PropertyListError{"the document cannot be written"};
   if (size > kMaxPropertyListBytes) return PropertyListError{TooLarge()};
-  return std::string(memory, size);
+  const std::string_view text(memory, size);
+  return writer.hasShortYears() ? WithWholeYears(text) : std::string(text);
 }
 
 }  // namespace quorlet

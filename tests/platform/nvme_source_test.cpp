@@ -1,7 +1,17 @@
 #include "platform/linux/nvme_source.h"
 
 #include <gtest/gtest.h>
+#include <linux/filter.h>
+#include <linux/seccomp.h>
+#include <sys/prctl.h>
+#include <sys/syscall.h>
+#include <sys/wait.h>
+#include <unistd.h>
 
+#include <cerrno>
+#include <chrono>
+#include <cstddef>
+#include <iterator>
 #include <map>
 
 #include "fakes/fake_platform.h"
@@ -177,6 +187,30 @@ TEST_F(NvmeSource, ADriveThatSleepsOrDoesNotAnswerHasNoStatistics) {
   // The file that stands for the device knows no such command.
   source = MakeNvmeSource(root.root(), ReadNvmeHealthPage);
   EXPECT_EQ(statistics(), Statistics());
+}
+
+// Old kernels lack the call, and sandboxes refuse it.
+TEST(NvmeHealthPage, IsReadWithoutCloseRange) {
+  const TempRoot device;
+  device.write("/nuse", "7");
+  for (const int error : {ENOSYS, EPERM}) {
+    const pid_t child = fork();
+    if (child == 0) {
+      sock_filter rules[] = {
+          BPF_STMT(BPF_LD | BPF_W | BPF_ABS, offsetof(seccomp_data, nr)),
+          BPF_JUMP(BPF_JMP | BPF_JEQ | BPF_K, SYS_close_range, 0, 1),
+          BPF_STMT(BPF_RET | BPF_K, SECCOMP_RET_ERRNO | static_cast<unsigned>(error)),
+          BPF_STMT(BPF_RET | BPF_K, SECCOMP_RET_ALLOW)};
+      const sock_fprog program{std::size(rules), rules};
+      const bool filtered = prctl(PR_SET_NO_NEW_PRIVS, 1, 0, 0, 0) == 0 &&
+                            prctl(PR_SET_SECCOMP, SECCOMP_MODE_FILTER, &program) == 0;
+      if (!filtered || close_range(1000, 1000, 0) == 0) _exit(2);
+      _exit(ReadNvmeAttribute(device.path("/nuse"), std::chrono::seconds(2)) == "7" ? 0 : 1);
+    }
+    int status = -1;
+    waitpid(child, &status, 0);
+    EXPECT_EQ(status, 0) << error;
+  }
 }
 
 }  // namespace

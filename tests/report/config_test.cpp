@@ -2,6 +2,9 @@
 
 #include <gtest/gtest.h>
 
+#include <cmath>
+#include <limits>
+
 #include "fakes/fake_platform.h"
 #include "fakes/whitelist.h"
 
@@ -103,6 +106,60 @@ TEST_F(ConfigTest, FaultyEntriesAreSkippedWithOneLineEach) {
                 "Skipping whitelist entry bad of keyGroup G: it has options that are not a "
                 "dictionary",
                 "Skipping keyGroup H: it is not a dictionary"}));
+}
+
+TEST_F(ConfigTest, AnUnknownOptionIsToldAndItsEntryUsed) {
+  whitelist(Group("G", "ScalarKeys",
+                  {{"k", "sig_figs", "1"}, {"ok", "sig_fig", "1"}, {"ok.why", "why", "1"}}));
+  EXPECT_TRUE(load().configOptionsForScalarKey("k"));
+  EXPECT_EQ(device.log.errors(),
+            std::vector<std::string>{"Whitelist entry k: \"sig_figs\" is not an option, did you "
+                                     "mean \"sig_fig\"?"});
+}
+
+TEST(KeyOptionFaults, NameEachOptionThatWillNotWorkAsMeant) {
+  const auto bounds = [](std::initializer_list<double> numbers) {
+    Array array;
+    for (const double number : numbers) array.push_back(Double(number));
+    return PropertyValue(array);
+  };
+  constexpr auto kScalar = KeyKind::kScalar;
+  constexpr auto kDistribution = KeyKind::kDistribution;
+  const double infinity = std::numeric_limits<double>::infinity();
+  const struct {
+    KeyKind kind;
+    std::string name;
+    PropertyValue value;
+    std::string fault;
+  } cases[] = {
+      {kScalar, "sig_fig", Int64(2), ""},
+      {kScalar, "sig_fig", Int64(-1), "\"sig_fig\" is negative"},
+      {kScalar, "bucket_interval", "100", "\"bucket_interval\" is not a number"},
+      {kScalar, "intervals", bounds({1}), "\"intervals\" is for distributions only"},
+      {kDistribution, "sig_fig", Int64(2), "\"sig_fig\" is for scalars only"},
+      {kDistribution, "intervals", bounds({-infinity, 1, 2, infinity}), ""},
+      {kDistribution, "intervals", bounds({}), ""},
+      {kDistribution, "intervals", bounds({1, 1}), "\"intervals\" has bounds that do not ascend"},
+      {kDistribution, "intervals", bounds({2, 1}), "\"intervals\" has bounds that do not ascend"},
+      {kDistribution, "intervals", bounds({NAN}),
+       "\"intervals\" holds something that is not a number"},
+      {kDistribution, "interval", bounds({1}),
+       "\"interval\" is not an option, did you mean \"intervals\"?"},
+      {kScalar, "bucketinterval", Int64(1),
+       "\"bucketinterval\" is not an option, did you mean \"bucket_interval\"?"},
+      {kScalar, "round", Int64(1), "\"round\" is not an option"},
+      {kScalar, "", Int64(1), "\"\" is not an option"},
+      {kScalar, std::string(100'000, 's'), Int64(1),
+       "\"" + std::string(100'000, 's') + "\" is not an option"},
+      {kScalar, "why", "asked for", ""},
+      {kDistribution, "why", true, "\"why\" is not a text"},
+      {kDistribution, "expires", Date{0}, ""},
+      {kScalar, "expires", Int64(1), "\"expires\" is neither a date nor a text"},
+  };
+  for (const auto& [kind, name, value, fault] : cases) {
+    const auto faults = KeyOptionFaults(Dictionary{{name, value}}, kind);
+    EXPECT_EQ(faults, fault.empty() ? std::vector<std::string>() : std::vector{fault}) << name;
+  }
 }
 
 TEST_F(ConfigTest, WithoutAUsableFileThereIsNoConfig) {

@@ -49,7 +49,7 @@ std::string ClearPath(const std::string& path, const UnixSocketAddress& address)
   if (!probe.isOpen()) return ErrnoText(errno);
   const int error = address.connect(probe.get());
   // A full backlog (EAGAIN) is a live listener too.
-  if (error == 0 || error == EAGAIN) return "another process is listening";
+  if (error == 0 || error == EAGAIN) return std::string(kAlreadyListening);
   if (error != ECONNREFUSED) return ErrnoText(error);
   return unlink(path.c_str()) == 0 || errno == ENOENT ? "" : ErrnoText(errno);
 }

@@ -6,11 +6,15 @@
 
 #include <optional>
 #include <string>
+#include <string_view>
 #include <variant>
 
 #include "platform/linux/descriptor.h"
 
 namespace quorlet {
+
+// The reason that is no fault: whoever came first serves.
+inline constexpr std::string_view kAlreadyListening = "another process is listening";
 
 // A listening, non-blocking stream socket. One that this process made is removed from its directory
 // at the end, unless somebody has replaced it.

@@ -126,7 +126,11 @@ bool LinuxNamedService::ListenNamedService(std::string_view name, ListenerHandle
   auto passed = ListeningSocket::Passed();
   auto socket = passed ? std::move(*passed) : ListeningSocket::Make(directory_, std::string(name));
   if (const auto* reason = std::get_if<std::string>(&socket)) {
-    log_.error("Cannot listen as %@: %@", name, *reason);
+    if (*reason == kAlreadyListening) {
+      log_.info("Not listening as %@: %@", name, *reason);
+    } else {
+      log_.error("Cannot listen at %@/%@: %@", directory_, name, *reason);
+    }
     return false;
   }
   epoll_ = Descriptor(epoll_create1(EPOLL_CLOEXEC));

@@ -7,11 +7,14 @@
 #include <linux/nvme_ioctl.h>
 #include <poll.h>
 #include <sys/ioctl.h>
+#include <sys/resource.h>
+#include <sys/syscall.h>
 #include <sys/wait.h>
 #include <unistd.h>
 
 #include <algorithm>
 #include <csignal>
+#include <cstddef>
 #include <cstdint>
 #include <functional>
 #include <span>
@@ -32,9 +35,56 @@ constexpr std::size_t kMaxAttributeBytes = 64;
 // be called between fork and the end.
 using Question = std::function<ssize_t(std::span<std::byte> answer)>;
 
+// The directory entries as the kernel writes them.
+struct KernelEntry {
+  std::uint64_t inode;
+  std::int64_t offset;
+  std::uint16_t length;
+  std::uint8_t type;
+  char name[1];
+};
+
+// A descriptor's number from its name, or -1 for "." and "..".
+int DescriptorNumber(const char* name) {
+  int number = -1;
+  for (; *name >= '0' && *name <= '9' && number < 100'000'000; ++name) {
+    number = (number < 0 ? 0 : number * 10) + (*name - '0');
+  }
+  return number;
+}
+
+// Closes what /proc lists of 1 and above. False when it cannot be read.
+bool CloseListed() {
+  const int directory = open("/proc/self/fd", O_RDONLY | O_DIRECTORY | O_CLOEXEC);
+  if (directory < 0) return false;
+  alignas(KernelEntry) char block[1024];
+  long size = 0;
+  while ((size = syscall(SYS_getdents64, directory, block, sizeof block)) > 0) {
+    for (long at = 0; at < size;) {
+      const auto* entry = reinterpret_cast<const KernelEntry*>(block + at);
+      const int number = DescriptorNumber(block + at + offsetof(KernelEntry, name));
+      if (number >= 1 && number != directory) close(number);
+      at += entry->length;
+    }
+  }
+  close(directory);
+  return size == 0;
+}
+
+// Closes every descriptor from 1 on, with nothing but system calls: this runs between fork and the
+// end. An old kernel has no close_range, and a sandbox may refuse it.
+void CloseAllButFirst() {
+  if (close_range(1, ~0U, 0) == 0 || CloseListed()) return;
+  constexpr rlim_t kMostTried = 1 << 20;
+  rlimit limit{};
+  const rlim_t count = getrlimit(RLIMIT_NOFILE, &limit) == 0 ? limit.rlim_cur : kMostTried;
+  for (rlim_t i = 1; i < std::min(count, kMostTried); ++i) close(static_cast<int>(i));
+}
+
 [[noreturn]] void AnswerFromChild(const Question& question, std::span<std::byte> answer, int pipe) {
   // Whatever else is open, a lock or somebody's pipe, must not stay open with a child that hangs.
-  if (dup2(pipe, 0) < 0 || close_range(1, ~0U, 0) != 0) _exit(1);
+  if (dup2(pipe, 0) < 0) _exit(1);
+  CloseAllButFirst();
   const ssize_t size = question(answer);
   // A pipe takes as little as this in one go.
   if (size > 0 && write(0, answer.data(), static_cast<std::size_t>(size)) < 0) _exit(1);

@@ -266,10 +266,12 @@ class LinuxPreferences : public Preferences {
   bool write(std::string_view name, Domain& domain) {
     if (access_ == Access::kReadOnly) return true;
     if (isSettled(name, domain)) return true;  // nothing to write: no lock file either
-    const FileLock lock(directory_ + "/." + std::string(name) + ".lock");
+    const std::string lockPath = directory_ + "/." + std::string(name) + ".lock";
+    const FileLock lock(lockPath);
     if (lock.error() != 0) {
       if (!domain.hasFailed) {
-        log_.error("Cannot lock the preferences %@: %@", path(name), ErrnoText(lock.error()));
+        log_.error("Cannot lock the preferences %@ by %@: %@", path(name), lockPath,
+                   ErrnoText(lock.error()));
       }
       return false;
     }
