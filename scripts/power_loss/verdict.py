@@ -158,7 +158,7 @@ def _check_usage(scalars, total: int, states: list[State]) -> None:
     wanted = {total - state.uncounted_usage for state in states}
     require(found in wanted, f"network usage is {found} KB, not {sorted(wanted)}")
     odd = [key for _, key in scalars if "baddata" in key or "olddata" in key]
-    require(not odd, f"network usage went backwards: {odd[0]}")
+    require(not odd, f"network usage went backwards: {odd}")
 
 
 def _check_preference(root: pathlib.Path, states: list[State]) -> None:
@@ -183,7 +183,7 @@ def _check_logs(root: pathlib.Path, today: int, states: list[State]) -> None:
     if len(states) > 1 and any(len(state.scalars) < len(states[0].scalars) for state in states):
         due = {today}  # the cut hit a step that drops counters
     missing = sorted(due - set(spool.days))
-    require(not missing, f"no aggregated log of day {missing[0]}")
+    require(not missing, f"no aggregated log of days {missing}")
     for day, logs in spool.days.items():
         _check_log(day, logs[0], states)
 
