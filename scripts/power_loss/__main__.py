@@ -29,17 +29,18 @@ BATCH = 100  # points that one boot of the machine recovers
 
 HELP = """\
 A guest kernel records every block that a run of quorlet and quorletctl writes (counters added,
-recorded and imported, preferences, a consent, two gated passes on two days, submitted logs). For
-each point the disk is put together as a power cut at that moment leaves it, the guest mounts it, and
-the tree that survives is taken out. There the day's gated pass runs again, with network usage grown
-meanwhile, and the next day's; then everything is compared with what had been acknowledged.
+recorded and imported, preferences, consent, two gated passes on two days, submitted logs). For each
+point the disk is put together as a power cut at that moment leaves it, the guest mounts it, and
+the tree that survives is taken out. There the day's gated pass runs again, with network usage
+grown meanwhile, and the next day's; then everything is compared with what had been acknowledged.
+Neither root nor loop devices are needed, and no damaged file system meets this machine's kernel.
 
 Points: p120 has everything written before entry 120 of the recording; s120.7 has of the writes
 since the last flush only a random part, drawn from seed 7, as disks reorder what was not flushed.
 
-A line of a broken point names the seed, the point, the file system and what is broken. Its recording
-is kept; the command at the end of the line checks the same point again, with --trees leaving what
-survived in a directory to look at.
+A line of a broken point names the seed, the point, the file system, the step that the cut hit and
+what is broken. Its recording is kept; the command at the end of the line checks the same point
+again, with --trees DIR leaving what survived in a directory to look at.
 
 Exit status: 0 nothing is broken, 1 something is (--prove: nothing is), 77 this cannot run here.
 """
@@ -61,7 +62,7 @@ def parse_options() -> argparse.Namespace:
     parser.add_argument("--points", type=int, default=500, help="points for each file system (500)")
     parser.add_argument("--fs", choices=("ext4", "f2fs", "both"), default="both")
     parser.add_argument("--seed", type=int, default=1, help="draws the reordered writes (1)")
-    parser.add_argument("--no-sync", action="store_true", help="make the programs' syncs do nothing")
+    parser.add_argument("--no-sync", action="store_true", help="let the programs' syncs do nothing")
     parser.add_argument("--prove", action="store_true",
                         help="run with --no-sync and succeed only when promises are broken")
     parser.add_argument("--bin", type=pathlib.Path, help="directory of quorlet and quorletctl, else"
@@ -70,7 +71,7 @@ def parse_options() -> argparse.Namespace:
     parser.add_argument("--recording", type=pathlib.Path, help="use a recording that was kept")
     parser.add_argument("--point", type=cuts.parse_point, help="check only this point")
     parser.add_argument("--trees", type=pathlib.Path, help="leave what survived in this directory")
-    parser.add_argument("--tcg", action="store_true", help="emulate the processor even if KVM is there")
+    parser.add_argument("--tcg", action="store_true", help="emulate the processor even with KVM")
     options = parser.parse_args()
     if options.short:
         options.points, options.fs = 60, "ext4"
@@ -129,7 +130,8 @@ def record(machine: Machine, system: FileSystem, programs: verdict.Programs, no_
     steps = story.tell(programs.quorletctl)
     (scratch / "story").write_text(story.script(steps, no_sync))
     machine.add_file(scratch / "story", "/story")
-    said = machine.run([data, log], {"job": "record", "fs": system.name, "options": system.mount}, 300)
+    words = {"job": "record", "fs": system.name, "options": system.mount}
+    said = machine.run([data, log], words, 300)
     if said[-1:] != ["recorded"] or any(line.startswith("failed") for line in said):
         shutil.copy(machine.console, directory)
         raise SystemExit(f"power-loss: the recording failed: {'; '.join(said[1:])} "
@@ -150,23 +152,26 @@ def load(directory: pathlib.Path, programs: verdict.Programs) -> Recording:
                      read_image(directory / "base"), steps)
 
 
-def recover(machine: Machine, recording: Recording, points: list[cuts.Point],
-            images: list[cuts.Image], scratch: pathlib.Path):
-    """Mounts the disk of each point as the next boot does; (result, packed tree) of each."""
-    size = recording.system.size
-    data = sparse(scratch / "images", size * len(points))
+def recover(machine: Machine, recording: Recording, images: list[cuts.Image],
+            scratch: pathlib.Path) -> list[tuple[str, bytes]]:
+    """Mounts each disk as the next boot does: what became of it, and the packed tree."""
+    size, count = recording.system.size, len(images)
+    data, out = sparse(scratch / "images", size * count), sparse(scratch / "trees", SLOT * count)
     with data.open("r+b") as disk:
         for i, image in enumerate(images):
             write_image(disk, i * size, image)
-    out = sparse(scratch / "trees", SLOT * len(points))
     said = machine.run([data, out], {"job": "recover", "fs": recording.system.name,
-                                     "options": recording.system.mount, "count": len(points),
+                                     "options": recording.system.mount, "count": count,
                                      "sectors": size // 512, "slot": SLOT // 65536}, 540)
     results = dict(re.findall(r"^point (\d+) (.*)$", "\n".join(said), re.MULTILINE))
+    recovered = []
     with out.open("rb") as trees:
-        for i in range(len(points)):
+        for i in range(count):
+            said_of_it = results.get(str(i), "unmountable: the machine stopped")
+            result, _, length = said_of_it.partition("=")
             trees.seek(i * SLOT)
-            yield results.get(str(i), "unmountable: the machine stopped"), trees.read(SLOT)
+            recovered.append((result, trees.read(int(length or 0))))
+    return recovered
 
 
 def judge_point(recording: Recording, point: cuts.Point, result: str, packed: bytes,
@@ -178,8 +183,7 @@ def judge_point(recording: Recording, point: cuts.Point, result: str, packed: by
     acknowledged = sum(mark in names for mark in cuts.marks(recording.entries, point))
     directory = scratch / f"tree-{point}"
     with tarfile.open(fileobj=io.BytesIO(packed)) as archive:
-        archive.extractall(directory, filter="tar") if hasattr(tarfile, "tar_filter") else \
-            archive.extractall(directory)
+        archive.extractall(directory)
     root = directory / "root"
     root.mkdir(exist_ok=True)
     if keep:
@@ -188,36 +192,60 @@ def judge_point(recording: Recording, point: cuts.Point, result: str, packed: by
     shutil.rmtree(directory)
     if not broken:
         return None
-    step = recording.steps[acknowledged].name if acknowledged < len(recording.steps) else "the end"
+    done = acknowledged == len(recording.steps)
+    step = "the end" if done else recording.steps[acknowledged].name
     return f"in {step}: {'; '.join(broken)}"
+
+
+def recovered_batches(machine: Machine, recording: Recording, points: list[cuts.Point],
+                      scratch: pathlib.Path):
+    """(point, result, packed tree); the machine is one batch ahead of whoever takes them."""
+    states = cuts.images(recording.entries, recording.base, points)
+
+    def next_batch(batch: list[cuts.Point]) -> list[tuple[str, bytes]]:
+        return recover(machine, recording, [next(states) for _ in batch], scratch) if batch else []
+
+    batches = [points[first:first + BATCH] for first in range(0, len(points), BATCH)]
+    with concurrent.futures.ThreadPoolExecutor(1) as ahead:
+        coming = ahead.submit(next_batch, batches[0])
+        for batch, following in zip(batches, [*batches[1:], []]):
+            trees = coming.result()
+            coming = ahead.submit(next_batch, following)
+            yield [(point, *tree) for point, tree in zip(batch, trees)]
 
 
 def check(machine: Machine, recording: Recording, options: argparse.Namespace,
           programs: verdict.Programs, scratch: pathlib.Path) -> int:
     """Prints a line for each broken point; how many there are."""
     entries = recording.entries
-    points = [options.point] if options.point else cuts.choose(entries, options.points, options.seed)
-    states = cuts.images(entries, recording.base, points)
+    points = [options.point] if options.point else \
+        cuts.choose(entries, options.points, options.seed)
     broken, started = 0, time.monotonic()
-    for first in range(0, len(points), BATCH):
-        batch = points[first:first + BATCH]
-        images = [next(states) for _ in batch]
-        recovered = list(recover(machine, recording, batch, images, scratch))
-        with concurrent.futures.ThreadPoolExecutor(os.cpu_count()) as pool:
-            found = pool.map(lambda point, tree: judge_point(recording, point, *tree, programs, scratch,
-                                                             options.trees), batch, recovered)
-            for point, what in zip(batch, found):
+
+    def judge(found: tuple[cuts.Point, str, bytes]) -> str | None:
+        return judge_point(recording, *found, programs, scratch, options.trees)
+
+    with concurrent.futures.ThreadPoolExecutor(os.cpu_count()) as pool:
+        for batch in recovered_batches(machine, recording, points, scratch):
+            for (point, *_), what in zip(batch, pool.map(judge, batch)):
                 if what is not None:
                     broken += 1
-                    again = f"scripts/power-loss --recording {os.path.relpath(recording.directory)} --point {point}"
+                    again = repeat_command(recording, point, options)
                     print(f"broken: seed {options.seed}, point {point}, {recording.system.name}, "
                           f"{what} [{again}]", flush=True)
     seconds = time.monotonic() - started
     flushes = sum(1 for entry in entries if entry.flags & write_log.FLUSH)
     print(f"{recording.system.name}: {broken} of {len(points)} points broken; "
-          f"{sum(1 for entry in entries if entry.changes_disk)} writes, {flushes} flushes recorded; "
-          f"{seconds:.0f} s, {100 * seconds / len(points):.1f} s for 100 points ({machine.accelerator})")
+          f"{sum(entry.changes_disk for entry in entries)} writes, {flushes} flushes recorded; "
+          f"{seconds:.0f} s, {100 * seconds / len(points):.1f} s for 100 points "
+          f"({machine.accelerator})", flush=True)
     return broken
+
+
+def repeat_command(recording: Recording, point: cuts.Point, options: argparse.Namespace) -> str:
+    programs = f" --bin {os.path.relpath(options.bin)}" if options.bin else ""
+    return f"scripts/power-loss{programs} --recording {os.path.relpath(recording.directory)} " \
+           f"--point {point}"
 
 
 def run(options: argparse.Namespace) -> int:

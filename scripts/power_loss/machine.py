@@ -112,18 +112,25 @@ class Machine:
 
     def add_file(self, source: pathlib.Path, target: str) -> None:
         self._copy(source, target)
+        (self.work / "initramfs.cpio").unlink(missing_ok=True)
 
-    def run(self, disks: list[pathlib.Path], words: dict[str, str | int], seconds: int) -> list[str]:
-        """Boots, waits until the machine turns itself off, and returns what its init said."""
+    def _pack(self) -> pathlib.Path:
         initrd = self.work / "initramfs.cpio"
-        with initrd.open("wb") as out:
+        if not initrd.exists():
             listed = subprocess.run(["find", "."], cwd=self._stage, capture_output=True, check=True)
-            subprocess.run(["cpio", "-o", "-H", "newc", "--quiet"], cwd=self._stage, check=True,
-                           input=listed.stdout, stdout=out)
+            with initrd.open("wb") as out:
+                subprocess.run(["cpio", "-o", "-H", "newc", "--quiet"], cwd=self._stage,
+                               input=listed.stdout, stdout=out, check=True)
+        return initrd
+
+    def run(self, disks: list[pathlib.Path], words: dict[str, str | int],
+            seconds: int) -> list[str]:
+        """Boots, waits until the machine turns itself off, and returns what its init said."""
+        initrd = self._pack()
         line = "console=ttyS0 quiet panic=-1 " + " ".join(f"{k}={v}" for k, v in words.items())
-        command = ["qemu-system-x86_64", "-nographic", "-no-reboot", "-nodefaults", "-serial", "stdio",
-                   "-m", "768", "-cpu", "max", "-kernel", str(self._image), "-initrd", str(initrd),
-                   "-append", line]
+        command = ["qemu-system-x86_64", "-nographic", "-no-reboot", "-nodefaults",
+                   "-serial", "stdio", "-m", "768", "-cpu", "max", "-kernel", str(self._image),
+                   "-initrd", str(initrd), "-append", line]
         for disk in disks:
             command += ["-drive", f"file={disk},if=none,id={disk.name},format=raw,cache=unsafe",
                         "-device", f"virtio-blk-pci,drive={disk.name}"]

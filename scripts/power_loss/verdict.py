@@ -50,6 +50,7 @@ class Programs:
 @dataclasses.dataclass
 class Spool:
     days: dict[int, list[dict]] = dataclasses.field(default_factory=dict)
+    metadata: dict[int, dict] = dataclasses.field(default_factory=dict)  # of a day's last log
     status: int = 0
 
 
@@ -73,7 +74,9 @@ def _read_log(path: pathlib.Path, spool: Spool) -> None:
     require(header["type"] == "193", f"{path.name} is of type {header['type']}")
     document = _plist(path, body)
     start = document["TLStartDate"].replace(tzinfo=story.datetime.timezone.utc).timestamp()
-    spool.days.setdefault(int(start) // 86400, []).append(document)
+    day = int(start) // 86400
+    spool.days.setdefault(day, []).append(document)
+    spool.metadata[day] = header.get("metadata", {})
 
 
 def read_spool(root: pathlib.Path) -> Spool:
@@ -154,7 +157,8 @@ def _check_counters(scalars, values, states: list[State]) -> None:
 
 
 def _check_usage(scalars, total: int, states: list[State]) -> None:
-    found = sum(value for (_, key), value in scalars.items() if key.startswith("datausage.wifiInKB"))
+    found = sum(value for (_, key), value in scalars.items()
+                if key.startswith("datausage.wifiInKB"))
     wanted = {total - state.uncounted_usage for state in states}
     require(found in wanted, f"network usage is {found} KB, not {sorted(wanted)}")
     odd = [key for _, key in scalars if "baddata" in key or "olddata" in key]
@@ -174,18 +178,23 @@ def _check_logs(root: pathlib.Path, today: int, states: list[State]) -> None:
     for day, logs in spool.days.items():
         require(len(logs) == 1, f"{len(logs)} aggregated logs of day {day}")
     require(spool.status <= 1, f"{spool.status} status logs of one week")
+    if not any(state.enabled for state in states):
+        require(not spool.days and not spool.status, "a log was written without consent")
     if not all(state.enabled for state in states):
         return
-    due = {day for day in range(DAY - 1, today) if day + 1 in states[0].passes}
-    due |= {today}
+    # Network usage has grown today, so that today always has something to report.
+    due = {today} | {day for day in range(DAY - 1, today) if day + 1 in states[0].passes}
     if any(day == today - 1 for day, _ in states[0].scalars):
         due.add(today - 1)
-    if len(states) > 1 and any(len(state.scalars) < len(states[0].scalars) for state in states):
-        due = {today}  # the cut hit a step that drops counters
     missing = sorted(due - set(spool.days))
     require(not missing, f"no aggregated log of days {missing}")
     for day, logs in spool.days.items():
         _check_log(day, logs[0], states)
+    # Only the first log ever tells of the change of the operating system, and a repeated pass must
+    # not forget it.
+    if DAY - 1 in spool.days:
+        told = spool.metadata[DAY - 1].get("previous_os_version")
+        require(told is not None, f"the log of day {DAY - 1} has lost the previous OS version")
 
 
 def _check_log(day: int, document: dict, states: list[State]) -> None:
@@ -223,7 +232,8 @@ def run_passes(programs: Programs, root: pathlib.Path, at: int) -> int:
     return total
 
 
-def judge(root: pathlib.Path, steps: list[Step], acknowledged: int, programs: Programs) -> list[str]:
+def judge(root: pathlib.Path, steps: list[Step], acknowledged: int,
+          programs: Programs) -> list[str]:
     """Everything that is broken. ROOT is used up."""
     states = [State()]
     for step in steps[:acknowledged + 1]:
