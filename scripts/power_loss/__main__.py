@@ -254,8 +254,8 @@ def run(options: argparse.Namespace) -> int:
     memory = "/dev/shm" if os.access("/dev/shm", os.W_OK) else None
     with tempfile.TemporaryDirectory(prefix="power-loss-", dir=memory) as name:
         scratch = pathlib.Path(name)
-        machine = Machine(WORK / "kernel", [pathlib.Path(programs.quorlet),
-                                            pathlib.Path(programs.quorletctl)], scratch, options.tcg)
+        both = [pathlib.Path(programs.quorlet), pathlib.Path(programs.quorletctl)]
+        machine = Machine(WORK / "kernel", both, scratch, options.tcg)
         library = scratch / "no_sync.so"
         run_tool("cc", "-shared", "-fPIC", "-O1", "-o", str(library),
                  str(pathlib.Path(__file__).with_name("no_sync.c")))
