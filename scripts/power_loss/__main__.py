@@ -168,17 +168,30 @@ def recover(machine: Machine, recording: Recording, images: list[cuts.Image],
     with out.open("rb") as trees:
         for i in range(count):
             said_of_it = results.get(str(i), "unmountable: the machine stopped")
-            result, _, length = said_of_it.partition("=")
+            result, _, numbers = said_of_it.partition("=")
+            length, _, inode = numbers.partition(":")
             trees.seek(i * SLOT)
-            recovered.append((result, trees.read(int(length or 0))))
+            recovered.append((f"{result}:{inode}", trees.read(int(length or 0))))
     return recovered
+
+
+def give_inode(root: pathlib.Path, inode: str) -> None:
+    """Files that tell the inode of the structured log beside them tell that of its copy."""
+    log = root / "var/mobile/Library/Logs/FaultScribe/structured.jsonl"
+    if not inode or not log.exists():
+        return
+    for path in log.parent.glob(f".structured*.{inode}*"):
+        parts = path.name.split(".")
+        parts = [str(log.stat().st_ino) if part == inode else part for part in parts]
+        path.rename(path.with_name(".".join(parts)))
 
 
 def judge_point(recording: Recording, point: cuts.Point, result: str, packed: bytes,
                 programs: verdict.Programs, scratch: pathlib.Path,
                 keep: pathlib.Path | None) -> str | None:
-    if result != "read":
-        return result
+    if not result.startswith("read:"):
+        return result.rstrip(":")
+    inode = result.removeprefix("read:")
     names = {step.name for step in recording.steps}
     acknowledged = sum(mark in names for mark in cuts.marks(recording.entries, point))
     directory = scratch / f"tree-{point}"
@@ -186,6 +199,7 @@ def judge_point(recording: Recording, point: cuts.Point, result: str, packed: by
         archive.extractall(directory)
     root = directory / "root"
     root.mkdir(exist_ok=True)
+    give_inode(root, inode)
     if keep:
         shutil.copytree(root, keep / str(point), symlinks=True)
     broken = verdict.judge(root, recording.steps, acknowledged, programs)

@@ -182,10 +182,8 @@ def _check_logs(root: pathlib.Path, today: int, states: list[State]) -> None:
         require(not spool.days and not spool.status, "a log was written without consent")
     if not all(state.enabled for state in states):
         return
-    # Network usage has grown today, so that today always has something to report.
-    due = {today} | {day for day in range(DAY - 1, today) if day + 1 in states[0].passes}
-    if any(day == today - 1 for day, _ in states[0].scalars):
-        due.add(today - 1)
+    due = {day for day in range(DAY - 1, today) if day + 1 in states[0].passes}
+    due |= {day for day, _ in states[0].scalars if today - 1 <= day <= today}
     missing = sorted(due - set(spool.days))
     require(not missing, f"no aggregated log of days {missing}")
     for day, logs in spool.days.items():

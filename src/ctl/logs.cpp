@@ -197,6 +197,18 @@ void Show(Session& session, const LogsArguments& arguments) {
   session.out.line(JsonText(both, JsonForm::kPlain));
 }
 
+// Under the pass lock, since a repeated pass replaces logs.
+void Submit(Session& session) {
+  const auto platform = session.open(Access::kReadWrite);
+  Platform& services = platform->services();
+  if (!services.diagnostics.DiagnosticLogSubmissionEnabled()) {
+    throw Failure("the device's owner has not consented to logs being submitted");
+  }
+  const PassHold hold(services.passLock);
+  if (hold.isHeld()) services.diagnostics.SubmitDiagnosticLogs();
+  if (!session.messages.errors().empty()) throw Failure(session.messages.errors().front());
+}
+
 }  // namespace
 
 void AddLogsCommands(CLI::App& app, Session& session) {
@@ -209,6 +221,11 @@ void AddLogsCommands(CLI::App& app, Session& session) {
   list->callback([&session, arguments] {
     session.command = [&session, arguments] { List(session, *arguments); };
   });
+
+  CLI::App* submit = AddCommand(*logs, "submit", "Hand the pending logs to the uploader",
+                                "They are moved to outbox/. Refused without the owner's consent.",
+                                "quorletctl logs submit");
+  submit->callback([&session] { session.command = [&session] { Submit(session); }; });
 
   CLI::App* show =
       AddCommand(*logs, "show", "Print a log",

@@ -30,6 +30,7 @@ void AddCommands(CLI::App& app, Session& session) {
   AddPrefsCommands(app, session);
   AddReportCommands(app, session);
   AddLogsCommands(app, session);
+  AddConsentCommands(app, session);
   AddWhitelistCommands(app, session);
   AddChannelsCommands(app, session);
   AddStorageCommands(app, session);
