@@ -218,6 +218,7 @@ TEST(DriverFiles, ABadFileCostsOnlyItselfAndOneLine) {
   const std::string directory = kDrivers;
   device.write("b.plist", 5, "Good", {{"Properties", "none"}});
   device.write("c.plist", 5, "Good", {});
+  device.write("c2.plist", 5, "Good", {});
   device.root.write(directory + "a.plist", "<plist><array/></plist>");
   device.root.write(directory + "d.plist",
                     "<plist><dict><key>EntryID</key><real>6</real></dict></plist>");
@@ -226,10 +227,18 @@ TEST(DriverFiles, ABadFileCostsOnlyItselfAndOneLine) {
   device.root.write(directory + ".g.plist", "hidden");
   for (int i = 0; i < 2; ++i) EXPECT_NE(device.registry->FindServiceByClass("Good"), 0u);
   EXPECT_EQ(device.log.errors().size(), 5u) << "a, c, d, e and f, once each";
-  EXPECT_EQ(device.log.errors()[1], "Skipped the driver file " + device.root.path(directory) +
-                                        "c.plist: its EntryID is that of b.plist");
+  EXPECT_EQ(device.log.errors()[1],
+            "Skipped the driver file " + device.root.path(directory) +
+                "c.plist: its EntryID is that of b.plist, like that of 2 in all");
   std::filesystem::remove(device.root.path(directory) + "b.plist");
   EXPECT_NE(device.registry->FindServiceByClass("Good"), 0u) << "c.plist has taken its place";
+
+  // What is there stays while the directory cannot be read.
+  std::filesystem::rename(device.root.path(kDrivers), device.root.path("/elsewhere"));
+  device.root.write("/var/db/drivers", "no directory");
+  EXPECT_NE(device.registry->FindServiceByClass("Good"), 0u);
+  EXPECT_EQ(device.log.errors().back(),
+            "Cannot read " + device.root.path("/var/db/drivers: ") + ErrnoText(ENOTDIR));
 }
 
 TEST(DriverFiles, SearchGoesUpAndEndsInARing) {

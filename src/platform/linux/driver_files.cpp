@@ -4,6 +4,7 @@
 #include <array>
 #include <cerrno>
 #include <cstring>
+#include <functional>
 #include <map>
 #include <optional>
 #include <string>
@@ -22,6 +23,7 @@ constexpr char kDirectory[] = "/var/db/drivers";
 constexpr std::size_t kMaxFiles = 4096;
 // Of all files together.
 constexpr std::size_t kMaxBytes = std::size_t{64} << 20;
+constexpr std::size_t kMaxMemory = std::size_t{64} << 20;  // of what they say
 constexpr std::size_t kRecordBytes = 64;
 
 constexpr std::size_t kRequestBytes = 24;
@@ -152,17 +154,47 @@ class FileDriver : public EntryDriver {
   const Dictionary description_;
 };
 
+// About how much memory a value takes.
+std::size_t Footprint(const PropertyValue& value) {
+  constexpr std::size_t kMemberBytes = 64;  // of a dictionary, beside key and value
+  std::size_t bytes = sizeof(PropertyValue);
+  if (const std::string* text = value.asString()) bytes += text->size();
+  if (const Data* data = value.asData()) bytes += data->size();
+  if (const Array* array = value.asArray()) {
+    for (const PropertyValue& element : *array) bytes += Footprint(element);
+  }
+  if (const Dictionary* dictionary = value.asDictionary()) {
+    for (const auto& [key, member] : *dictionary) {
+      bytes += kMemberBytes + key.size() + Footprint(member);
+    }
+  }
+  return bytes;
+}
+
 struct DriverFile {
-  std::string text;
-  std::string problem;  // why there is no entry
+  std::size_t size = 0;
+  std::size_t digest = 0;  // of its bytes; with the size, tells whether it has changed
+  std::string problem;     // why there is no entry; empty where that has been told already
+  std::optional<std::uint64_t> id;
   std::optional<RegistryEntry> entry;
-  Dictionary description;
+  Dictionary description;     // with an entry
+  std::size_t footprint = 0;  // of the description, also when it was not kept
+
+  bool isOf(std::string_view text) const {
+    return size == text.size() && digest == std::hash<std::string_view>()(text);
+  }
+  void drop(std::string why) {
+    problem = std::move(why);
+    entry.reset();
+    description = Dictionary();
+  }
 };
 
-DriverFile ReadDescription(std::string text) {
+DriverFile ReadDescription(std::string_view text) {
   DriverFile file;
-  file.text = std::move(text);
-  const auto document = ReadPropertyList(std::string_view(file.text));
+  file.size = text.size();
+  file.digest = std::hash<std::string_view>()(text);
+  const auto document = ReadPropertyList(text);
   if (const auto* error = std::get_if<PropertyListError>(&document)) {
     file.problem = error->description;
     return file;
@@ -183,7 +215,9 @@ DriverFile ReadDescription(std::string text) {
     return file;
   }
   const Dictionary* properties = DictionaryEntry(*description, "Properties");
+  file.id = *id;
   file.description = *description;
+  file.footprint = Footprint(*description);
   file.entry = RegistryEntry{.id = *id,
                              .name = TextEntry(*description, "EntryName"),
                              .className = TextEntry(*description, "ClassName"),
@@ -208,9 +242,11 @@ class DriverFiles : public EntrySource {
   }
 
   std::string entrySet() override {
-    std::string set;
-    for (const std::string& name : names()) set.append(name).append("/");
-    return set;
+    if (const auto present = names()) {
+      set_.clear();
+      for (const std::string& name : *present) set_.append(name).append("/");
+    }
+    return set_;
   }
 
   void refreshElements() override { read(); }
@@ -221,62 +257,107 @@ class DriverFiles : public EntrySource {
   }
 
  private:
-  std::vector<std::string> names() const {
-    std::vector<std::string> names = ListDirectory(directory_);
+  struct Owner {
+    std::string name;
+    std::string duplicate;  // the first other file with the same ID
+    std::size_t others = 0;
+  };
+  // A set of files while it is read.
+  struct Reading {
+    std::map<std::string, DriverFile> files;
+    std::map<std::uint64_t, Owner> owners;
+    bool isSame = true;  // as what was read before
+    std::size_t room = kMaxBytes;
+    std::size_t memory = kMaxMemory;
+  };
+
+  // Nothing, after an error line, when the directory cannot be read.
+  std::optional<std::vector<std::string>> names() {
+    auto listed = ReadDirectory(directory_);
+    const int* error = std::get_if<int>(&listed);
+    if (error != nullptr) {
+      if (*error != directoryError_) {
+        log_.error("Cannot read %@: %@", directory_, ErrnoText(*error));
+      }
+      directoryError_ = *error;
+      return std::nullopt;
+    }
+    directoryError_ = 0;
+    auto& names = std::get<std::vector<std::string>>(listed);
     std::erase_if(names, [](const std::string& name) {
       return name.starts_with('.') || !name.ends_with(".plist");
     });
-    return names;
+    return std::move(names);
   }
 
-  // Reads every file; those whose bytes are the same are not parsed again.
+  // Reads every file; those whose bytes are the same are not parsed again. What was read before
+  // stays while the directory cannot be read.
   void read() {
-    std::map<std::string, DriverFile> files;
-    bool isSame = true;
-    std::size_t room = kMaxBytes;
-    for (const std::string& name : names()) {
-      if (files.size() == kMaxFiles) {
-        files[name].problem = "there are too many";
-        isSame = false;
+    const auto present = names();
+    if (!present) return;
+    Reading reading;
+    for (const std::string& name : *present) {
+      if (reading.files.size() == kMaxFiles) {
+        reading.files[name].problem = "there are too many";
+        reading.isSame = false;
         break;
       }
-      auto bytes = ReadWholeFile(JoinPath(directory_, name), std::min(room, kMaxPropertyListBytes));
-      if (const int* error = std::get_if<int>(&bytes)) {
-        if (*error == ENOENT) continue;  // it has just gone
-        files[name].problem = ErrnoText(*error);
-        isSame = false;
-        continue;
-      }
-      auto& text = std::get<std::string>(bytes);
-      room -= text.size();
-      const auto known = files_.find(name);
-      if (known != files_.end() && !known->second.text.empty() && known->second.text == text) {
-        files.insert(files_.extract(known));
-      } else {
-        files.emplace(name, ReadDescription(std::move(text)));
-        isSame = false;
-      }
+      readFile(name, reading);
     }
-    // What was not taken over has gone.
-    if (isSame && files_.empty()) {
-      files_ = std::move(files);
-      return;
+    const bool isSame = reading.isSame && files_.empty();  // what was not taken over has gone
+    files_ = std::move(reading.files);
+    if (isSame) return;
+    for (const auto& [id, owner] : reading.owners) {
+      if (owner.others == 0) continue;
+      std::string& problem = files_[owner.duplicate].problem;
+      problem = FormatText("its EntryID is that of %@", owner.name);
+      if (owner.others > 1) problem += FormatText(", like that of %u in all", owner.others);
     }
-    files_ = std::move(files);
-    dropDuplicates();
     report();
     indexRuns();
   }
 
-  void dropDuplicates() {
-    std::map<std::uint64_t, std::string_view> owners;
-    for (auto& [name, file] : files_) {
-      if (!file.entry) continue;
-      const auto [owner, isFirst] = owners.try_emplace(file.entry->id, name);
-      if (isFirst) continue;
-      file.problem = FormatText("its EntryID is that of %@", owner->second);
-      file.entry.reset();
-      file.text.clear();  // it counts as soon as the other one has gone
+  void readFile(const std::string& name, Reading& reading) {
+    const auto bytes =
+        ReadWholeFile(JoinPath(directory_, name), std::min(reading.room, kMaxPropertyListBytes));
+    if (const int* error = std::get_if<int>(&bytes)) {
+      if (*error == ENOENT) return;  // it has just gone
+      reading.files[name].problem = ErrnoText(*error);
+      reading.isSame = false;
+      return;
+    }
+    const auto& text = std::get<std::string>(bytes);
+    reading.room -= text.size();
+    const auto known = files_.find(name);
+    const bool isKnown = known != files_.end() && known->second.isOf(text);
+    DriverFile file;
+    if (isKnown) {
+      file = std::move(known->second);
+      files_.erase(known);
+      // It was left out for another file's sake, which may have gone.
+      const bool isWanted = file.id && !file.entry && !reading.owners.contains(*file.id) &&
+                            file.footprint <= reading.memory;
+      if (isWanted) file = ReadDescription(text);
+    } else {
+      file = ReadDescription(text);
+      reading.isSame = false;
+    }
+    settle(name, file, reading);
+    reading.files.emplace(name, std::move(file));
+  }
+
+  // Of files with one ID the first counts, and no more is kept than memory allows.
+  static void settle(const std::string& name, DriverFile& file, Reading& reading) {
+    if (!file.id) return;
+    const auto owner = reading.owners.find(*file.id);
+    if (owner != reading.owners.end()) {
+      if (owner->second.others++ == 0) owner->second.duplicate = name;
+      file.drop("");
+    } else if (file.footprint > reading.memory) {
+      file.drop("there is no more room for it");
+    } else {
+      reading.memory -= file.footprint;
+      reading.owners[*file.id].name = name;
     }
   }
 
@@ -311,6 +392,8 @@ class DriverFiles : public EntrySource {
 
   const std::string directory_;
   SystemLog& log_;
+  int directoryError_ = 0;  // that was told of
+  std::string set_;
   std::map<std::string, DriverFile> files_;  // by name
   std::map<std::string, std::string> reported_;
   std::map<std::pair<std::uint64_t, std::uint64_t>, std::span<const std::byte>> runs_;

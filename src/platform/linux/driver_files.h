@@ -24,7 +24,9 @@ namespace quorlet {
 
 // Reads the files on every question for entries and on every refresh. A driver answers from the
 // file as it was when the entry was handed out. A file that cannot be used is left out, with one
-// error line until something else is wrong with it. `log` must outlive the source.
+// error line until something else is wrong with it; so are files beyond 64 MiB of text or of
+// memory. While the directory cannot be read, which has an error line, the entries stay as they
+// were. `log` must outlive the source.
 std::unique_ptr<EntrySource> MakeDriverFiles(const Root& root, SystemLog& log);
 
 }  // namespace quorlet
