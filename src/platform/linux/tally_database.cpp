@@ -77,6 +77,7 @@ std::int64_t LastBlock(std::int64_t sequence) {
 struct FileHeader {
   bool isDatabase = false;
   bool isEmpty = false;
+  bool hasWholePages = false;
   // How it is to be written: with a rollback journal (1) or with a write-ahead log (2).
   unsigned char format = 0;
 };
@@ -91,10 +92,12 @@ FileHeader HeaderOf(SqliteDatabase& database) {
   if (file == nullptr || file->pMethods == nullptr) return {};
   if (file->pMethods->xFileSize(file, &size) != SQLITE_OK) return {};
   if (size == 0) return {.isEmpty = true};
+  const bool hasWholePages = size % static_cast<sqlite3_int64>(kTallyPageSize) == 0;
   if (file->pMethods->xRead(file, bytes, sizeof(bytes), 0) != SQLITE_OK) return {};
   const auto format = static_cast<unsigned char>(bytes[kWriteFormat]);
   const bool isKnown = (format == 1 || format == 2) && bytes[kReadFormat] == bytes[kWriteFormat];
   return {.isDatabase = isKnown && std::string_view(bytes, kMagic.size()) == kMagic,
+          .hasWholePages = hasWholePages,
           .format = format};
 }
 
@@ -205,9 +208,13 @@ int TallyDatabase::openFile(const std::string& path, LockPatience& patience) {
   int on = 1;
   sqlite3_file_control(database_.handle(), "main", SQLITE_FCNTL_PERSIST_WAL, &on);
   sqlite3_db_config(database_.handle(), SQLITE_DBCONFIG_NO_CKPT_ON_CLOSE, 1, nullptr);
-  // With a log beside it SQLite may not even look at the file's own first page.
+  // With a log beside it SQLite may not even look at the file's own first page. That is right where a
+  // power cut tore the page while the log was being copied back: the log still has it.
   const FileHeader header = HeaderOf(database_);
-  return header.isEmpty || header.isDatabase ? SQLITE_OK : SQLITE_NOTADB;
+  if (header.isEmpty || header.isDatabase) return SQLITE_OK;
+  struct stat log {};
+  const bool hasLog = stat((path + kTallySideFiles[0]).c_str(), &log) == 0 && log.st_size > 0;
+  return hasLog && header.hasWholePages ? SQLITE_OK : SQLITE_NOTADB;
 }
 
 int TallyDatabase::setUp(const char* settings) {
@@ -220,7 +227,7 @@ int TallyDatabase::setUp(const char* settings) {
 int TallyDatabase::openForWriting(const std::string& path, LockPatience& patience) {
   int code = openFile(path, patience);
   if (code == SQLITE_OK) code = setUp(kWriterSettings);
-  if (code != SQLITE_OK || isBlank_ || HeaderOf(database_).format == 2) return code;
+  if (code != SQLITE_OK || isBlank_ || HeaderOf(database_).format != 1) return code;
   // A database of an earlier release. While somebody reads it, it stays as it is.
   code = database_.execute(kWriteAheadLog);
   return (code & 0xff) == SQLITE_BUSY ? SQLITE_OK : code;
