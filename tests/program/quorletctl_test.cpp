@@ -429,5 +429,26 @@ TEST_F(QuorletctlTest, WhitelistCheckShowsWhatDoesNotWork) {
   EXPECT_EQ(keys, (Words{"", "ScalarKey", "slip", "text"}));
 }
 
+TEST_F(QuorletctlTest, ConsentIsGivenOnceAndWithdrawnWhole) {
+  const std::string domain = "nuvex.diagwell";
+  run({"prefs", "remove", domain, "SubmissionEnabled"});
+  EXPECT_EQ(run({"consent", "status"}).out + run({"consent", "status"}).err, "off\n");
+  EXPECT_EQ(run({"logs", "submit"}).status, 1);
+  run({"tally", "add", "counted.before", "1"});
+  EXPECT_EQ(run({"consent", "on"}).status, 0);
+  EXPECT_EQ(run({"tally", "dump"}).out, "");
+  run({"tally", "add", "counted.after", "1"});
+  EXPECT_EQ(run({"consent", "on"}).status, 0);
+  EXPECT_NE(run({"tally", "dump"}).out.find("counted.after"), std::string::npos);
+  EXPECT_EQ(run({"consent", "status", "--json"}).out, "{\"consent\":\"on\",\"text\":\"on\"}\n");
+  device.write("/var/mobile/Library/Logs/Diagwell/pending/a.log", "{}\n");
+  EXPECT_EQ(run({"logs", "submit"}).status, 0);
+  EXPECT_TRUE(device.exists("/var/mobile/Library/Logs/Diagwell/outbox/a.log"));
+  EXPECT_EQ(run({"consent", "off"}).status, 0);
+  EXPECT_FALSE(device.exists("/var/mobile/Library/Logs/Diagwell/outbox/a.log"));
+  run({"prefs", "set", domain, "SubmissionEnabled", "1"});
+  EXPECT_EQ(run({"consent", "status"}).status, 1);
+}
+
 }  // namespace
 }  // namespace quorlet

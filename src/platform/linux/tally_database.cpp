@@ -208,8 +208,8 @@ int TallyDatabase::openFile(const std::string& path, LockPatience& patience) {
   int on = 1;
   sqlite3_file_control(database_.handle(), "main", SQLITE_FCNTL_PERSIST_WAL, &on);
   sqlite3_db_config(database_.handle(), SQLITE_DBCONFIG_NO_CKPT_ON_CLOSE, 1, nullptr);
-  // With a log beside it SQLite may not even look at the file's own first page. That is right where a
-  // power cut tore the page while the log was being copied back: the log still has it.
+  // With a log beside it SQLite may not even look at the file's own first page. That is right where
+  // a power cut tore the page while the log was being copied back: the log still has it.
   const FileHeader header = HeaderOf(database_);
   if (header.isEmpty || header.isDatabase) return SQLITE_OK;
   struct stat log {};
