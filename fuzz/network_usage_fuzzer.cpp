@@ -33,9 +33,7 @@ void Compare(const Array& records, const PropertyValue* baseline) {
   if (baseline != nullptr) {
     platform.preferences.DGWPreferencesSetValue(kBaseline, *baseline, kDomain);
   }
-  const auto process = [&] {
-    processDataUsageReply(records, platform.counterStore, platform.preferences, platform.log);
-  };
+  const auto process = [&] { processDataUsageReply(records, platform.services); };
   process();
   const auto scalars = platform.counterStore.scalars;
   Expect(scalars.size() <= records.size() * kMostKeysOfARecord, "too many counters");

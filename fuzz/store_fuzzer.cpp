@@ -21,7 +21,7 @@ struct Process {
   explicit Process(const TempRoot& device, Access access)
       : ledger(MakeTallyLedger(device.root(), access, platform.queries, platform.preferences,
                                platform.log)),
-        store(MakeLinuxCounterStore(*ledger, platform.clock)) {
+        store(MakeLinuxCounterStore(*ledger, platform.clock, platform.log)) {
     platform.clock.goToDay(kDay);
   }
   std::int64_t corruptions() {
