@@ -8,30 +8,12 @@
 #include "fakes/fake_platform.h"
 #include "fakes/temp_root.h"
 #include "platform/linux/services.h"
-#include "platform/sync_recorder.h"
 
 namespace quorlet {
 namespace {
 
 const std::string kDirectory = "/var/mobile/Library/Logs/FaultScribe/";
 const std::string kLog = kDirectory + "structured.jsonl";
-
-using Names = std::vector<std::string>;
-
-TEST(AtomicFileTest, IsSyncedBeforeItsNameAndItsNameAfter) {
-  const TempRoot root;
-  SyncRecorder recorder(root.directory());
-  EXPECT_EQ(WriteWholeFile(root.path("/f"), "x"), 0);
-  EXPECT_EQ(recorder.calls(), (Names{"truncate .f.tmp", "write .f.tmp", "fsync .f.tmp",
-                                     "rename .f.tmp f", "fsync ."}));
-  for (const auto& [call, left] :
-       {std::pair("write", "x"), {"fsync .f", "x"}, {"rename", "x"}, {"fsync .", "y"}}) {
-    recorder.fail(call, call == std::string("fsync .") ? 2 : 1, EIO);
-    EXPECT_EQ(WriteWholeFile(root.path("/f"), "y"), EIO) << call;
-    EXPECT_EQ(root.read("/f"), left) << call;
-    EXPECT_EQ(root.list(""), Names{"f"}) << call;
-  }
-}
 
 class StructuredLogTest : public testing::Test {
  protected:
