@@ -139,8 +139,9 @@ void ReadOnly(const TempRoot& device, const std::string& directory) {
 void ReadAndWrite(const TempRoot& device, const std::string& directory) {
   Process process(device, Access::kReadWrite);
   ReadAll(*process.store, kDay - 2, kDay);
-  const ScalarChange change{ScalarChange::Kind::kAdd, "a.b", 1};
-  const bool written = process.store->writeScalars({&change, 1});
+  StoreChanges changes;
+  changes.scalars.push_back({ScalarChange::Kind::kAdd, "a.b", 1, kDay});
+  const bool written = process.store->write(changes);
   Expect(written || !process.platform.log.errors().empty(), "a failure is not told");
   const std::vector<DistributionSample> samples(100, {2.5, 7});
   static_cast<void>(process.ledger->recordValues("d", kDay, samples));
