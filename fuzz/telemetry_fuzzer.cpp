@@ -48,7 +48,7 @@ void ReadOne(std::uint8_t which, std::span<const std::byte> bytes) {
       break;
     }
     case 2:
-      LogDefectsList(platform.services, bytes);
+      LogDefectsList(platform.services, bytes, bytes.size());
       if (platform.crashSupport.entries.size() > 1 + bytes.size() / 28) std::abort();
       break;
     case 3:

@@ -11,6 +11,7 @@
 #include <cstddef>
 #include <cstdint>
 #include <string>
+#include <vector>
 
 #include "values/byte_reader.h"
 
@@ -20,7 +21,7 @@ namespace {
 constexpr char kParameter[] = "kern.next_ecc_event";
 constexpr std::size_t kRecordSize = 72;
 constexpr std::size_t kRegisters = 8;
-constexpr int kEventsPerPass = 10;
+constexpr std::size_t kEventsPerPass = 10;
 constexpr std::int32_t kStructuredLogType = 172;
 
 using Record = std::array<std::byte, kRecordSize>;
@@ -42,25 +43,28 @@ Dictionary EntryFromRecord(const Record& record) {
 }  // namespace
 
 void logECCEvents(Platform& platform) {
+  KernelParameters& kernel = platform.kernelParameters;
+  // Events that an earlier pass in this process could not log are still there.
+  kernel.returnTaken(kParameter);
+  std::vector<Dictionary> entries;
   std::size_t length = kRecordSize;
-  bool allLogged = true;
-  int logged = 0;
-  for (; allLogged && logged < kEventsPerPass; ++logged) {
+  while (entries.size() < kEventsPerPass) {
     // Zero for each event, so that a short one does not show the registers of the one before.
     Record record{};
     const auto buffer = std::span(record).first(std::min(length, kRecordSize));
-    const int error = platform.kernelParameters.sysctlbyname(kParameter, buffer, length);
+    const int error = kernel.sysctlbyname(kParameter, buffer, length);
     if (error == ENOENT || error == EBUSY) break;
     if (error != 0) {
       platform.log.log("Unexpected errno (%d) reading ECC events from kernel", error);
       break;
     }
-    allLogged =
-        platform.crashSupport.FSLogStructuredData(kStructuredLogType, EntryFromRecord(record));
+    entries.push_back(EntryFromRecord(record));
   }
-  // Only what is durable leaves the queue: killed before, an event is logged twice, but never lost.
-  if (logged > 0 && allLogged && platform.crashSupport.syncStructuredData()) {
-    platform.kernelParameters.removeTaken(kParameter);
+  if (entries.empty()) return;
+  // Removed once they are durable: a kill between the two logs them twice, but loses none.
+  CrashSupport& support = platform.crashSupport;
+  if (support.logEntries(kStructuredLogType, entries) && support.syncStructuredData()) {
+    kernel.removeTaken(kParameter);
   }
 }
 

@@ -6,9 +6,10 @@
 
 namespace quorlet {
 
-// Takes up to 10 pending events off the queue and writes each as an entry of type 172 to the
-// structured log; the rest waits for the next pass. One line in the system
-// log when reading fails otherwise than for want of an event.
+// Writes up to 10 pending events as entries of type 172 to the structured log and, once these are
+// durable, takes them off the queue; the rest waits for the next pass, as do all of them when the
+// log cannot be written. One line in the system log when reading fails otherwise than for want of
+// an event.
 void logECCEvents(Platform& platform);
 
 }  // namespace quorlet

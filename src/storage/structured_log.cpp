@@ -109,7 +109,8 @@ void DecideOnValidityList(Platform& platform, StorageLogState& state) {
 struct List {
   StorageExporter::SelectorGetter getSelectors = nullptr;
   std::uint8_t index = 0;
-  std::function<bool(std::span<const std::byte>)> handler;
+  // `written`: how many bytes of the buffer the driver filled; the others are zero.
+  std::function<bool(std::span<const std::byte> buffer, std::size_t written)> handler;
 };
 
 constexpr std::uint8_t kTelemetryLists = 3;
@@ -119,25 +120,27 @@ std::vector<List> ListsOf(Platform& platform, const StorageLogState& state,
                           const StorageExporter& row, const PropertyValue& characteristics) {
   std::vector<List> lists;
   if (row.getBandStatsSelectors != nullptr) {
-    lists.push_back({row.getBandStatsSelectors, 0, [&](std::span<const std::byte> buffer) {
-                       return LogValidityList(platform, state, buffer);
-                     }});
+    lists.push_back(
+        {row.getBandStatsSelectors, 0, [&](std::span<const std::byte> buffer, std::size_t) {
+           return LogValidityList(platform, state, buffer);
+         }});
   } else {
     platform.standardError.write("Validity list retrieval is not supported\n");
   }
   if (row.getTelemetryListSelectors != nullptr) {
     for (std::uint8_t index = 0; index < kTelemetryLists; ++index) {
-      lists.push_back(
-          {row.getTelemetryListSelectors, index, [&](std::span<const std::byte> buffer) {
-             return LogTelemetryList(platform, buffer, characteristics);
-           }});
+      lists.push_back({row.getTelemetryListSelectors, index,
+                       [&](std::span<const std::byte> buffer, std::size_t) {
+                         return LogTelemetryList(platform, buffer, characteristics);
+                       }});
     }
   } else {
     platform.standardError.write("Telemetry list retrieval is not supported\n");
   }
   if (row.getDefectsListSelectors != nullptr) {
-    lists.push_back({row.getDefectsListSelectors, 0, [&](std::span<const std::byte> buffer) {
-                       return LogDefectsList(platform, buffer);
+    lists.push_back({row.getDefectsListSelectors, 0,
+                     [&](std::span<const std::byte> buffer, std::size_t written) {
+                       return LogDefectsList(platform, buffer, written);
                      }});
   } else {
     platform.standardError.write("Defects list retrieval is not supported\n");
@@ -170,8 +173,7 @@ bool CollectList(StandardError& errors, ExporterConnection& exporter, const List
         FormatText("Could not retrieve data from driver for selector %u\n", selectors->fetch));
     return true;
   }
-  // All of it: what the driver has not written is zero.
-  return list.handler(buffer->bytes());
+  return list.handler(buffer->bytes(), written);
 }
 
 bool CollectLists(Platform& platform, const StorageLogState& state, bool requestFlag) {
@@ -266,8 +268,10 @@ bool LogValidityList(Platform& platform, const StorageLogState& state,
   return true;
 }
 
-bool LogDefectsList(Platform& platform, std::span<const std::byte> buffer) {
+bool LogDefectsList(Platform& platform, std::span<const std::byte> buffer, std::size_t written) {
+  constexpr std::size_t kHeaderSize = 12;
   constexpr std::size_t kRecordSize = 28;
+  constexpr std::size_t kMostRecords = 16384;  // many times what a drive that still works has
   StandardError& errors = platform.standardError;
   ByteReader reader(buffer);
   reader.skip(4);
@@ -278,13 +282,17 @@ bool LogDefectsList(Platform& platform, std::span<const std::byte> buffer) {
   }
   // 0 when the list ends before it.
   const std::size_t claimed = reader.little<std::uint32_t>();
-  Dictionary factory;
-  SetNumberValue(errors, factory, "Factory Count", factoryCount);
-  platform.crashSupport.FSLogStructuredData(kStructuredLogType, factory);
-  const std::size_t records = std::min(claimed, reader.remaining() / kRecordSize);
-  for (std::size_t i = 0; i < records; ++i) {
-    platform.crashSupport.FSLogStructuredData(kStructuredLogType, DefectEntry(errors, reader));
+  const std::size_t filled = std::min(written, buffer.size());
+  const std::size_t present =
+      std::min(claimed, (std::max(filled, kHeaderSize) - kHeaderSize) / kRecordSize);
+  const std::size_t logged = std::min(present, kMostRecords);
+  if (logged < present) {
+    platform.log.error("The driver lists %u defects; the first %u are logged", present, logged);
   }
+  std::vector<Dictionary> entries(1);
+  SetNumberValue(errors, entries.front(), "Factory Count", factoryCount);
+  for (std::size_t i = 0; i < logged; ++i) entries.push_back(DefectEntry(errors, reader));
+  platform.crashSupport.logEntries(kStructuredLogType, entries);
   return true;
 }
 

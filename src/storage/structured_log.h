@@ -36,8 +36,10 @@ bool LogValidityList(Platform& platform, const StorageLogState& state,
                      std::span<const std::byte> buffer);
 
 // The defects list: one record with the factory count, then one for each defect that lies within
-// the buffer. False, with a message, when the buffer is too short for its header.
-bool LogDefectsList(Platform& platform, std::span<const std::byte> buffer);
+// the first `written` bytes of the buffer, which are those that the driver filled, logged in one
+// go; an error line tells of defects beyond the first 16,384. False, with a message, when the
+// buffer is too short for its header.
+bool LogDefectsList(Platform& platform, std::span<const std::byte> buffer, std::size_t written);
 
 }  // namespace quorlet
 

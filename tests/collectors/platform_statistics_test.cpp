@@ -65,5 +65,17 @@ TEST(EccEventsTest, PendingEventsBecomeStructuredEntries) {
   }
 }
 
+TEST(EccEventsTest, StayQueuedUntilTheyAreLogged) {
+  FakePlatform device;
+  device.kernelParameters.queues[kEvents] = {Event(1), Event(2)};
+  for (const bool isFull : {true, false}) {
+    device.crashSupport.isFull = isFull;
+    collectPlatformStatistics(device.services);
+    EXPECT_EQ(device.kernelParameters.queues[kEvents].size(), isFull ? 2u : 0u);
+  }
+  ASSERT_EQ(device.crashSupport.entries.size(), 2u);
+  EXPECT_EQ(PropertyValue(device.crashSupport.entries[0].second), Entry(1));
+}
+
 }  // namespace
 }  // namespace quorlet

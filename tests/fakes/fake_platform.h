@@ -80,10 +80,11 @@ class FakeDiagnostics : public Diagnostics {
 
 class FakeCrashSupport : public CrashSupport {
  public:
-  bool FSLogStructuredData(std::int32_t type, const Dictionary& entry) override {
-    if (isFull) return false;
-    (isStaging ? staged : entries).emplace_back(type, entry.deepCopy());
-    return true;
+  bool logEntries(std::int32_t type, std::span<const Dictionary> list) override {
+    for (const Dictionary& entry : list) {
+      if (!isFull) (isStaging ? staged : entries).emplace_back(type, entry.deepCopy());
+    }
+    return !isFull;
   }
   bool stageEntries() override {
     staged.clear();
@@ -95,7 +96,7 @@ class FakeCrashSupport : public CrashSupport {
     isStaging = false;
     return true;
   }
-  bool syncStructuredData() override { return !isFull; }
+  bool syncStructuredData() override { return !isFull && !isStaging; }
   void FSDumpAllOldStructuredDataLogs() override { ++dumps; }
   void rollCarewellLogs() override { ++rolls; }
   std::string GetSysIDWithDescription() override { return "system-1"; }
@@ -162,27 +163,27 @@ class FakeKernelParameters : public KernelParameters {
                    std::size_t& length) override {
     asked.emplace_back(name);
     const auto queue = queues.find(name);
-    if (queue != queues.end()) {
-      std::size_t& handedOut = taken[std::string(name)];
-      if (handedOut < queue->second.size()) {
-        const int error = copyOut(queue->second[handedOut], buffer, length);
-        if (error == 0) ++handedOut;
-        return error;
-      }
+    std::size_t& next = taken[std::string(name)];
+    if (queue != queues.end() && next < queue->second.size()) {
+      const int error = copyOut(queue->second[next], buffer, length);
+      if (error == 0) ++next;
+      return error;
     }
     const auto found = values.find(name);
     return found != values.end() ? copyOut(found->second, buffer, length) : missing;
   }
-  std::map<std::string, std::string, std::less<>> values;
   bool removeTaken(std::string_view name) override {
     auto& queue = queues[std::string(name)];
-    const std::size_t count = std::exchange(taken[std::string(name)], 0);
-    queue.erase(queue.begin(), queue.begin() + static_cast<std::ptrdiff_t>(count));
+    const auto count = static_cast<std::ptrdiff_t>(std::exchange(taken[std::string(name)], 0));
+    queue.erase(queue.begin(), queue.begin() + count);
     return true;
   }
+  void returnTaken(std::string_view name) override { taken[std::string(name)] = 0; }
+
+  std::map<std::string, std::string, std::less<>> values;
   std::map<std::string, std::deque<std::string>, std::less<>> queues;
-  std::map<std::string, std::size_t, std::less<>> taken;  // how many reads have handed out
-  int missing = ENOENT;                                   // what a read of anything else fails with
+  std::map<std::string, std::size_t> taken;  // how many of a queue were handed out
+  int missing = ENOENT;                      // what a read of anything else fails with
   std::vector<std::string> asked;
 
  private:

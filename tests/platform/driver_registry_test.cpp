@@ -229,7 +229,7 @@ TEST(DriverFiles, ABadFileCostsOnlyItselfAndOneLine) {
   EXPECT_EQ(device.log.errors().size(), 5u) << "a, c, d, e and f, once each";
   EXPECT_EQ(device.log.errors()[1],
             "Skipped the driver file " + device.root.path(directory) +
-                "c.plist: its EntryID is that of b.plist, like that of 2 in all");
+                "c.plist: its EntryID is that of b.plist, as with 2 in all");
   std::filesystem::remove(device.root.path(directory) + "b.plist");
   EXPECT_NE(device.registry->FindServiceByClass("Good"), 0u) << "c.plist has taken its place";
 

@@ -119,7 +119,7 @@ TEST_F(LinuxPreferencesTest, WhatCannotBeReadIsNeitherEmptyNorReplaced) {
   preferences = machine.startProcess();
   rlimit before{};
   getrlimit(RLIMIT_NOFILE, &before);
-  const rlimit none{3, before.rlim_max};
+  const rlimit none{0, before.rlim_max};
   setrlimit(RLIMIT_NOFILE, &none);
   const bool readable = preferences->isReadable("d");
   preferences->DGWPreferencesSetValue("x", Int64(1), "d");

@@ -113,6 +113,7 @@ TEST(StructuredLog, Failures) {
       {[](auto& d) { d.exports[15 << 10] = ""; }, true, "", 3},
       {[](auto& d) { d.exports[17 << 10].pop_back(); }, false, "bounds of the buffer\n", 4},
       {[](auto& d) { d.size = ~0U; }, false, "Could not malloc 4294967295 bytes", 0},
+      {[](auto& d) { d.exports[15 << 10] = kDefects.substr(0, 12); d.size = 4128; }, true, "", 4},
   };
   // clang-format on
   for (const auto& [setUp, result, message, entries] : cases) {
@@ -139,11 +140,19 @@ TEST(StructuredLog, DamagedLists) {
     EXPECT_FALSE(LogValidityList(device.services, device.state, Bytes(list))) << list.size();
     EXPECT_EQ(device.standardError.text, "data cannot be parsed");
   }
+  Device claiming;  // 2^32 - 1 defects in 3 MB, of which it writes 12 bytes
+  const std::string claim = Words({0, 1, ~0U}) + std::string(3'000'000, '\0');
+  EXPECT_TRUE(LogDefectsList(claiming.services, Bytes(claim), 12));
+  EXPECT_EQ(claiming.crashSupport.entries.size(), 1u);
+  EXPECT_TRUE(LogDefectsList(claiming.services, Bytes(claim), claim.size()));
+  EXPECT_EQ(claiming.crashSupport.entries.size(), 1u + 16385);
+  EXPECT_EQ(claiming.log.errors().size(), 1u);
   std::string defects = kDefects + kDefects.substr(12);
   defects[11] = '\x7F';  // claims far more records than there are
   for (std::size_t length = 0; length <= defects.size(); ++length) {
     Device device;
-    EXPECT_EQ(LogDefectsList(device.services, Bytes(defects.substr(0, length))), length >= 8);
+    EXPECT_EQ(LogDefectsList(device.services, Bytes(defects.substr(0, length)), length),
+              length >= 8);
     EXPECT_EQ(device.crashSupport.entries.size(), length < 8    ? 0
                                                   : length < 12 ? 1
                                                                 : 1 + (length - 12) / 28);

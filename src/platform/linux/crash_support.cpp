@@ -8,6 +8,8 @@
 #include <cerrno>
 #include <cstdio>
 #include <span>
+#include <variant>
+#include <vector>
 
 #include "platform/linux/descriptor.h"
 #include "platform/linux/property_json.h"
@@ -24,6 +26,7 @@ constexpr char kMachineId[] = "/etc/machine-id";
 constexpr char kProductName[] = "/sys/devices/virtual/dmi/id/product_name";
 constexpr char kUnknown[] = "unknown";
 constexpr int kOldestLog = 5;
+constexpr std::int32_t kEccEvent = 172;  // has a share of the structured log of its own
 constexpr std::size_t kMaxTextBytes = 4096;
 
 // Only the owner of a log writes it; a link is not followed to somebody else's file.
@@ -80,38 +83,43 @@ class LinuxCrashSupport : public CrashSupport {
         osVersion_(osVersion),
         log_(log) {}
 
-  bool FSLogStructuredData(std::int32_t type, const Dictionary& entry) override {
-    if (access_ == Access::kReadOnly) return false;
-    const nlohmann::ordered_json line = {
-        {"type", type}, {"time", Rfc3339(clock_.now())}, {"data", PropertyJson(entry)}};
-    const std::string text = JsonLine(line);
-    const int error = isStaging_ ? structuredLog_.stageLine(text) : structuredLog_.append(text);
-    if (error != 0) {
-      log_.error("Cannot add an entry of type %d to %@: %@", type, structuredLog_.path(),
-                 ErrnoText(error));
+  bool logEntries(std::int32_t type, std::span<const Dictionary> entries) override {
+    if (access_ == Access::kReadOnly || entries.empty()) return entries.empty();
+    const std::string time = Rfc3339(clock_.now());
+    std::string lines;
+    for (const Dictionary& entry : entries) {
+      if (!lines.empty()) lines += '\n';
+      lines += JsonLine({{"type", type}, {"time", time}, {"data", PropertyJson(entry)}});
     }
-    return error == 0;
+    const auto share =
+        type == kEccEvent ? StructuredLog::Share::kReserved : StructuredLog::Share::kCommon;
+    return succeeds(isStaging_ ? structuredLog_.stage(lines) : structuredLog_.append(lines, share),
+                    "Cannot add entries to");
+  }
+
+  bool syncStructuredData() override {
+    if (access_ == Access::kReadOnly) return false;
+    return succeeds(isStaging_ ? EBUSY : structuredLog_.sync(), "Cannot sync");
   }
 
   bool stageEntries() override {
-    isStaging_ = access_ == Access::kReadWrite && succeeds(structuredLog_.beginStaging());
+    isStaging_ = access_ == Access::kReadWrite &&
+                 succeeds(structuredLog_.beginStaging(clock_.now()), "Cannot stage entries for");
     return isStaging_;
   }
 
   bool publishStagedEntries() override {
     isStaging_ = false;
-    return access_ == Access::kReadOnly || succeeds(structuredLog_.publishStaged());
-  }
-
-  bool syncStructuredData() override {
-    return access_ == Access::kReadOnly || succeeds(structuredLog_.sync());
+    return access_ == Access::kReadOnly ||
+           succeeds(structuredLog_.publish(clock_.now()), "Cannot add the staged entries to");
   }
 
   void FSDumpAllOldStructuredDataLogs() override {
     if (access_ == Access::kReadOnly) return;
-    if (const int error = structuredLog_.moveOldLines(clock_.now())) {
-      log_.error("Cannot move the old lines of %@: %@", structuredLog_.path(), ErrnoText(error));
-    }
+    const Date now = clock_.now();
+    const bool isMoved = succeeds(structuredLog_.moveOldLines(now), "Cannot move the old lines of");
+    if (isMoved) succeeds(structuredLog_.dropOldDays(now), "Cannot drop old days of");
+    isFullTold_ = false;  // the pass's use of the log ends here
   }
 
   void rollCarewellLogs() override {
@@ -157,8 +165,17 @@ class LinuxCrashSupport : public CrashSupport {
   }
 
  private:
-  bool succeeds(int error) {
-    if (error != 0) log_.error("Cannot write %@: %@", structuredLog_.path(), ErrnoText(error));
+  // Tells of an error; that the log is full, once a pass.
+  bool succeeds(int error, std::string_view failure) {
+    if (error == StructuredLog::kLogIsFull) {
+      if (!isFullTold_) {
+        log_.error("%@ is full (%u MiB with its older days): entries are left out",
+                   structuredLog_.path(), StructuredLog::kMostBytes >> 20);
+      }
+      isFullTold_ = true;
+    } else if (error != 0) {
+      log_.error("%@ %@: %@", failure, structuredLog_.path(), ErrnoText(error));
+    }
     return error == 0;
   }
 
@@ -170,6 +187,7 @@ class LinuxCrashSupport : public CrashSupport {
   OSVersion& osVersion_;
   SystemLog& log_;
   bool isStaging_ = false;
+  bool isFullTold_ = false;
 };
 
 }  // namespace

@@ -269,6 +269,8 @@ class DriverFiles : public EntrySource {
     bool isSame = true;  // as what was read before
     std::size_t room = kMaxBytes;
     std::size_t memory = kMaxMemory;
+    std::size_t beyondMemory = 0;  // files that are
+    std::string firstBeyondMemory;
   };
 
   // Nothing, after an error line, when the directory cannot be read.
@@ -311,7 +313,11 @@ class DriverFiles : public EntrySource {
       if (owner.others == 0) continue;
       std::string& problem = files_[owner.duplicate].problem;
       problem = FormatText("its EntryID is that of %@", owner.name);
-      if (owner.others > 1) problem += FormatText(", like that of %u in all", owner.others);
+      if (owner.others > 1) problem += FormatText(", as with %u in all", owner.others);
+    }
+    if (reading.beyondMemory > 0) {
+      files_[reading.firstBeyondMemory].problem =
+          FormatText("there is no room for so many, %u in all", reading.beyondMemory);
     }
     report();
     indexRuns();
@@ -354,7 +360,8 @@ class DriverFiles : public EntrySource {
       if (owner->second.others++ == 0) owner->second.duplicate = name;
       file.drop("");
     } else if (file.footprint > reading.memory) {
-      file.drop("there is no more room for it");
+      if (reading.beyondMemory++ == 0) reading.firstBeyondMemory = name;
+      file.drop("");
     } else {
       reading.memory -= file.footprint;
       reading.owners[*file.id].name = name;

@@ -8,9 +8,12 @@
 #include <charconv>
 #include <cstdint>
 #include <cstring>
+#include <functional>
 #include <limits>
 #include <map>
 #include <optional>
+#include <string>
+#include <utility>
 #include <variant>
 #include <vector>
 
@@ -66,6 +69,31 @@ int ReadInto(const std::string& path, std::span<std::byte> buffer, std::size_t& 
   return CopyOut(text.data(), text.size(), buffer, length);
 }
 
+// A file of a queue, as it was when it was handed out.
+struct TakenFile {
+  std::string name;
+  dev_t device = 0;
+  ino_t inode = 0;
+  timespec changed = {};
+
+  TakenFile(std::string fileName, const struct stat& status)
+      : name(std::move(fileName)),
+        device(status.st_dev),
+        inode(status.st_ino),
+        changed(status.st_ctim) {}
+  bool isThe(const struct stat& status) const {
+    return device == status.st_dev && inode == status.st_ino &&
+           changed.tv_sec == status.st_ctim.tv_sec && changed.tv_nsec == status.st_ctim.tv_nsec;
+  }
+};
+
+using Names = std::vector<std::string>;
+
+// Whether the name is that of a refused file.
+bool IsRefused(const std::string& name) {
+  return name.starts_with('.') && name.find(".refused") != std::string::npos;
+}
+
 class LinuxKernelParameters : public KernelParameters {
  public:
   LinuxKernelParameters(const Root& root, Access access, SystemLog& log)
@@ -79,60 +107,105 @@ class LinuxKernelParameters : public KernelParameters {
     }
     const std::string path = root_.path(kDirectory) + std::string(name);
     const int error = ReadInto(path, buffer, length);
-    if (error == EISDIR) return takeFromQueue(path, buffer, length);
+    if (error == EISDIR) return takeFromQueue(name, path, buffer, length);
     if (error == ENOENT && name == "vm.swapusage") return readSwapUsage(buffer, length);
     return error;
   }
 
   bool removeTaken(std::string_view name) override {
+    const auto found = taken_.find(name);
+    if (found == taken_.end()) return true;
     const std::string directory = root_.path(kDirectory) + std::string(name);
-    const auto found = taken_.find(directory);
-    if (found == taken_.end() || access_ == Access::kReadOnly) return true;
-    bool allRemoved = true;
-    std::erase_if(found->second, [&](const std::string& path) {
-      if (unlink(path.c_str()) == 0 || errno == ENOENT) return true;
+    std::erase_if(found->second, [&](const TakenFile& file) {
+      const std::string path = JoinPath(directory, file.name);
+      struct stat status = {};
+      // Another file may have the name by now.
+      const bool isThere = lstat(path.c_str(), &status) == 0 && file.isThe(status);
+      if (access_ == Access::kReadOnly || !isThere || unlink(path.c_str()) == 0) return true;
       log_.error("Cannot remove %@: %@", path, ErrnoText(errno));
-      allRemoved = false;
       return false;
     });
-    return allRemoved;
+    return found->second.empty();
+  }
+
+  void returnTaken(std::string_view name) override {
+    const auto found = taken_.find(name);
+    if (found != taken_.end()) taken_.erase(found);
   }
 
  private:
-  // Hands out the first file that was not handed out before; it is removed later. One that is
-  // larger than any event is moved out of the way, or it would stand before the others for ever.
-  int takeFromQueue(const std::string& directory, std::span<std::byte> buffer,
-                    std::size_t& length) {
+  // Hands out the first file that was not handed out yet.
+  int takeFromQueue(std::string_view queue, const std::string& directory,
+                    std::span<std::byte> buffer, std::size_t& length) {
+    // What cannot be removed later would be handed out by every pass.
+    if (access_ == Access::kReadWrite &&
+        faccessat(AT_FDCWD, directory.c_str(), W_OK | X_OK, AT_EACCESS) != 0) {
+      return errno;
+    }
     const auto names = ReadDirectory(directory);
     if (const int* error = std::get_if<int>(&names)) return *error;
-    std::vector<std::string>& taken = taken_[directory];
-    for (const std::string& name : std::get<std::vector<std::string>>(names)) {
+    std::vector<TakenFile>& taken = taken_[std::string(queue)];
+    for (const std::string& name : std::get<Names>(names)) {
+      // Hidden names are files that their writer has not finished, and refused ones.
+      if (name.starts_with('.') || std::ranges::find(taken, name, &TakenFile::name) != taken.end())
+        continue;
+      Descriptor file;
       struct stat status = {};
       const std::string path = JoinPath(directory, name);
-      // Hidden names are files that their writer has not finished.
-      if (name.starts_with('.') || std::ranges::find(taken, path) != taken.end()) continue;
-      if (lstat(path.c_str(), &status) != 0 || !S_ISREG(status.st_mode)) continue;
-      const int error = ReadInto(path, buffer, length);
-      if (error == 0) taken.push_back(path);
-      if (error == ENOMEM && status.st_size > kLargestEvent) refuse(directory, name);
+      int error = OpenRegularFile(path, O_RDONLY | O_NOFOLLOW, file, status);
+      const bool isNoFile = error == ELOOP || error == EISDIR || error == EINVAL || error == ENXIO;
+      if (isNoFile || error == ENOENT) continue;  // or it has just gone
+      if (error == 0) error = readEvent(file, status.st_size, buffer, length);
+      if (error == 0) taken.emplace_back(name, status);
+      if (error == ENOMEM && status.st_size > kLargestEvent) {
+        refuse(directory, name, std::get<Names>(names));
+      }
       return error;
     }
     return ENOENT;
   }
 
-  void refuse(const std::string& directory, const std::string& name) {
+  static int readEvent(const Descriptor& file, off_t size, std::span<std::byte> buffer,
+                       std::size_t& length) {
+    if (static_cast<std::size_t>(size) > buffer.size()) return ENOMEM;
+    std::size_t filled = 0;
+    while (filled < static_cast<std::size_t>(size)) {
+      const auto rest = buffer.subspan(filled, static_cast<std::size_t>(size) - filled);
+      const ssize_t count =
+          Uninterrupted([&] { return ::read(file.get(), rest.data(), rest.size()); });
+      if (count < 0) return errno;
+      if (count == 0) break;
+      filled += static_cast<std::size_t>(count);
+    }
+    length = filled;
+    return 0;
+  }
+
+  // Moves a file that is no event out of the others' way, or it would stand before them for ever.
+  // Beside many that were refused before, it goes for good.
+  void refuse(const std::string& directory, const std::string& name, const Names& present) {
     if (access_ == Access::kReadOnly) return;
+    constexpr std::ptrdiff_t kMostRefused = 16;
+    constexpr std::size_t kMostNameBytes = 200;
     const std::string path = JoinPath(directory, name);
-    const std::string aside = JoinPath(directory, "." + name + ".refused");
-    const int error = rename(path.c_str(), aside.c_str()) == 0 ? 0 : errno;
-    log_.error("The event %@ is larger than any; %@", path,
-               error == 0 ? "it was moved aside" : "it cannot be moved aside: " + ErrnoText(error));
+    std::string free = "." + name.substr(0, kMostNameBytes) + ".refused";
+    const std::string stem = free + ".";
+    for (int number = 2; std::ranges::find(present, free) != present.end(); ++number) {
+      free = stem + std::to_string(number);
+    }
+    const bool isRoom = std::ranges::count_if(present, IsRefused) < kMostRefused;
+    const int failed =
+        isRoom ? rename(path.c_str(), JoinPath(directory, free).c_str()) : unlink(path.c_str());
+    log_.error("%@ is larger than any event; %@", path,
+               failed != 0 ? "it stays in the way: " + ErrnoText(errno)
+               : isRoom    ? "it is now " + free
+                           : "it was removed, as others were kept before");
   }
 
   int readSwapUsage(std::span<std::byte> buffer, std::size_t& length) const {
     const auto bytes = ReadWholeFile(root_.kernelPath("/proc/meminfo"), kMaxMemoryInfoBytes);
-    const auto* text = std::get_if<std::string>(&bytes);
-    if (text == nullptr) return ENOENT;
+    if (const int* error = std::get_if<int>(&bytes)) return *error;
+    const std::string* text = std::get_if<std::string>(&bytes);
     const auto total = MemoryInfoBytes(*text, "SwapTotal:");
     const auto available = MemoryInfoBytes(*text, "SwapFree:");
     if (!total || !available) return ENOENT;
@@ -146,7 +219,7 @@ class LinuxKernelParameters : public KernelParameters {
   const Root root_;
   const Access access_;
   SystemLog& log_;
-  std::map<std::string, std::vector<std::string>, std::less<>> taken_;  // by queue
+  std::map<std::string, std::vector<TakenFile>, std::less<>> taken_;  // by queue
 };
 
 }  // namespace
