@@ -1,7 +1,5 @@
 #include "ctl/json_value.h"
 
-#include <openssl/evp.h>
-
 #include <chrono>
 #include <nlohmann/json.hpp>
 #include <optional>
@@ -10,6 +8,7 @@
 
 #include "ctl/options.h"
 #include "platform/linux/property_json.h"
+#include "values/base64.h"
 #include "values/property_list.h"
 #include "values/text.h"
 
@@ -21,18 +20,11 @@ using Json = nlohmann::ordered_json;
 constexpr char kDataTag[] = "$data";
 constexpr char kDateTag[] = "$date";
 
+// The one text for these bytes, nothing else.
 std::optional<Data> ParseBase64(const std::string& text) {
-  if (text.size() > kMaxPropertyListBytes || text.size() % 4 != 0) return std::nullopt;
-  Data data(text.size() / 4 * 3);
-  const int length = EVP_DecodeBlock(reinterpret_cast<unsigned char*>(data.data()),
-                                     reinterpret_cast<const unsigned char*>(text.data()),
-                                     static_cast<int>(text.size()));
-  if (length < 0 || static_cast<std::size_t>(length) != data.size()) return std::nullopt;
-  const std::size_t padding = text.ends_with("==") ? 2 : text.ends_with("=") ? 1 : 0;
-  data.resize(data.size() - padding);
-  // The decoder is lenient; what it took must be the one text for these bytes.
-  if (PropertyJson(data) != text) return std::nullopt;
-  return data;
+  if (text.size() > kMaxPropertyListBytes) return std::nullopt;
+  auto data = DataFromBase64(text);
+  return data && Base64Text(*data) == text ? data : std::nullopt;
 }
 
 // "2026-03-04T05:06:07Z", nothing else.

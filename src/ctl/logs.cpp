@@ -190,7 +190,7 @@ void Show(Session& session, const LogsArguments& arguments) {
   const std::size_t lineBreak = log.find('\n');
   const std::string_view body =
       lineBreak == std::string::npos ? "" : std::string_view(log).substr(lineBreak + 1);
-  const auto document = ReadPropertyList(body);
+  const auto document = ReadPropertyList(body, kLogLimits);
   const auto* value = std::get_if<PropertyValue>(&document);
   const Dictionary both{{"header", *header},
                         {"body", value != nullptr ? *value : PropertyValue(body)}};

@@ -78,7 +78,7 @@ void Preview(Session& session, const PreviewArguments& arguments) {
   if (!diagnostics.body()) throw Failure(NothingToReport(day, session.messages));
 
   if (arguments.json) {
-    const auto document = ReadPropertyList(*diagnostics.body());
+    const auto document = ReadPropertyList(*diagnostics.body(), kLogLimits);
     if (const auto* error = std::get_if<PropertyListError>(&document)) {
       throw Failure("the document cannot be read back: " + error->description);
     }

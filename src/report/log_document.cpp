@@ -48,12 +48,12 @@ bool TLReport::serializeWithDateAndAppInfo(std::int32_t yesterday,
   const std::string digest = _config ? _config->configFileDigest() : std::string();
   _config.reset();
 
-  auto document = WriteXmlPropertyList(assembleDocument(yesterday, digest, appInfo));
+  auto document = WriteXmlPropertyList(assembleDocument(yesterday, digest, appInfo), kLogLimits);
   if (std::holds_alternative<PropertyListError>(document) && appInfo) {
     // What a peer sent must not cost the day's counters.
     _platform.log.error("Leaving the app info out of the aggregated log: %@",
                         std::get<PropertyListError>(document).description);
-    document = WriteXmlPropertyList(assembleDocument(yesterday, digest, std::nullopt));
+    document = WriteXmlPropertyList(assembleDocument(yesterday, digest, std::nullopt), kLogLimits);
   }
   if (const auto* error = std::get_if<PropertyListError>(&document)) {
     _platform.log.error("Could not create aggregated plist: %@", error->description);

@@ -1,43 +1,46 @@
 #include "values/digest.h"
 
-#include <openssl/crypto.h>
-#include <openssl/evp.h>
+#include <nettle/md5.h>
+#include <nettle/sha1.h>
+#include <nettle/sha2.h>
 
 #include <array>
+#include <cstdint>
+#include <span>
 
 namespace quorlet {
 namespace {
 
-const EVP_MD* Algorithm(DigestKind kind) {
-  switch (kind) {
-    case DigestKind::kMd5:
-      return EVP_md5();
-    case DigestKind::kSha1:
-      return EVP_sha1();
-    case DigestKind::kSha256:
-      return EVP_sha256();
+template <std::size_t Size, typename Context>
+std::string Hex(std::string_view bytes, void (*init)(Context*),
+                void (*update)(Context*, std::size_t, const std::uint8_t*),
+                void (*finish)(Context*, std::size_t, std::uint8_t*)) {
+  Context context;
+  std::array<std::uint8_t, Size> digest{};
+  init(&context);
+  update(&context, bytes.size(), reinterpret_cast<const std::uint8_t*>(bytes.data()));
+  finish(&context, digest.size(), digest.data());
+  constexpr std::string_view kDigits = "0123456789abcdef";
+  std::string text;
+  for (const std::uint8_t byte : digest) {
+    text += kDigits[byte >> 4];
+    text += kDigits[byte & 15];
   }
-  return nullptr;
+  return text;
 }
 
 }  // namespace
 
 std::string HexDigest(DigestKind kind, std::string_view bytes) {
-  // The machine's OpenSSL configuration may forbid MD5; here it only names a file's version.
-  OPENSSL_init_crypto(OPENSSL_INIT_NO_LOAD_CONFIG, nullptr);
-  std::array<unsigned char, EVP_MAX_MD_SIZE> digest{};
-  unsigned int length = 0;
-  if (EVP_Digest(bytes.data(), bytes.size(), digest.data(), &length, Algorithm(kind), nullptr) !=
-      1) {
-    return {};
+  switch (kind) {
+    case DigestKind::kMd5:
+      return Hex<MD5_DIGEST_SIZE>(bytes, md5_init, md5_update, md5_digest);
+    case DigestKind::kSha1:
+      return Hex<SHA1_DIGEST_SIZE>(bytes, sha1_init, sha1_update, sha1_digest);
+    case DigestKind::kSha256:
+      return Hex<SHA256_DIGEST_SIZE>(bytes, sha256_init, sha256_update, sha256_digest);
   }
-  constexpr std::string_view kDigits = "0123456789abcdef";
-  std::string text;
-  for (unsigned int i = 0; i < length; ++i) {
-    text += kDigits[digest[i] >> 4];
-    text += kDigits[digest[i] & 15];
-  }
-  return text;
+  return {};
 }
 
 }  // namespace quorlet

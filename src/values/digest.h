@@ -10,7 +10,7 @@ namespace quorlet {
 // MD5 and SHA-1 name versions and devices here; neither guards anything.
 enum class DigestKind { kMd5, kSha1, kSha256 };
 
-// The digest of `bytes` in lower-case hexadecimal; empty when the machine's library lacks the kind.
+// The digest of `bytes` in lower-case hexadecimal.
 std::string HexDigest(DigestKind kind, std::string_view bytes);
 
 }  // namespace quorlet

@@ -9,12 +9,12 @@
 #include <limits>
 #include <utility>
 
+#include "values/base64.h"
 #include "values/text.h"
 
 namespace quorlet {
 namespace {
 
-bool IsBlank(char c) { return kXmlBlanks.find(c) != std::string_view::npos; }
 bool IsBetween(char c, char first, char last) { return c >= first && c <= last; }
 bool IsDigit(char c) { return IsBetween(c, '0', '9'); }
 
@@ -34,29 +34,9 @@ bool IsXmlCharacter(std::uint32_t c) {
          (c >= 0xE000 && c < 0xFFFE) || (c >= 0x10000 && c <= 0x10FFFF);
 }
 
-void AppendUtf8(std::string& out, std::uint32_t c) {
-  const auto put = [&out](std::uint32_t byte) { out += static_cast<char>(byte); };
-  if (c < 0x80) {
-    put(c);
-    return;
-  }
-  const unsigned more = c < 0x800 ? 1 : c < 0x10000 ? 2 : 3;
-  constexpr std::array<std::uint32_t, 4> kLeads = {0, 0xC0, 0xE0, 0xF0};
-  put(kLeads[more] | c >> (6 * more));
-  for (unsigned i = more; i-- > 0;) put(0x80 | (c >> (6 * i) & 0x3F));
-}
-
 PropertyValue NumberFromBits(std::uint64_t number) {
   return std::in_range<std::int64_t>(number) ? Int64(static_cast<std::int64_t>(number))
                                              : UInt64(number);
-}
-
-// The six bits that a base64 digit stands for, or 64.
-std::uint32_t Base64Bits(char c) {
-  constexpr std::string_view kDigits =
-      "ABCDEFGHIJKLMNOPQRSTUVWXYZabcdefghijklmnopqrstuvwxyz0123456789+/";
-  const std::size_t found = kDigits.find(c);
-  return found == std::string_view::npos ? 64 : static_cast<std::uint32_t>(found);
 }
 
 }  // namespace
@@ -124,27 +104,9 @@ std::optional<PropertyValue> DateFromText(std::string_view text) {
   return Date{static_cast<double>(seconds.count())};
 }
 
-std::optional<PropertyValue> DataFromBase64(std::string_view text) {
-  Data data;
-  data.reserve(text.size() / 4 * 3);
-  std::uint32_t bits = 0;  // of the group of four digits
-  std::size_t digits = 0;
-  std::size_t padding = 0;
-  for (const char c : text) {
-    if (IsBlank(c)) continue;
-    const bool isPadding = c == '=' && digits % 4 >= 2;
-    const std::uint32_t value = isPadding ? 0 : Base64Bits(c);
-    if (value > 63 || padding > (isPadding ? 1 : 0) || (padding == 1 && !isPadding)) {
-      return std::nullopt;
-    }
-    if (isPadding) ++padding;
-    bits = bits << 6 | value;
-    if (++digits % 4 != 0) continue;
-    for (const unsigned shift : {16U, 8U, 0U}) data.push_back(std::byte(bits >> shift & 0xFF));
-  }
-  if (digits % 4 != 0) return std::nullopt;
-  data.resize(data.size() - padding);
-  return data;
+std::optional<PropertyValue> DataFromText(std::string_view text) {
+  auto data = DataFromBase64(text);
+  return data ? std::optional<PropertyValue>(*std::move(data)) : std::nullopt;
 }
 
 std::optional<std::string> XmlReference(std::string_view name) {

@@ -25,8 +25,8 @@ std::optional<PropertyValue> IntegerFromText(std::string_view text);
 std::optional<PropertyValue> RealFromText(std::string_view text);
 // "2026-03-04T05:06:07Z", years 1 to 9999 with or without leading zeros.
 std::optional<PropertyValue> DateFromText(std::string_view text);
-// Padded base64; blanks are skipped.
-std::optional<PropertyValue> DataFromBase64(std::string_view text);
+// Base64 with padding; blanks are skipped.
+std::optional<PropertyValue> DataFromText(std::string_view text);
 
 // The character that "amp" or "#x41" names, in UTF-8; nullopt for an unknown name and for one that
 // XML does not allow.

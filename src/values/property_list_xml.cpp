@@ -1,5 +1,4 @@
-// XML property lists are read here and not by libplist, which accepts much that is broken without a
-// word, takes quadratic time for chosen keys and entities, and drops what does not fit its dates.
+// A strict reader of the few elements that the format has:
 //   [BOM] [<?xml …?>] [document type] <plist> value </plist>
 // with comments, processing instructions and blanks between elements.
 #include "values/property_list_xml.h"
@@ -13,7 +12,7 @@
 #include <utility>
 #include <vector>
 
-#include "values/property_list_check.h"
+#include "values/property_list_errors.h"
 #include "values/property_list_scalars.h"
 #include "values/text.h"
 
@@ -47,14 +46,15 @@ constexpr auto kElements = std::to_array<Element>({
     {"integer", Role::kScalar, IntegerFromText, "a 64-bit integer"},
     {"real",    Role::kScalar, RealFromText,    "a real number"},
     {"date",    Role::kScalar, DateFromText,    "a date such as 2026-03-04T05:06:07Z"},
-    {"data",    Role::kScalar, DataFromBase64,  "base64"},
+    {"data",    Role::kScalar, DataFromText,    "base64"},
 });
 // clang-format on
 
 // Every step gives false once something is wrong, and `error` says what.
 class XmlReader {
  public:
-  explicit XmlReader(std::string_view document) : text_(document) {}
+  XmlReader(std::string_view document, const PropertyListLimits& limits)
+      : text_(document), limits_(limits) {}
 
   PropertyListResult read() {
     if (!checkCharacters() || !readDocument()) return PropertyListError{error_};
@@ -287,8 +287,8 @@ class XmlReader {
     if (tag.hasAttributes) return fail(at, FormatText("<%s> has attributes", tag.name));
     Open& parent = open_.back();
     if (!checkPlace(parent, *element, at)) return false;
-    if (element->role != Role::kKey && ++values_ > kMaxPropertyListValues) {
-      return fail(at, TooManyValues());
+    if (element->role != Role::kKey && ++values_ > limits_.values) {
+      return fail(at, TooManyValues(limits_));
     }
     if (element->role != Role::kDictionary && element->role != Role::kArray) {
       return readLeaf(*element, tag, at);
@@ -366,6 +366,7 @@ class XmlReader {
   }
 
   std::string_view text_;
+  const PropertyListLimits limits_;
   std::size_t at_ = 0;
   std::vector<Open> open_;
   std::vector<PropertyValue> elements_;  // of all open arrays, the innermost one's last
@@ -376,8 +377,9 @@ class XmlReader {
 
 }  // namespace
 
-PropertyListResult ReadXmlPropertyList(std::string_view document) {
-  return XmlReader(document).read();
+PropertyListResult ReadXmlPropertyList(std::string_view document,
+                                       const PropertyListLimits& limits) {
+  return XmlReader(document, limits).read();
 }
 
 }  // namespace quorlet

@@ -8,10 +8,11 @@
 
 namespace quorlet {
 
-// The value of a document that is well-formed, means one thing only, and is within the limits of
-// property_list.h; otherwise why it is not: "line 3: <integer> holds "abc", which is not a 64-bit
+// The value of a document that is well-formed, means one thing only, and is within the limits;
+// otherwise why it is not: "line 3: <integer> holds "abc", which is not a 64-bit
 // integer". Of equal keys in a dictionary, the last one's value stays.
-[[nodiscard]] PropertyListResult ReadXmlPropertyList(std::string_view document);
+[[nodiscard]] PropertyListResult ReadXmlPropertyList(std::string_view document,
+                                                     const PropertyListLimits& limits);
 
 }  // namespace quorlet
 

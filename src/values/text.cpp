@@ -2,6 +2,7 @@
 #include "values/text.h"
 
 #include <algorithm>
+#include <array>
 #include <chrono>
 #include <cmath>
 
@@ -108,6 +109,18 @@ std::string RepairUtf8(std::string_view text) {
     text.remove_prefix(FirstSequence(text).length);
   }
   return out;
+}
+
+void AppendUtf8(std::string& out, std::uint32_t c) {
+  const auto put = [&out](std::uint32_t byte) { out += static_cast<char>(byte); };
+  if (c < 0x80) {
+    put(c);
+    return;
+  }
+  const unsigned more = c < 0x800 ? 1 : c < 0x10000 ? 2 : 3;
+  constexpr std::array<std::uint32_t, 4> kLeads = {0, 0xC0, 0xE0, 0xF0};
+  put(kLeads[more] | c >> (6 * more));
+  for (unsigned i = more; i-- > 0;) put(0x80 | (c >> (6 * i) & 0x3F));
 }
 
 std::string Rfc3339(Date date) {

@@ -82,6 +82,8 @@ std::string FormatText(Message<Arguments...> message, const Arguments&... argume
 
 // `text` with every ill-formed UTF-8 sequence replaced by U+FFFD (one for each maximal subpart).
 std::string RepairUtf8(std::string_view text);
+// Appends a character, which must be one: below 0x110000 and no surrogate.
+void AppendUtf8(std::string& out, std::uint32_t character);
 // How many bytes at the start of `text` are printable ASCII.
 std::size_t PrintableAsciiPrefix(std::string_view text);
 bool IsValidUtf8(std::string_view text);

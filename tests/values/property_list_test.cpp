@@ -201,6 +201,7 @@ TEST(Writer, ValuesSurviveARoundTrip) {
       Array{Date{-2208988800}, Date{-1169176449}, Date{-1}, Date{978307200}, Date{1772600767},
             Date{3125790847}, Date{3125790848}, Date{4102444800}, Date{-62135596800},
             Date{253402300799}},
+      Array{Double(-0.0), Array{Array{Dictionary{{"k", Data(57, std::byte{1})}}}}},
       Dictionary{{"", "<&]]>\"']]> \t\n\r \U0001F600 "}, {"a&b<c>", Dictionary{{" k ", "  "}}}},
   };
   for (const PropertyValue& value : cases) EXPECT_TRUE(Reads(Written(value), value));
@@ -223,11 +224,17 @@ TEST(Writer, RefusesWhatIsTooDeepOrTooLarge) {
   EXPECT_TRUE(Reads(Written(deep), deep));
   EXPECT_EQ(Written(Array{deep}), "error: the tree is nested more than 128 deep");
 
-  PropertyValue wide = Array{"x"};
-  for (int i = 0; i < 30; ++i) wide = Array{wide, wide};
+  Array wide;
+  for (int i = 0; i < 1'000'000; ++i) wide.push_back(true);
   EXPECT_EQ(Written(wide), "error: more than 1000000 values");
+  PropertyValue doubling = Array{"x"};
+  for (int i = 0; i < 30; ++i) doubling = Array{doubling, doubling};
+  EXPECT_EQ(Written(doubling), "error: the document is larger than 16777216 bytes");
   EXPECT_EQ(Written(std::string(kMaxPropertyListBytes, 'x')),
             "error: the document is larger than 16777216 bytes");
+  const PropertyValue log = std::string(kMaxPropertyListBytes, '&');
+  EXPECT_EQ(std::get<PropertyListError>(WriteXmlPropertyList(log, kLogLimits)).description,
+            "the document is larger than 67108864 bytes");
 }
 
 }  // namespace

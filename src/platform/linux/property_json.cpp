@@ -1,9 +1,8 @@
 #include "platform/linux/property_json.h"
 
-#include <openssl/evp.h>
-
 #include <cmath>
 
+#include "values/base64.h"
 #include "values/property_list.h"
 #include "values/text.h"
 
@@ -22,26 +21,11 @@ Json NumberJson(const Number& number) {
   return real;
 }
 
-std::string Base64(const Data& data) {
-  std::string text((data.size() + 2) / 3 * 4 + 1, '\0');  // the encoder ends it with a NUL
-  std::size_t used = 0;
-  // The encoder takes an int's worth at a time; a multiple of 3 bytes needs no padding.
-  constexpr std::size_t kStep = 3UL << 20;
-  for (std::size_t begin = 0; begin < data.size(); begin += kStep) {
-    const std::size_t length = std::min(kStep, data.size() - begin);
-    used += static_cast<std::size_t>(EVP_EncodeBlock(
-        reinterpret_cast<unsigned char*>(text.data() + used),
-        reinterpret_cast<const unsigned char*>(data.data() + begin), static_cast<int>(length)));
-  }
-  text.resize(used);
-  return text;
-}
-
 Json Convert(const PropertyValue& value, std::size_t depth) {
   if (const bool* boolean = value.asBoolean()) return *boolean;
   if (const Number* number = value.asNumber()) return NumberJson(*number);
   if (const std::string* text = value.asString()) return *text;
-  if (const Data* data = value.asData()) return Base64(*data);
+  if (const Data* data = value.asData()) return Base64Text(*data);
   if (const Date* date = value.asDate()) return Rfc3339(*date);
   if (depth == kMaxPropertyListDepth) return nullptr;
   if (const Array* array = value.asArray()) {

@@ -1,17 +1,24 @@
-// The check of binary documents:
+// Binary documents:
 //   "bplist00", objects, offset table, trailer
 // The trailer's 32 bytes are 6 unused ones, the size of an offset, the size of a reference, then
 // the number of objects, the root's index and the offset table's position in 8 bytes each. An
 // object is a marker byte, type in the high half and count in the low one, and its content.
 // Everything is big-endian.
+//
+// Objects may be shared and may form cycles, so the tree may be far larger than the document: it is
+// measured first, object by object, and built when it is within the limits.
+#include "values/property_list_binary.h"
+
 #include <algorithm>
+#include <bit>
 #include <cstdint>
 #include <limits>
+#include <optional>
+#include <utility>
 #include <vector>
 
 #include "values/byte_reader.h"
-#include "values/property_list.h"
-#include "values/property_list_check.h"
+#include "values/property_list_errors.h"
 #include "values/text.h"
 
 namespace quorlet {
@@ -20,15 +27,17 @@ namespace {
 constexpr std::size_t kHeaderSize = 8;
 constexpr std::size_t kTrailerSize = 32;
 constexpr std::size_t kMaxWidth = 8;
+constexpr double kEpoch2001 = 978307200;  // dates count from 2001-01-01T00:00:00Z
 
 // Every step gives false once something is wrong, and `error_` says what.
-class BinaryChecker {
+class BinaryReader {
  public:
-  explicit BinaryChecker(std::span<const std::byte> document) : document_(document) {}
+  BinaryReader(std::span<const std::byte> document, const PropertyListLimits& limits)
+      : document_(document), limits_(limits) {}
 
-  std::optional<std::string> check() {
-    if (!readTrailer() || !walk(root_, 0)) return error_;
-    return std::nullopt;
+  PropertyListResult read() {
+    if (!readTrailer() || !walk(root_, 0)) return PropertyListError{error_};
+    return valueOf(root_);
   }
 
  private:
@@ -64,8 +73,8 @@ class BinaryChecker {
         referenceWidth_ > kMaxWidth) {
       return fail("the trailer holds impossible sizes");
     }
-    if (objects > kMaxPropertyListValues) {
-      return fail(FormatText("more than %llu objects", kMaxPropertyListValues));
+    if (objects > limits_.values) {
+      return fail(FormatText("more than %llu objects", limits_.values));
     }
     if (table < kHeaderSize || table > end || objects * offsetWidth_ > end - table) {
       return fail("the offset table lies outside of the document");
@@ -174,7 +183,7 @@ class BinaryChecker {
     const auto content = reader.take(static_cast<std::size_t>(count) * unit);
     memo.content = content.size();
     seenContent_ += content.size();
-    if (seenContent_ > kMaxPropertyListContentBytes) return fail(TooMuchContent());
+    if (seenContent_ > limits_.content) return fail(TooMuchContent(limits_));
     for (std::size_t i = 0; memo.isString && i < content.size(); i += unit) {
       const auto character = content.subspan(i, unit);
       if (std::ranges::all_of(character, [](std::byte b) { return b == std::byte{0}; })) {
@@ -191,7 +200,7 @@ class BinaryChecker {
     const std::size_t keys = marker >> 4 == 0xD ? 1 : 0;
     if (count > reader.remaining() / referenceWidth_ / (1 + keys)) return failCut(object);
     seenValues_ += count;
-    if (seenValues_ > kMaxPropertyListValues) return fail(TooManyValues());
+    if (seenValues_ > limits_.values) return fail(TooManyValues(limits_));
     memo.height = 1;
     if (above == kMaxPropertyListDepth) return fail(object, FormatText("is %s", TooDeeplyNested()));
     for (std::uint64_t i = 0; i < count * keys; ++i) {
@@ -217,11 +226,105 @@ class BinaryChecker {
         std::max<std::uint8_t>(memo.height, static_cast<std::uint8_t>(element.height + 1));
     memo.content += element.content;
     if (!isKey) memo.values += element.values;
-    if (memo.values > kMaxPropertyListValues) return fail(TooManyValues());
-    return memo.content <= kMaxPropertyListContentBytes || fail(TooMuchContent());
+    if (memo.values > limits_.values) return fail(TooManyValues(limits_));
+    return memo.content <= limits_.content || fail(TooMuchContent(limits_));
+  }
+
+  // --- Building: what is read here was found good before
+  // -------------------------------------------
+
+  PropertyValue valueOf(std::size_t object) const {
+    ByteReader reader = readerAt(object);
+    const auto marker = static_cast<unsigned>(reader.big(1));
+    switch (marker >> 4) {
+      case 0x0:
+        return marker == 0x09;
+      case 0x1:
+        return integerAt(reader, marker & 0x0F);
+      case 0x2:
+        return Double(marker == 0x22
+                          ? std::bit_cast<float>(static_cast<std::uint32_t>(reader.big(4)))
+                          : std::bit_cast<double>(reader.big(8)));
+      case 0x3:
+        return Date{std::bit_cast<double>(reader.big(8)) + kEpoch2001};
+      case 0x4: {
+        const auto bytes = reader.take(countAt(reader, marker));
+        return Data(bytes.begin(), bytes.end());
+      }
+      case 0xA:
+        return arrayAt(reader, marker);
+      case 0xD:
+        return dictionaryAt(reader, marker);
+      default:
+        return textAt(reader, marker);
+    }
+  }
+
+  static std::size_t countAt(ByteReader& reader, unsigned marker) {
+    const unsigned count = marker & 0x0F;
+    return count < 0x0F
+               ? count
+               : static_cast<std::size_t>(reader.big(std::size_t{1} << (reader.big(1) & 3)));
+  }
+
+  // Only integers of 8 bytes have a sign.
+  static PropertyValue integerAt(ByteReader& reader, unsigned sizeExponent) {
+    if (sizeExponent == 4) reader.skip(8);
+    const std::uint64_t bits = reader.big(std::min(std::size_t{1} << sizeExponent, kMaxWidth));
+    if (sizeExponent == 4 && !std::in_range<std::int64_t>(bits)) return UInt64(bits);
+    return Int64(static_cast<std::int64_t>(bits));
+  }
+
+  static std::string textAt(ByteReader& reader, unsigned marker) {
+    std::size_t count = countAt(reader, marker);
+    if (marker >> 4 == 0x5) {
+      const auto bytes = reader.take(count);
+      return RepairUtf8({reinterpret_cast<const char*>(bytes.data()), bytes.size()});
+    }
+    std::string text;
+    for (; count > 0; --count) AppendUtf8(text, characterAt(reader, count));
+    return text;
+  }
+
+  // One character of UTF-16, of which `left` units are left; U+FFFD for half of one.
+  static std::uint32_t characterAt(ByteReader& reader, std::size_t& left) {
+    constexpr std::uint32_t kReplacement = 0xFFFD;
+    const auto first = static_cast<std::uint32_t>(reader.big(2));
+    if (first < 0xD800 || first > 0xDFFF) return first;
+    ByteReader ahead = reader;
+    const auto second = static_cast<std::uint32_t>(ahead.big(2));
+    if (first > 0xDBFF || left == 1 || second < 0xDC00 || second > 0xDFFF) return kReplacement;
+    reader = ahead;
+    --left;
+    return 0x10000 + ((first - 0xD800) << 10) + (second - 0xDC00);
+  }
+
+  std::size_t referenceAt(ByteReader& reader) const {
+    return static_cast<std::size_t>(reader.big(referenceWidth_));
+  }
+
+  PropertyValue arrayAt(ByteReader& reader, unsigned marker) const {
+    std::size_t count = countAt(reader, marker);
+    Array array;
+    array.reserve(count);
+    for (; count > 0; --count) array.push_back(valueOf(referenceAt(reader)));
+    return array;
+  }
+
+  PropertyValue dictionaryAt(ByteReader& reader, unsigned marker) const {
+    const std::size_t count = countAt(reader, marker);
+    ByteReader values = reader;
+    values.skip(count * referenceWidth_);
+    Dictionary dictionary;
+    for (std::size_t i = 0; i < count; ++i) {
+      const PropertyValue key = valueOf(referenceAt(reader));
+      dictionary[*key.asString()] = valueOf(referenceAt(values));
+    }
+    return dictionary;
   }
 
   std::span<const std::byte> document_;
+  const PropertyListLimits limits_;
   std::size_t offsetWidth_ = 0;
   std::size_t referenceWidth_ = 0;
   std::size_t table_ = 0;
@@ -235,18 +338,9 @@ class BinaryChecker {
 
 }  // namespace
 
-std::string TooDeeplyNested() {
-  return FormatText("nested more than %llu deep", kMaxPropertyListDepth);
-}
-
-std::string TooManyValues() { return FormatText("more than %llu values", kMaxPropertyListValues); }
-
-std::string TooMuchContent() {
-  return FormatText("more than %llu bytes of content", kMaxPropertyListContentBytes);
-}
-
-std::optional<std::string> CheckBinaryPropertyList(std::span<const std::byte> document) {
-  return BinaryChecker(document).check();
+PropertyListResult ReadBinaryPropertyList(std::span<const std::byte> document,
+                                          const PropertyListLimits& limits) {
+  return BinaryReader(document, limits).read();
 }
 
 }  // namespace quorlet
