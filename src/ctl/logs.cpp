@@ -152,8 +152,7 @@ void List(Session& session, const LogsArguments& arguments) {
   }
 }
 
-std::string ReadLog(const std::string& path) {
-  auto bytes = ReadWholeFile(path, kMaxLogBytes);
+std::string LogBytes(const std::string& path, std::variant<std::string, int> bytes) {
   if (const int* error = std::get_if<int>(&bytes)) FailReading(path, *error);
   return std::get<std::string>(std::move(bytes));
 }
@@ -163,14 +162,14 @@ std::string ReadNamedLog(const std::string& name) {
   if (!IsSafeName(name)) throw Failure("not the name of a log: " + name);
   for (const std::string_view stage : kStages) {
     const std::string path = StageDirectory(stage) + "/" + name;
-    if (::access(path.c_str(), F_OK) == 0) return ReadLog(path);
+    if (::access(path.c_str(), F_OK) == 0) return LogBytes(path, ReadOwnFile(path, kMaxLogBytes));
     if (errno != ENOENT) FailReading(path, errno);
   }
   throw Failure("neither pending nor outbox has a log " + name);
 }
 
 std::string ReadRequestedLog(const std::string& file) {
-  if (file.find('/') != std::string::npos) return ReadLog(file);
+  if (file.find('/') != std::string::npos) return LogBytes(file, ReadWholeFile(file, kMaxLogBytes));
   if (file != kLatest) return ReadNamedLog(file);
   const std::vector<StoredLog> logs = FindLogs();
   if (logs.empty()) throw Failure("there is no log yet");

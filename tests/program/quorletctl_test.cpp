@@ -1,5 +1,7 @@
 // quorletctl, run as its users run it.
 #include <gtest/gtest.h>
+#include <sys/stat.h>
+#include <unistd.h>
 
 #include <algorithm>
 #include <chrono>
@@ -448,6 +450,44 @@ TEST_F(QuorletctlTest, ConsentIsGivenOnceAndWithdrawnWhole) {
   EXPECT_FALSE(device.exists("/var/mobile/Library/Logs/Diagwell/outbox/a.log"));
   run({"prefs", "set", domain, "SubmissionEnabled", "1"});
   EXPECT_EQ(run({"consent", "status"}).status, 1);
+}
+
+TEST_F(QuorletctlTest, WhatRootCreatesBelongsToTheOwnerOfItsDirectory) {
+  if (geteuid() != 0) GTEST_SKIP() << "only root gives files away";
+  constexpr uid_t kOwner = 1234;
+  constexpr gid_t kGroup = 1235;
+  const std::string library = device.path("/var/mobile/Library");
+  const std::string store = library + "/TallyLedger";
+  const std::string linked = device.path("/victim");
+  device.write("/victim", "kept");
+  std::filesystem::create_directories(store);
+  for (const std::string& directory : {library, store}) {
+    ASSERT_EQ(chown(directory.c_str(), kOwner, kGroup), 0);
+  }
+  ASSERT_EQ(chmod(store.c_str(), 02770), 0);
+  const mode_t before = umask(077);
+  outputOf({"tally", "add", "k", "5"});
+  outputOf({"prefs", "set", "d", "k", "5"});
+  outputOf({"consent", "on"});
+  umask(before);
+  int files = 0;
+  for (const auto& entry : std::filesystem::recursive_directory_iterator(library)) {
+    struct stat status = {};
+    ASSERT_EQ(lstat(entry.path().c_str(), &status), 0);
+    EXPECT_TRUE(status.st_uid == kOwner && status.st_gid == kGroup) << entry.path();
+    const bool isInStore = entry.path().parent_path() == store;
+    const mode_t file = isInStore ? 0660 : 0640;
+    const mode_t directory = entry.path() == store ? 02770 : 0750;
+    EXPECT_EQ(status.st_mode & 07777U, entry.is_directory() ? directory : file) << entry.path();
+    files += entry.is_directory() ? 0 : 1;
+  }
+  EXPECT_GE(files, 6) << "the store with its log and lock, two domains with theirs";
+
+  // A link where a domain's file belongs is neither read nor written through.
+  std::filesystem::create_symlink(linked, library + "/Preferences/other.plist");
+  EXPECT_EQ(run({"prefs", "list", "other"}).status, 1);
+  EXPECT_EQ(run({"prefs", "set", "other", "k", "1"}).status, 1);
+  EXPECT_EQ(device.read("/victim"), "kept");
 }
 
 }  // namespace

@@ -7,6 +7,7 @@
 #include <unistd.h>
 
 #include <cerrno>
+#include <cstdint>
 #include <string>
 #include <string_view>
 #include <utility>
@@ -49,11 +50,16 @@ auto Uninterrupted(const Call& call) {
 // wrong way round, its use still fails. To be called before anything else is opened.
 void OccupyStandardStreams();
 
-// Opens (and with O_CREAT creates, mode 0640) a regular file; 0 or the errno. Anything else at
-// `path` is refused: EISDIR for a directory, otherwise EINVAL; so is, to be written, a file that
-// has a second name: EMLINK. Never waits on a FIFO or device.
+// Who else may use a file that is created: nobody but its owner and readers of its group (0640), or
+// whoever may write in its directory, where that hands its group on (0660 there).
+enum class Sharing : std::uint8_t { kOwner, kGroupOfDirectory };
+
+// Opens a regular file, and with O_CREAT creates it, whatever the umask; what root creates belongs
+// to the owner and group of its directory. 0 or the errno. Anything else at `path` is refused:
+// EISDIR for a directory, otherwise EINVAL; so are, to be written, a link (ELOOP) and a file that
+// has a second name (EMLINK). Never waits on a FIFO or device.
 [[nodiscard]] int OpenRegularFile(const std::string& path, int flags, Descriptor& opened,
-                                  struct stat& status);
+                                  struct stat& status, Sharing sharing = Sharing::kOwner);
 
 // Writes all bytes; 0 or the errno of what stopped it half-way.
 [[nodiscard]] int WriteFully(int descriptor, std::string_view bytes);

@@ -42,11 +42,25 @@ bool StillNames(const std::string& path, const struct stat& open) {
          named.st_ino == open.st_ino;
 }
 
-int OpenLocked(const std::string& path, Descriptor& opened, struct stat& status) {
-  if (const int error = OpenRegularFile(path, O_RDWR | O_CREAT | O_NOFOLLOW, opened, status)) {
+int OpenLocked(const std::string& path, Descriptor& opened, struct stat& status, Sharing sharing) {
+  if (const int error = OpenRegularFile(path, O_RDWR | O_CREAT, opened, status, sharing)) {
     return error;
   }
   return Uninterrupted([&] { return flock(opened.get(), LOCK_EX); }) == 0 ? 0 : errno;
+}
+
+// Gives what has just been created at `path` its mode, and what root has created the owner and
+// group of the directory around it.
+int AdoptNew(const Descriptor& created, const std::string& path, mode_t mode, Sharing sharing) {
+  struct stat around = {};
+  if (stat(ParentDirectory(path).c_str(), &around) != 0) return errno;
+  constexpr mode_t kHandsGroupOn = S_ISGID | S_IWGRP;
+  const bool isShared =
+      sharing == Sharing::kGroupOfDirectory && (around.st_mode & kHandsGroupOn) == kHandsGroupOn;
+  if (fchmod(created.get(), mode | (isShared ? S_IWGRP : 0U)) != 0) return errno;
+  if (geteuid() != 0 || (around.st_uid == 0 && around.st_gid == getegid())) return 0;
+  // Where root may not give files away, they are still better made than not.
+  return fchown(created.get(), around.st_uid, around.st_gid) == 0 || errno == EPERM ? 0 : errno;
 }
 
 }  // namespace
@@ -58,14 +72,32 @@ void OccupyStandardStreams() {
   }
 }
 
-int OpenRegularFile(const std::string& path, int flags, Descriptor& opened, struct stat& status) {
+int OpenRegularFile(const std::string& path, int flags, Descriptor& opened, struct stat& status,
+                    Sharing sharing) {
+  const bool writes = (flags & O_ACCMODE) != O_RDONLY;
   // O_NONBLOCK means nothing to a regular file; it keeps a FIFO from stopping the program.
-  const int allFlags = flags | O_CLOEXEC | O_NONBLOCK | O_NOCTTY;
-  Descriptor descriptor(Uninterrupted([&] { return open(path.c_str(), allFlags, kFileMode); }));
-  if (!descriptor.isOpen() || fstat(descriptor.get(), &status) != 0) return errno;
+  flags |= O_CLOEXEC | O_NONBLOCK | O_NOCTTY | (writes ? O_NOFOLLOW : 0);
+  const auto openWith = [&](int with) {
+    return Descriptor(Uninterrupted([&] { return open(path.c_str(), with, kFileMode); }));
+  };
+  // A file that is there keeps its mode and owner, so creating is a step of its own.
+  Descriptor descriptor;
+  const bool isNewOnly = (flags & O_EXCL) != 0;
+  while (true) {
+    if (!isNewOnly) descriptor = openWith(flags & ~O_CREAT);
+    if (descriptor.isOpen()) break;
+    if (!isNewOnly && (errno != ENOENT || (flags & O_CREAT) == 0)) return errno;
+    descriptor = openWith(flags | O_EXCL);
+    if (descriptor.isOpen()) {
+      if (const int error = AdoptNew(descriptor, path, kFileMode, sharing)) return error;
+      break;
+    }
+    if (isNewOnly || errno != EEXIST) return errno;  // EEXIST: another process was faster
+  }
+  if (fstat(descriptor.get(), &status) != 0) return errno;
   if (!S_ISREG(status.st_mode)) return S_ISDIR(status.st_mode) ? EISDIR : EINVAL;
   // A second name of some other file, which is not ours to write.
-  if ((flags & O_ACCMODE) != O_RDONLY && status.st_nlink > 1) return EMLINK;
+  if (writes && status.st_nlink > 1) return EMLINK;
   opened = std::move(descriptor);
   return 0;
 }
@@ -122,19 +154,24 @@ int MakeDirectories(const std::string& directory) {
     // Another process may have been faster.
     if (mkdir(path, kDirectoryMode) != 0) return errno == EEXIST ? 0 : errno;
   }
+  const Descriptor created(
+      Uninterrupted([&] { return open(path, O_RDONLY | O_DIRECTORY | O_NOFOLLOW | O_CLOEXEC); }));
+  if (!created.isOpen()) return errno;
   // The mode is fixed, whatever the process masks.
-  if (chmod(path, kDirectoryMode) != 0) return errno;
+  if (const int error = AdoptNew(created, directory, kDirectoryMode, Sharing::kOwner)) return error;
   // What is made durable inside must not be lost with its directory; where the parent cannot even
   // be read there is nothing to be done about it.
   (void)SyncDirectory(ParentDirectory(directory));
   return 0;
 }
 
-std::variant<std::string, int> ReadWholeFile(const std::string& path, std::size_t limit) {
+namespace {
+
+std::variant<std::string, int> ReadFile(const std::string& path, std::size_t limit, int flags) {
   limit = std::min(limit, std::string().max_size() / 2);  // so that nothing below wraps
   Descriptor file;
   struct stat status = {};
-  if (const int error = OpenRegularFile(path, O_RDONLY, file, status)) return error;
+  if (const int error = OpenRegularFile(path, O_RDONLY | flags, file, status)) return error;
   const auto announced = static_cast<std::size_t>(std::max<off_t>(status.st_size, 0));
   if (announced > limit) return EFBIG;
   // Files in /proc announce no size, and any file may have grown: read on to the end. One byte
@@ -156,8 +193,18 @@ std::variant<std::string, int> ReadWholeFile(const std::string& path, std::size_
   return bytes;
 }
 
-AtomicFile::AtomicFile(std::string directory, std::string_view temporaryStem)
-    : directory_(std::move(directory)) {
+}  // namespace
+
+std::variant<std::string, int> ReadWholeFile(const std::string& path, std::size_t limit) {
+  return ReadFile(path, limit, 0);
+}
+
+std::variant<std::string, int> ReadOwnFile(const std::string& path, std::size_t limit) {
+  return ReadFile(path, limit, O_NOFOLLOW);
+}
+
+AtomicFile::AtomicFile(std::string directory, std::string_view temporaryStem, Sharing sharing)
+    : directory_(std::move(directory)), sharing_(sharing) {
   if (IsSafeName(temporaryStem)) {
     temporaryPath_ = directory_ + "/." + std::string(temporaryStem) + ".tmp";
   }
@@ -175,7 +222,7 @@ int AtomicFile::open() {
   while (true) {
     Descriptor file;
     struct stat status = {};
-    const int error = OpenLocked(temporaryPath_, file, status);
+    const int error = OpenLocked(temporaryPath_, file, status, sharing_);
     // A name that somebody else has given to one of his files: only the name goes.
     const bool isForeign = error == EMLINK || error == ELOOP;
     if (isForeign && unlink(temporaryPath_.c_str()) == 0) continue;
@@ -199,20 +246,20 @@ int AtomicFile::publish(const std::string& name) {
   return SyncDirectory(directory_);
 }
 
-int WriteWholeFile(const std::string& path, std::string_view bytes) {
+int WriteWholeFile(const std::string& path, std::string_view bytes, Sharing sharing) {
   const std::string name = FileName(path);
-  AtomicFile file(ParentDirectory(path), name);
+  AtomicFile file(ParentDirectory(path), name, sharing);
   if (const int error = file.open()) return error;
   if (const int error = file.write(bytes)) return error;
   return file.publish(name);
 }
 
-FileLock::FileLock(const std::string& path) {
+FileLock::FileLock(const std::string& path, Sharing sharing) {
   error_ = MakeDirectories(ParentDirectory(path));
   if (error_ != 0) return;
   Descriptor file;
   struct stat status = {};
-  error_ = OpenLocked(path, file, status);
+  error_ = OpenLocked(path, file, status, sharing);
   if (error_ == 0) descriptor_ = file.release();
 }
 

@@ -11,6 +11,8 @@
 #include <variant>
 #include <vector>
 
+#include "platform/linux/descriptor.h"
+
 namespace quorlet {
 
 // The directory that stands for "/" of the system.
@@ -38,13 +40,18 @@ class Root {
 // byte.
 bool IsSafeName(std::string_view name);
 
-// Creates `directory` and its missing parents with mode 0750.
+// Creates `directory` and its missing parents with mode 0750; what root creates belongs to the
+// owner and group of the directory above.
 [[nodiscard]] int MakeDirectories(const std::string& directory);
 
 // All bytes of a regular file of at most `limit` bytes, or the errno (EFBIG when it is larger).
 // Never waits on a FIFO or device.
 [[nodiscard]] std::variant<std::string, int> ReadWholeFile(const std::string& path,
                                                            std::size_t limit);
+// The same for a file in a directory that we write to, where a link is refused with ELOOP: whoever
+// else may write there must not choose what is read.
+[[nodiscard]] std::variant<std::string, int> ReadOwnFile(const std::string& path,
+                                                         std::size_t limit);
 
 // A file that appears under its name complete or not at all: written to a hidden temporary name in
 // the same directory (which is created), synced, renamed, and the directory synced. What a writer
@@ -53,7 +60,8 @@ bool IsSafeName(std::string_view name);
 class AtomicFile {
  public:
   // `temporaryStem` must be a safe name; ".<stem>.tmp" is the temporary name.
-  AtomicFile(std::string directory, std::string_view temporaryStem);
+  AtomicFile(std::string directory, std::string_view temporaryStem,
+             Sharing sharing = Sharing::kOwner);
   AtomicFile(const AtomicFile&) = delete;
   AtomicFile& operator=(const AtomicFile&) = delete;
   // Removes the temporary file unless publish() succeeded.
@@ -67,17 +75,19 @@ class AtomicFile {
  private:
   std::string directory_;
   std::string temporaryPath_;
+  Sharing sharing_;
   int descriptor_ = -1;
 };
 
 // AtomicFile in one step: replaces the file at `path` with `bytes`.
-[[nodiscard]] int WriteWholeFile(const std::string& path, std::string_view bytes);
+[[nodiscard]] int WriteWholeFile(const std::string& path, std::string_view bytes,
+                                 Sharing sharing = Sharing::kOwner);
 
 // An exclusive lock on a lock file, which is created (with its directory) and stays; held until
 // destruction, released by the kernel when the process dies.
 class FileLock {
  public:
-  explicit FileLock(const std::string& path);
+  explicit FileLock(const std::string& path, Sharing sharing = Sharing::kOwner);
   FileLock(const FileLock&) = delete;
   FileLock& operator=(const FileLock&) = delete;
   ~FileLock();

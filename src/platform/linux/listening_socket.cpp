@@ -81,6 +81,23 @@ std::optional<std::variant<ListeningSocket, std::string>> ListeningSocket::Passe
   return ListeningSocket(std::move(first));
 }
 
+namespace {
+
+// As with every file that root creates. Held by a descriptor: the owner of the directory may have
+// put something else in its place.
+void GiveToOwnerOf(const std::string& directory, const std::string& path) {
+  struct stat around {};
+  struct stat made {};
+  const Descriptor socket(open(path.c_str(), O_PATH | O_NOFOLLOW | O_CLOEXEC));
+  if (geteuid() != 0 || stat(directory.c_str(), &around) != 0 || fstat(socket.get(), &made) != 0 ||
+      !S_ISSOCK(made.st_mode)) {
+    return;
+  }
+  if (fchownat(socket.get(), "", around.st_uid, around.st_gid, AT_EMPTY_PATH) != 0) return;
+}
+
+}  // namespace
+
 std::variant<ListeningSocket, std::string> ListeningSocket::Make(const std::string& directory,
                                                                  const std::string& name) {
   // Held until the new socket listens: before that it looks stale to another starting process.
@@ -96,6 +113,7 @@ std::variant<ListeningSocket, std::string> ListeningSocket::Make(const std::stri
   // The mode is set before the socket has a name, so that nobody else ever finds it open.
   if (!made.isOpen() || fchmod(made.get(), 0600) != 0) return ErrnoText(errno);
   if (const int error = address.bind(made.get())) return ErrnoText(error);
+  GiveToOwnerOf(directory, path);
   if (chmod(path.c_str(), 0600) != 0 || lstat(path.c_str(), &status) != 0 ||
       listen(made.get(), kBacklog) != 0 || !SetFlags(made.get())) {
     const int error = errno;

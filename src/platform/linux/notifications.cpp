@@ -13,7 +13,7 @@ namespace {
 // The count in a notification's file; 0 when there is none, or something else.
 std::uint64_t CountIn(const std::string& path) {
   constexpr std::size_t kLongestCount = 32;
-  const auto content = ReadWholeFile(path, kLongestCount);
+  const auto content = ReadOwnFile(path, kLongestCount);
   const auto* text = std::get_if<std::string>(&content);
   if (text == nullptr) return 0;
   std::uint64_t count = 0;

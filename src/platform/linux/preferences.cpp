@@ -65,7 +65,7 @@ struct ReadFailure {
 };
 
 std::variant<Dictionary, ReadFailure> ReadDomainFile(const std::string& path) {
-  const auto bytes = ReadWholeFile(path, kMaxPropertyListBytes);
+  const auto bytes = ReadOwnFile(path, kMaxPropertyListBytes);
   if (const int* error = std::get_if<int>(&bytes)) return ReadFailure{ErrnoText(*error), false};
   auto document = ReadPropertyList(std::string_view(std::get<std::string>(bytes)));
   if (const auto* error = std::get_if<PropertyListError>(&document)) {

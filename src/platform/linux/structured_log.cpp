@@ -15,7 +15,7 @@
 namespace quorlet {
 namespace {
 
-constexpr int kAppendFlags = O_RDWR | O_CREAT | O_APPEND | O_NOFOLLOW;
+constexpr int kAppendFlags = O_RDWR | O_CREAT | O_APPEND;
 constexpr std::string_view kDayPrefix = "structured-";
 constexpr std::string_view kSuffix = ".jsonl";
 constexpr std::size_t kDayLength = 8;

@@ -44,7 +44,7 @@ class StagedFile {
   int open(const std::string& path) {
     if (unlink(path.c_str()) != 0 && errno != ENOENT) return errno;
     struct stat status = {};
-    return OpenRegularFile(path, O_WRONLY | O_CREAT | O_EXCL | O_NOFOLLOW, file_, status);
+    return OpenRegularFile(path, O_WRONLY | O_CREAT | O_EXCL, file_, status);
   }
   // Appends the lines' bytes, and a line break where a crash cut the last line off.
   int copy(const Descriptor& from, const Lines& lines) {
@@ -110,7 +110,7 @@ int StructuredLog::publish(Date now) const {
   if (lstat(stagedPath().c_str(), &status) != 0) return errno == ENOENT ? error : errno;
   // Lines are published to a log that is there, if only an empty one.
   Descriptor log;
-  constexpr int kFlags = O_RDWR | O_CREAT | O_NOFOLLOW;
+  constexpr int kFlags = O_RDWR | O_CREAT;
   if (const int failure = OpenRegularFile(path(), kFlags, log, status)) return failure;
   const std::string marked = stagedPath() + "." + std::to_string(status.st_ino);
   if (rename(stagedPath().c_str(), marked.c_str()) != 0) return errno;

@@ -135,7 +135,7 @@ int LinuxTallyLedger::openWriter() {
   int code = openOrCreate();
   if (code == SQLITE_CANTOPEN) {
     // Another process may just be moving it aside: that is over when it lets go of the lock.
-    { const FileLock waited(directory_ + kLockName); }
+    { const FileLock waited(directory_ + kLockName, Sharing::kGroupOfDirectory); }
     code = openOrCreate();
   }
   return code;
@@ -283,7 +283,7 @@ bool LinuxTallyLedger::replaceDamaged(const FileIdentity& damaged, const std::st
   // A reader may have found it while a transaction is open here.
   if (inTransaction_) transactionFailed_ = true;
   writer_.close();
-  const FileLock lock(directory_ + kLockName);
+  const FileLock lock(directory_ + kLockName, Sharing::kGroupOfDirectory);
   if (lock.error() != 0) {
     log_.error("The counter store %@ is damaged (%@) and cannot be locked: %@", path_, why,
                ErrnoText(lock.error()));
@@ -340,7 +340,7 @@ void LinuxTallyLedger::countCorruption(const FileIdentity& damaged) {
 // process ever meets half of it.
 int LinuxTallyLedger::startNewDatabase() {
   writer_.close();
-  const FileLock lock(directory_ + kLockName);
+  const FileLock lock(directory_ + kLockName, Sharing::kGroupOfDirectory);
   if (lock.error() != 0) return lockFailed(lock);
   FileIdentity file;
   if (FindIdentity(path_, file) == 0) {
@@ -360,7 +360,7 @@ int LinuxTallyLedger::placeNewDatabase() {
     hasLeftOvers |= unlink((path_ + suffix).c_str()) == 0;
   }
   int error = hasLeftOvers ? SyncDirectory(directory_) : 0;
-  if (error == 0) error = WriteWholeFile(path_, NewTallyDatabase());
+  if (error == 0) error = WriteWholeFile(path_, NewTallyDatabase(), Sharing::kGroupOfDirectory);
   if (error == 0) return SQLITE_OK;
   fileError_ = ErrnoText(error);
   return SQLITE_CANTOPEN;
