@@ -7,6 +7,7 @@
 #include <cerrno>
 #include <cstring>
 #include <deque>
+#include <exception>
 #include <map>
 #include <set>
 #include <string>
@@ -309,8 +310,16 @@ class FakeNetworkUsage : public NetworkUsage {
   }
   // Delivers the reply that was held back.
   void deliver() {
-    std::thread([this] { held_(&records); }).join();
+    std::exception_ptr thrown;  // nobody else would take it
+    std::thread([&] {
+      try {
+        held_(&records);
+      } catch (...) {
+        thrown = std::current_exception();
+      }
+    }).join();
     held_ = nullptr;
+    if (thrown) std::rethrow_exception(thrown);
   }
 
   bool holdsBack = false;
