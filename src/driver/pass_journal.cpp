@@ -6,7 +6,6 @@
 //   published      the aggregated log has been in the spool
 //   storageLogged  the storage log's entries are in the structured log, or staged for it
 //   osVersionBefore, corruptions, appInfo    what the aggregated log tells once only
-//   told           the corruptions in the last of these logs that was noted
 #include "driver/pass_journal.h"
 
 #include <algorithm>
@@ -197,10 +196,7 @@ void PassJournal::noteLog(std::string_view name, const std::string& fileName) {
   std::vector<std::string> logs = LogsNamed(entry(), name);
   logs.push_back(fileName);
   SetLogs(entry(), name, logs);
-  if (name == kAggregatedLog) {
-    entry()["told"] = Int64(usedUp_.corruptions);
-    if (osVersionBefore_) entry()["osVersionBefore"] = *osVersionBefore_;
-  }
+  if (name == kAggregatedLog && osVersionBefore_) entry()["osVersionBefore"] = *osVersionBefore_;
   write();
 }
 
@@ -216,7 +212,6 @@ bool PassJournal::NotingDiagnostics::writeLog(const LogRequest& request, const L
     }
   }
   std::vector<std::string> replaced = journal_.logsToReplace(request.name);
-  const std::int64_t toldBefore = IntegerEntry(journal_.entry(), "told").value_or(0);
   std::string own;
   noted.beforePublication = [&](const std::string& fileName) {
     own = fileName;
@@ -224,7 +219,6 @@ bool PassJournal::NotingDiagnostics::writeLog(const LogRequest& request, const L
   };
   if (!diagnostics_.writeLog(noted, writer)) {
     if (!own.empty()) SetLogs(journal_.entry(), request.name, replaced);
-    if (isAggregated) journal_.entry()["told"] = Int64(toldBefore);
     return false;
   }
   if (isAggregated) journal_.entry()["published"] = true;
@@ -245,17 +239,8 @@ PassProgress PassJournal::progress() {
           }};
 }
 
-bool PassJournal::keepsEarlierLog() { return isRepeated_ && hasSpooledLog(entry()); }
-
 void PassJournal::settle(ReportOutcome outcome) {
   Preferences& preferences = platform_.preferences;
-  if (outcome != ReportOutcome::kWritten && keepsEarlierLog()) {
-    // That log has told its part; what has come since is counted on.
-    const std::int64_t told = IntegerEntry(entry(), "told").value_or(0);
-    preferences.addToInteger(kCorruptionCount, usedUp_.corruptions - told, kCountDomain);
-    usedUp_.corruptions = told;
-    outcome = ReportOutcome::kWritten;
-  }
   if (outcome != ReportOutcome::kWritten) {
     // Nobody was told of them: they are counted on.
     if (usedUp_.corruptionsTaken != 0) {

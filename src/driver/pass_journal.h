@@ -41,10 +41,6 @@ class PassJournal {
   // How far an unfinished pass of the day got with the storage log, and how this one tells.
   PassProgress progress();
 
-  // Whether the spool has a log of the day that an unfinished pass wrote: it stands when this pass
-  // cannot write another one.
-  bool keepsEarlierLog();
-
   // Before the gate is recorded: what the log used up is gone for good, if it was written.
   void settle(ReportOutcome outcome);
   // The pass has ended; for a gated one the gate has been recorded.

@@ -89,7 +89,7 @@ void RunDriver::runSequence(std::int32_t day, const std::optional<Array>& appInf
   RunStep(log, "checkpoint", [&] { platform_.counterStore.TLClientCheckpoint(); });
   auto outcome = ReportOutcome::kLost;
   RunStep(log, "aggregated log", [&] { outcome = writeLog(day, appInfo, journal); });
-  if (outcome == ReportOutcome::kLost && !journal.keepsEarlierLog()) {
+  if (outcome == ReportOutcome::kLost) {
     const std::int32_t today = platform_.counterStore.TLDaysSince1970();
     log.error("The log of day %d is not in the spool; \"%s\" repeats it", day,
               CommandFor(day, today));
