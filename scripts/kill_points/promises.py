@@ -120,7 +120,7 @@ class Judgement:
 
     def grow(self, amount: int) -> None:
         self.usage += amount
-        scenes.write_usage(self.root, self.stage.today, self.usage)
+        scenes.write_usage(self.root, self.usage)
 
     def run_passes(self) -> None:
         programs, now = self.stage.programs, int(time.time())

@@ -2,7 +2,6 @@
 from __future__ import annotations
 
 import dataclasses
-import datetime
 import json
 import pathlib
 import plistlib
@@ -82,13 +81,11 @@ def scenes(stage: Stage) -> list[Scene]:
     ]
 
 
-def write_usage(root: pathlib.Path, today: int, kilobytes: int) -> None:
+def write_usage(root: pathlib.Path, kilobytes: int) -> None:
     """The counters of the kernel, which grow while nobody counts them."""
-    since = datetime.datetime.fromtimestamp((today - 2) * 86400, datetime.timezone.utc)
-    records = plistlib.loads(story.usage_list(kilobytes))
-    records[0]["since"] = since.replace(tzinfo=None)
     path = root / story.USAGE
-    path.parent.mkdir(parents=True, exist_ok=True)
+    records = plistlib.loads(story.usage_list(kilobytes))
+    records[0]["since"] = plistlib.loads(path.read_bytes())[0]["since"]
     path.write_bytes(plistlib.dumps(records))
 
 
@@ -122,7 +119,7 @@ def _prepare_fresh(stage: Stage, root: pathlib.Path) -> None:
     """Nothing has run here, and yesterday was counted."""
     now, ctl = int(time.time()), stage.programs.quorletctl
     root.mkdir()
-    stage.programs.run(root, now - 2 * 86400, ctl, "init", "--demo")
+    stage.programs.run(root, now, ctl, "init", "--demo")
     _write(root, story.WHITELIST, _whitelist())
     _set_version(root, NEW_VERSION)
     _become_due(stage, root)
@@ -141,7 +138,7 @@ def _become_due(stage: Stage, root: pathlib.Path) -> None:
     for domain in FOREIGN:
         _change_preferences(root, domain, Foreign="kept")
     _change_preferences(root, "nuvex.aggregated", DatabaseCorruptionCount=CORRUPTIONS)
-    write_usage(root, stage.today, USAGE)
+    write_usage(root, USAGE)
 
 
 def _prepare_due(stage: Stage, root: pathlib.Path) -> None:
@@ -151,7 +148,7 @@ def _prepare_due(stage: Stage, root: pathlib.Path) -> None:
     stage.programs.run(root, now - 2 * 86400, ctl, "init", "--demo")
     _write(root, story.WHITELIST, _whitelist())
     _set_version(root, OLD_VERSION)
-    write_usage(root, stage.today, USAGE_COUNTED)
+    write_usage(root, USAGE_COUNTED)
     stage.programs.run(root, now - 2 * 86400, ctl, "tally", "add", "nuvex.story.b", "9", "--day",
                        str(stage.today - 2))
     stage.programs.run(root, now - 86400, stage.programs.quorlet, "-d")
