@@ -54,7 +54,7 @@ class Spool:
     status: int = 0
 
 
-def _plist(path: pathlib.Path, data: bytes):
+def read_plist(path: pathlib.Path, data: bytes):
     try:
         return plistlib.loads(data)
     except Exception as error:  # whatever is wrong with it, it is not whole
@@ -72,7 +72,7 @@ def _read_log(path: pathlib.Path, spool: Spool) -> None:
         spool.status += 1
         return
     require(header["type"] == "193", f"{path.name} is of type {header['type']}")
-    document = _plist(path, body)
+    document = read_plist(path, body)
     start = document["TLStartDate"].replace(tzinfo=story.datetime.timezone.utc).timestamp()
     day = int(start) // 86400
     spool.days.setdefault(day, []).append(document)
@@ -91,13 +91,13 @@ def check_files(root: pathlib.Path) -> None:
     """What is there under its name is whole, before any program has looked at it."""
     for path in (root / PREFERENCES).glob("*.plist"):
         if not path.name.startswith("."):
-            _plist(path, path.read_bytes())
+            read_plist(path, path.read_bytes())
     read_spool(root)
     aside = [path.name for path in root.rglob("*.damaged*")]
     require(not aside, f"set aside as damaged: {', '.join(aside)}")
 
 
-def _structured_lines(root: pathlib.Path) -> list[dict]:
+def structured_lines(root: pathlib.Path) -> list[dict]:
     lines = []
     for path in sorted((root / STRUCTURED).glob("structured*.jsonl")):
         torn = 0
@@ -110,12 +110,13 @@ def _structured_lines(root: pathlib.Path) -> list[dict]:
     return lines
 
 
-def _check_structured(root: pathlib.Path, events: set[int]) -> None:
-    lines = _structured_lines(root)
+def check_structured(root: pathlib.Path, events: set[int], once: bool = True) -> None:
+    """ONCE: no storage line of a day stands twice."""
+    lines = structured_lines(root)
     storage = collections.Counter((line["time"][:10], json.dumps(line["data"], sort_keys=True))
                                   for line in lines if line["type"] == 176)
     doubled = sum(count - 1 for count in storage.values())
-    require(doubled == 0, f"{doubled} type-176 lines of one day stand twice")
+    require(doubled == 0 or not once, f"{doubled} type-176 lines of one day stand twice")
     seen = {line["data"].get("reg0") for line in lines if line["type"] == 172}
     queue = root / story.QUEUE
     for path in queue.iterdir() if queue.is_dir() else ():
@@ -125,7 +126,7 @@ def _check_structured(root: pathlib.Path, events: set[int]) -> None:
     require(events <= seen, f"ECC events lost: {sorted(events - seen)}")
 
 
-def _dump(programs: Programs, root: pathlib.Path, at: int):
+def dump(programs: Programs, root: pathlib.Path, at: int):
     """Scalars, and how many values each distribution has."""
     scalars: dict[Key, int] = {}
     values: collections.Counter[Key] = collections.Counter()
@@ -142,7 +143,7 @@ def _of_story(counters: dict[Key, int]) -> dict[Key, int]:
     return {key: value for key, value in counters.items() if key[1].startswith("nuvex.story")}
 
 
-def _difference(found: dict, wanted: dict) -> str:
+def difference(found: dict, wanted: dict) -> str:
     keys = [key for key in {**wanted, **found} if found.get(key) != wanted.get(key)]
     shown = ", ".join(f"{key[1]} of day {key[0]} is {found.get(key)}, not {wanted.get(key)}"
                       for key in keys[:2])
@@ -153,7 +154,7 @@ def _check_counters(scalars, values, states: list[State]) -> None:
     """Exactly what was acknowledged, or that and the whole step that the cut hit."""
     found = {**_of_story(scalars), **_of_story(values)}
     wanted = [{**state.scalars, **state.values} for state in states]
-    require(found in wanted, "counters: " + _difference(found, wanted[0]))
+    require(found in wanted, "counters: " + difference(found, wanted[0]))
 
 
 def _check_usage(scalars, total: int, states: list[State]) -> None:
@@ -168,7 +169,7 @@ def _check_usage(scalars, total: int, states: list[State]) -> None:
 def _check_preference(root: pathlib.Path, states: list[State]) -> None:
     domain, name = story.PREFERENCE
     path = root / PREFERENCES / f"{domain}.plist"
-    found = _plist(path, path.read_bytes()).get(name) if path.exists() else None
+    found = read_plist(path, path.read_bytes()).get(name) if path.exists() else None
     wanted = [state.preference for state in states]
     require(found in wanted, f"preference {name} is {found}, not {wanted[0]}")
 
@@ -202,7 +203,7 @@ def _check_log(day: int, document: dict, states: list[State]) -> None:
     found = _of_story(found)
     wanted = [{key: value for key, value in {**state.scalars, **state.values}.items()
                if key[0] == day} for state in states]
-    require(found in wanted, f"the log of day {day}: " + _difference(found, wanted[0]))
+    require(found in wanted, f"the log of day {day}: " + difference(found, wanted[0]))
 
 
 def _grow(root: pathlib.Path, amount: int, surviving: int) -> int:
@@ -250,11 +251,11 @@ def judge(root: pathlib.Path, steps: list[Step], acknowledged: int,
     total = attempt(run_passes, programs, root, at)
     if total is None:
         return broken
-    counters = attempt(_dump, programs, root, at + 86400)
+    counters = attempt(dump, programs, root, at + 86400)
     if counters is not None:
         attempt(_check_counters, *counters, states)
         attempt(_check_usage, counters[0], total, states)
     attempt(_check_preference, root, states)
     attempt(_check_logs, root, at // 86400, states)
-    attempt(_check_structured, root, states[0].events)
+    attempt(check_structured, root, states[0].events)
     return broken

@@ -6,6 +6,7 @@
 //   published      the aggregated log has been in the spool
 //   storageLogged  the storage log's entries are in the structured log, or staged for it
 //   osVersionBefore, corruptions, appInfo    what the aggregated log tells once only
+//   corruptionsTold    file name of an aggregated log -> the corruptions that it tells
 #include "driver/pass_journal.h"
 
 #include <algorithm>
@@ -86,9 +87,13 @@ PassJournal::PassJournal(Platform& platform, std::int32_t day, bool isGated, std
 }
 
 void PassJournal::readEntries(std::int64_t gateDay) {
+  CounterStore& store = platform_.counterStore;
   std::optional<Dictionary> stored;
-  if (!platform_.counterStore.readNote(kNote, stored) || !stored) return;
-  const std::int32_t first = platform_.counterStore.TLDaysSince1970() - kDaysKept;
+  // Looked at twice: a passing error would leave what an unfinished pass wrote beside what this one
+  // writes.
+  const bool isRead = store.readNote(kNote, stored) || store.readNote(kNote, stored);
+  if (!isRead || !stored) return;
+  const std::int32_t first = store.TLDaysSince1970() - kDaysKept;
   for (const auto& [name, value] : *stored) {
     const std::optional<std::int32_t> day = DayOf(name);
     const Dictionary* entry = value.asDictionary();
@@ -161,6 +166,26 @@ void PassJournal::takeOverCorruptions() {
   }
 }
 
+// Whether an unfinished pass's log of the day stands in for the one that this pass could not write:
+// then that one's corruptions are those that were told.
+bool PassJournal::keepsLeftLog() {
+  if (!isRepeated_ || !hasSpooledLog(entry())) return false;
+  const Dictionary* told = DictionaryEntry(entry(), "corruptionsTold");
+  std::int64_t corruptions = 0;
+  for (const std::string& name : LogsNamed(entry(), kAggregatedLog)) {
+    if (told == nullptr || !platform_.diagnostics.hasLog(name)) continue;
+    corruptions = IntegerEntry(*told, name).value_or(0);
+  }
+  const std::int64_t untold = usedUp_.corruptions - corruptions;
+  if (untold != 0) {
+    platform_.preferences.addToInteger(kCorruptionCount, untold, kCountDomain);
+    usedUp_.corruptionsTaken -= untold;
+    usedUp_.corruptions = corruptions;
+  }
+  entry()["published"] = true;
+  return true;
+}
+
 bool PassJournal::hasSpooledLog(const Dictionary& entry) {
   return IsSet(entry, "published") ||
          std::ranges::any_of(LogsNamed(entry, kAggregatedLog), [this](const std::string& name) {
@@ -196,7 +221,13 @@ void PassJournal::noteLog(std::string_view name, const std::string& fileName) {
   std::vector<std::string> logs = LogsNamed(entry(), name);
   logs.push_back(fileName);
   SetLogs(entry(), name, logs);
-  if (name == kAggregatedLog && osVersionBefore_) entry()["osVersionBefore"] = *osVersionBefore_;
+  if (name == kAggregatedLog) {
+    if (osVersionBefore_) entry()["osVersionBefore"] = *osVersionBefore_;
+    const Dictionary* stored = DictionaryEntry(entry(), "corruptionsTold");
+    Dictionary told = stored != nullptr ? stored->shallowCopy() : Dictionary();
+    told[fileName] = Int64(usedUp_.corruptions);
+    entry()["corruptionsTold"] = told;
+  }
   write();
 }
 
@@ -225,8 +256,11 @@ bool PassJournal::NotingDiagnostics::writeLog(const LogRequest& request, const L
   // A pass that was killed before its log appeared noted a name that was free, and so is given
   // again.
   std::erase(replaced, own);
-  if (!replaced.empty() && diagnostics_.removeLogs(replaced)) {
+  if (replaced.empty()) return true;
+  if (diagnostics_.removeLogs(replaced)) {
     SetLogs(journal_.entry(), request.name, {own});
+  } else {
+    journal_.unremoved_.insert(journal_.unremoved_.end(), replaced.begin(), replaced.end());
   }
   return true;
 }
@@ -241,6 +275,8 @@ PassProgress PassJournal::progress() {
 
 void PassJournal::settle(ReportOutcome outcome) {
   Preferences& preferences = platform_.preferences;
+  // What was in the way a moment ago may be gone.
+  if (!unremoved_.empty()) platform_.diagnostics.removeLogs(unremoved_);
   if (outcome != ReportOutcome::kWritten) {
     // Nobody was told of them: they are counted on.
     if (usedUp_.corruptionsTaken != 0) {

@@ -38,6 +38,10 @@ class PassJournal {
   // it appears, tells what unfinished passes used up, and replaces what they wrote.
   Diagnostics& diagnostics() { return diagnostics_; }
 
+  // When this pass could not write the aggregated log: whether one that an unfinished pass of the
+  // day wrote stays, and counts as this pass's.
+  bool keepsLeftLog();
+
   // How far an unfinished pass of the day got with the storage log, and how this one tells.
   PassProgress progress();
 
@@ -91,6 +95,8 @@ class PassJournal {
   Dictionary entries_;
   bool isRepeated_ = false;  // an unfinished pass of the day is being repeated
   std::optional<std::string> osVersionBefore_;
+  std::vector<std::string>
+      unremoved_;  // logs that this pass has replaced, but that are still there
   UsedUp usedUp_;
 };
 

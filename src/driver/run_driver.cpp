@@ -90,9 +90,14 @@ void RunDriver::runSequence(std::int32_t day, const std::optional<Array>& appInf
   auto outcome = ReportOutcome::kLost;
   RunStep(log, "aggregated log", [&] { outcome = writeLog(day, appInfo, journal); });
   if (outcome == ReportOutcome::kLost) {
-    const std::int32_t today = platform_.counterStore.TLDaysSince1970();
-    log.error("The log of day %d is not in the spool; \"%s\" repeats it", day,
-              CommandFor(day, today));
+    const std::string command = CommandFor(day, platform_.counterStore.TLDaysSince1970());
+    if (journal.keepsLeftLog()) {
+      outcome = ReportOutcome::kWritten;
+      log.error("The log of day %d stays that of a pass that was cut short; \"%s\" writes another",
+                day, command);
+    } else {
+      log.error("The log of day %d is not in the spool; \"%s\" repeats it", day, command);
+    }
   }
   RunStep(log, "platform statistics", [&] {
     Platform platform = platform_.with({.diagnostics = &journal.diagnostics()});

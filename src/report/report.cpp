@@ -68,7 +68,9 @@ ReportOutcome TLReport::writeLogForYesterdayWithAppInfo(std::int32_t yesterday,
     allRead = !history->failed();
   }
   if (_scalarsOutput.empty() && _distributionsOutput.empty() && _histogramsOutput.empty()) {
-    return allRead ? ReportOutcome::kNothingToReport : ReportOutcome::kLost;
+    // Without a whitelist there is nothing to report; one that cannot be used hides what there is.
+    const bool isLost = !allRead || (!_config && _platform.environment.stat(kWhitelistPath));
+    return isLost ? ReportOutcome::kLost : ReportOutcome::kNothingToReport;
   }
   return serializeWithDateAndAppInfo(yesterday, appInfo) ? ReportOutcome::kWritten
                                                          : ReportOutcome::kLost;

@@ -12,6 +12,7 @@
 #include <algorithm>
 #include <cerrno>
 #include <cstdio>
+#include <limits>
 #include <tuple>
 #include <variant>
 #include <vector>
@@ -43,7 +44,13 @@ int FindLogs(const std::string& directory, std::vector<StoredLog>& logs) {
   for (const std::string& name : std::get<std::vector<std::string>>(names)) {
     const std::string path = JoinPath(directory, name);
     struct stat status = {};
-    if (name.starts_with('.') || lstat(path.c_str(), &status) != 0) continue;
+    if (name.starts_with('.')) continue;
+    if (lstat(path.c_str(), &status) != 0) {
+      if (errno == ENOENT) continue;
+      // It is there all the same; as the newest log it goes last.
+      status = {};
+      status.st_mtim.tv_sec = std::numeric_limits<time_t>::max();
+    }
     if (S_ISDIR(status.st_mode)) continue;
     logs.push_back({status.st_mtim.tv_sec, status.st_mtim.tv_nsec, name, path,
                     static_cast<std::uint64_t>(std::max<off_t>(status.st_size, 0))});
@@ -71,9 +78,10 @@ std::string FileNameTime(Date date) {
   return text;
 }
 
+// What cannot be looked at may be there.
 bool Exists(const std::string& path) {
   struct stat status = {};
-  return lstat(path.c_str(), &status) == 0;
+  return lstat(path.c_str(), &status) == 0 || errno != ENOENT;
 }
 
 // The body's way into the file; remembers why it failed and refuses what no quota could hold.
@@ -235,9 +243,12 @@ class LinuxDiagnostics : public Diagnostics {
 
   // A name that is new in pending/ and in outbox/.
   std::string newName(const std::string& stem) const {
+    // No second has as many logs: where nothing can be looked at, the search ends all the same.
+    constexpr std::uint64_t kMost = 1000;
     for (std::uint64_t number = 1;; ++number) {
       std::string name = stem + std::to_string(number) + ".log";
-      if (!Exists(pending_ + "/" + name) && !Exists(outbox_ + "/" + name)) return name;
+      const bool isNew = !Exists(pending_ + "/" + name) && !Exists(outbox_ + "/" + name);
+      if (isNew || number == kMost) return name;
     }
   }
 
