@@ -25,12 +25,12 @@ std::optional<Dictionary> NoteOSVersion(Platform& platform, std::int32_t day) {
   const std::string* previousText = previous ? previous->asString() : nullptr;
   if (previousText != nullptr && *previousText == current) return std::nullopt;
   const std::string before = previousText != nullptr ? *previousText : kUnknown;
-  platform.preferences.DGWPreferencesSetValue(kLastOSVersion, PropertyValue(current), kDomain);
   // Written together: should this log never be spooled, the next one tells it.
   if (!platform.preferences.DGWPreferencesGetValue(kOSVersionBefore, kDomain)) {
     platform.preferences.DGWPreferencesSetValue(
         kOSVersionBefore, Dictionary{{"version", before}, {"day", Int32(day)}}, kDomain);
   }
+  platform.preferences.DGWPreferencesSetValue(kLastOSVersion, PropertyValue(current), kDomain);
   platform.preferences.DGWPreferencesSynchronize(kDomain);
   return Dictionary{{"previous_os_version", before}};
 }

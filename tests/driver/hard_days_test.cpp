@@ -114,6 +114,15 @@ class HardDays {
     return found;
   }
 
+  // The OS versions that logs name as those before.
+  std::vector<std::string> versionsTold() {
+    std::vector<std::string> versions;
+    for (const SubmittedLog& log : device.diagnostics.logs) {
+      if (log.metadata) versions.push_back(*StringEntry(*log.metadata, "previous_os_version"));
+    }
+    return versions;
+  }
+
   // A day's log tells what was put in on that day.
   void expectLogOf(std::int32_t day) {
     const auto logs = logsOf(day);
@@ -150,6 +159,9 @@ class HardDays {
     }
     const auto waiting = device.preferences.DGWPreferencesGetIntegerValue(kCount, kCountDomain);
     EXPECT_EQ(told + waiting, corruptions) << "corruptions";
+    const std::vector<std::string> versions = versionsTold();
+    EXPECT_EQ(std::set<std::string>(versions.begin(), versions.end()).size(), versions.size())
+        << "an OS version was told twice";
   }
 
   FakePlatform device;
@@ -181,6 +193,8 @@ TEST(HardDays, EachCallOfEachServiceFailsOnce) {
       ++number;
       SCOPED_TRACE(testing::Message() << "way " << static_cast<int>(way) << ", call " << number);
       HardDays days;
+      days.device.clock.goToDay(19999);
+      days.count(1);
       days.device.clock.goToDay(20000);
       days.transfer(1000);
       days.pass();
@@ -218,6 +232,7 @@ TEST(HardDays, EachCallOfEachServiceFailsOnce) {
       days.pass();
       days.expectLogOf(20001);
       days.expectNothingLostOrDoubled();
+      EXPECT_EQ(days.versionsTold(), (std::vector<std::string>{"<unknown>", "TestOS 1 (A1)"}));
     }
     EXPECT_GT(number, 30);
   }
