@@ -226,9 +226,10 @@ class FailingPlatform {
 
   struct FailingApplications : Applications, Service {
     using Service::Service;
-    void EnumerateApplicationBundles(
+    bool EnumerateApplicationBundles(
         const std::function<void(ApplicationBundleType)>& visit) override {
-      make("list applications", [&] { real.applications.EnumerateApplicationBundles(visit); });
+      return make("list applications", false,
+                  [&] { return real.applications.EnumerateApplicationBundles(visit); });
     }
   };
 

@@ -240,10 +240,11 @@ class FakeEnvironment : public Environment {
 
 class FakeApplications : public Applications {
  public:
-  void EnumerateApplicationBundles(
+  bool EnumerateApplicationBundles(
       const std::function<void(ApplicationBundleType)>& visit) override {
     ++enumerations;
     for (const ApplicationBundleType type : bundles) visit(type);
+    return true;
   }
   std::vector<ApplicationBundleType> bundles;
   int enumerations = 0;

@@ -46,7 +46,7 @@ struct LinuxPlatform::Services {
         crashSupport(MakeLinuxCrashSupport(root, access, *clock, *osVersion, *log)),
         supportLibrary(MakeLinuxSupportLibrary()),
         kernelParameters(MakeLinuxKernelParameters(root, access, *log)),
-        applications(MakeLinuxApplications(root)),
+        applications(MakeLinuxApplications(root, *log)),
         locale(MakeLinuxLocale(root, [](const char* name) { return getenv(name); })),
         passLock(MakeLinuxPassLock(root, access, *log)),
         namedService(MakeLinuxNamedService(root, *log)),
