@@ -115,11 +115,12 @@ def compare(answers: dict[str, tuple[int, str]]) -> Comparison:
                     before["num_err_log_entries"])
         result.same(f"serial number of {name}", smartctl["serial_number"] in text("health"), False)
     card = health["mmcblk0"]
+    result.same("card's place", card["drive"], CARD_PLACE)
     result.same("card", (card["kind"], card["model"], card["figures"]),
                 ("sd", text("card").strip(), {}))
     result.same("info", ("NumLogicalWrites" in text("info"), "NumPhysicalWrites" in text("info")),
                 (True, False))
-    result.same("user", "needs root" in text("user"), True)
+    result.same("user", (answers["user"][0], "needs root" in text("user")), (1, True))
     result.same("user's info", (answers["user-info"][0], "needs root" in text("user-info")),
                 (1, True))
     recorded = dict(line.split("\t")[2:4] for line in text("recorded").splitlines()

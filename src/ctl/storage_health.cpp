@@ -205,15 +205,25 @@ void PrintStorageHealth(Session& session, bool json) {
   }
   const FlashMemories memories = ReadFlashMemories(note);
   std::vector<Row> rows;
+  std::string failures;
   for (const Drive& drive : drives) {
     rows.push_back({drive, LifeOf(services.counterStore, memories, drive)});
     const std::string trouble = DriveTrouble(drive);
-    if (!trouble.empty()) session.messages.add(LogLevel::kError, trouble);
+    // One that sleeps is as it should be.
+    if (drive.answer == DriveAnswer::kAsleep) {
+      session.messages.add(LogLevel::kError, trouble);
+    } else if (!trouble.empty()) {
+      failures += (failures.empty() ? "" : "; ") + trouble;
+    }
   }
-  if (!json) return PrintTable(session, rows);
-  Array described;
-  for (const Row& row : rows) described.push_back(Described(row));
-  session.out.line(JsonText(Dictionary{{"drives", described}}, JsonForm::kPlain));
+  if (json) {
+    Array described;
+    for (const Row& row : rows) described.push_back(Described(row));
+    session.out.line(JsonText(Dictionary{{"drives", described}}, JsonForm::kPlain));
+  } else {
+    PrintTable(session, rows);
+  }
+  if (!failures.empty()) throw Failure(failures);
 }
 
 }  // namespace quorlet

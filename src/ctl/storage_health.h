@@ -9,8 +9,9 @@
 
 namespace quorlet {
 
-// Prints the table, or with `json` an object with an array "drives". Drives that could not be asked
-// have a note each; throws Failure when there is no drive, or when none could be asked.
+// Prints the table, or with `json` an object with an array "drives". A drive that sleeps has a note.
+// Throws Failure when there is no drive or none could be asked, and, with all the others printed,
+// when one could not be asked.
 void PrintStorageHealth(Session& session, bool json);
 
 // Why the drive does not tell, in words for people; empty when it tells.
