@@ -12,8 +12,8 @@ class Applications {
  public:
   virtual ~Applications() = default;
 
-  // Visits every installed application bundle once. False, after an error line, when not all of them
-  // could be looked for.
+  // Visits every installed application bundle once. False, after an error line, when not all of
+  // them could be looked for.
   virtual bool EnumerateApplicationBundles(
       const std::function<void(ApplicationBundleType)>& visit) = 0;
 };
