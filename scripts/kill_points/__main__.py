@@ -1,4 +1,4 @@
-"""Kills the installed programs at their system calls, fails those calls, and checks the promises."""
+"""Kills the installed programs at their system calls, fails these, and checks the promises."""
 from __future__ import annotations
 
 import argparse
@@ -8,6 +8,7 @@ import os
 import pathlib
 import random
 import shutil
+import signal
 import subprocess
 import sys
 import tempfile
@@ -153,19 +154,29 @@ def repeat_command(name: str, hit: calls.Hit, options: argparse.Namespace) -> st
     return f"scripts/kill-points{programs} --point {name}:{hit}"
 
 
+def print_broken(name: str, hit: calls.Hit, broken: list[str],
+                 options: argparse.Namespace) -> None:
+    again = repeat_command(name, hit, options)
+    if options.point:
+        print("\n".join([f"broken: {name}:{hit} ({hit.about()})", *(f"  {one}" for one in broken)]))
+        return
+    print(f"broken: {name}:{hit} ({hit.about()}): {'; '.join(broken)} [{again}]", flush=True)
+
+
 def check(theatre: Theatre, points: list[tuple[str, calls.Hit]], options: argparse.Namespace,
           lie: str | None = None) -> int:
     """Prints each broken point, unless a lie is to break them; how many there are."""
     started, count, missed = time.monotonic(), 0, 0
-    with concurrent.futures.ThreadPoolExecutor(options.jobs) as pool:
+    pool = concurrent.futures.ThreadPoolExecutor(options.jobs)
+    try:
         results = pool.map(lambda point: check_point(theatre, *point, lie, options.trees), points)
         for (name, hit), (was_hit, broken) in zip(points, results):
             missed += not was_hit
             count += bool(broken)
             if broken and not lie:
-                separator = "\n  " if options.point else "; "
-                print(f"broken: {name}:{hit} ({hit.about()}): {separator.join(['', *broken])[2:]}"
-                      f" [{repeat_command(name, hit, options)}]", flush=True)
+                print_broken(name, hit, broken, options)
+    finally:
+        pool.shutdown(cancel_futures=True)
     kills = sum(hit.error is None for _, hit in points)
     with_lie = f", {lie} only saying that it was done" if lie else ""
     print(f"{count} of {len(points)} points broken{with_lie}; {kills} kills, "
@@ -191,6 +202,7 @@ def prove(theatre: Theatre, points: list[tuple[str, calls.Hit]], options: argpar
 
 def main() -> int:
     options = parse_options()
+    signal.signal(signal.SIGTERM, lambda *_: sys.exit(1))  # the trees go then too
     programs = find_programs(options.bin or HERE.parents[1] / "build/release/src")
     draw = random.Random(options.seed)
     memory = "/dev/shm" if os.access("/dev/shm", os.W_OK) else None
