@@ -1,10 +1,11 @@
 // Any texts of /sys and /proc about an eMMC and a UFS drive: figures that are in range, names
 // that are clean.
 
+#include "fakes/fake_system_log.h"
 #include "fuzz_support.h"
 #include "platform/linux/drives/drive_figures.h"
 #include "platform/linux/drives/drive_reader.h"
-#include "platform/linux/live/kernel_text.h"
+#include "platform/linux/kernel_text.h"
 
 namespace quorlet {
 namespace {
@@ -48,12 +49,13 @@ extern "C" int LLVMFuzzerTestOneInput(const std::uint8_t* data, std::size_t size
   static FuzzFiles files;
   const auto parts = Parts(AsText(data, size), std::size(kPaths));
   for (std::size_t i = 0; i < std::size(kPaths); ++i) files.set(kPaths[i], parts[i]);
-  const auto reader =
-      std::make_shared<DriveReader>(files.device().root(), [](auto&&...) { return NvmePages(); });
+  FakeSystemLog log;
+  const auto reader = std::make_shared<DriveReader>(LoggingRoot(files.device().root(), log),
+                                                    [](auto&&...) { return NvmePages(); });
   // The UFS device's own texts are asked for by a process: here they are decoded at once.
   for (const FoundDrive& found : reader->find()) {
     if (found.kind == DriveKind::kUfs) {
-      static_cast<void>(IsAsleep(found));
+      static_cast<void>(IsAsleep(LoggingRoot(files.device().root(), log), found));
     } else {
       CheckFigures(reader->read(found));
     }

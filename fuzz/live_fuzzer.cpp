@@ -5,8 +5,9 @@
 
 #include "channels/drvreport.h"
 #include "fakes/fake_driver_registry.h"
+#include "fakes/fake_system_log.h"
 #include "fuzz_support.h"
-#include "platform/linux/live/kernel_text.h"
+#include "platform/linux/kernel_text.h"
 #include "platform/linux/live/live_source.h"
 #include "values/byte_reader.h"
 
@@ -118,7 +119,8 @@ extern "C" int LLVMFuzzerTestOneInput(const std::uint8_t* data, std::size_t size
     files.set(path, parts[next++]);
   }
   for (const char* path : kChangingPaths) files.set(path, parts[next++]);
-  const auto source = MakeLiveChannels(files.device().root());
+  FakeSystemLog log;
+  const auto source = MakeLiveChannels(LoggingRoot(files.device().root(), log));
   const std::size_t count = Read(*source);
   Expect(Read(*source) == count, "other channels at once");
   for (const char* path : kChangingPaths) files.set(path, parts[next++]);

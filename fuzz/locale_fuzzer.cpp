@@ -40,7 +40,8 @@ void CheckLocale(const Root& root, const std::string& variable) {
                ? variable.c_str()
                : nullptr;
   };
-  const auto locale = MakeLinuxLocale(root, environment);
+  FakeSystemLog log;
+  const auto locale = MakeLinuxLocale(LoggingRoot(root, log), environment);
   std::vector<std::string> languages = locale->PreferredLanguages();
   for (const std::string& language : languages) {
     const auto tag = ParseLocaleName(language);

@@ -56,7 +56,8 @@ class TempRoot {
   }
   // The names in a directory in byte order, hidden ones included.
   std::vector<std::string> list(std::string_view absolutePath) const {
-    return ListDirectory(path(absolutePath));
+    auto names = ReadDirectory(path(absolutePath));
+    return std::get<std::vector<std::string>>(std::move(names));
   }
 
  private:

@@ -181,17 +181,17 @@ struct DrivesTest : testing::Test {
     std::vector<std::unique_ptr<EntrySource>> sources;
     sources.push_back(MakeDriveExports(reader));
     const auto registry = MakeLinuxDriverRegistry(std::move(sources));
-    FakePlatform fake;
     Platform services = fake.services.with({.driverRegistry = registry.get()});
     return CopyNANDInfo(services);
   }
 
   static constexpr char kStat[] = " 1 2 3 4 5 6 7 8 9 10 11 12 13 16 15 16 17\n";
   TempRoot root;
+  FakePlatform fake;
   int asked = 0;
   NvmePages pages{.answer = DriveAnswer::kTold, .health = DailyPage(), .datacenter = {}};
-  std::shared_ptr<DriveReader> reader =
-      std::make_shared<DriveReader>(root.root(), [this](const std::string&, auto limit) {
+  std::shared_ptr<DriveReader> reader = std::make_shared<DriveReader>(
+      LoggingRoot(root.root(), fake.log), [this](const std::string&, auto limit) {
         ++asked;
         EXPECT_EQ(limit, std::chrono::seconds(2));
         return pages;
@@ -311,7 +311,8 @@ TEST_F(DrivesTest, WhatTheDriveDoesNotTellIsLeftOut) {
   }
   std::filesystem::remove_all(root.path("/sys/block/nvme0n2"));
   pages.datacenter = DatacenterPage();
-  reader = std::make_shared<DriveReader>(root.root(), [this](auto&&...) { return pages; });
+  reader = std::make_shared<DriveReader>(LoggingRoot(root.root(), fake.log),
+                                         [this](auto&&...) { return pages; });
   expected = told.shallowCopy();
   expected[kNANDInfoNumPhysicalWritesKey] = Int64(1'708'984'375);
   expected[kNANDInfoNumPhysicalReadsKey] = Int64(1'953'125'000);

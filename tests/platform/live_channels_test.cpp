@@ -6,8 +6,9 @@
 #include <map>
 #include <set>
 
+#include "fakes/fake_system_log.h"
 #include "fakes/temp_root.h"
-#include "platform/linux/live/kernel_text.h"
+#include "platform/linux/kernel_text.h"
 #include "platform/linux/live/live_source.h"
 #include "values/byte_reader.h"
 
@@ -133,7 +134,8 @@ class LiveChannelsTest : public testing::Test {
   }
 
   TempRoot device;
-  std::unique_ptr<EntrySource> source = MakeLiveChannels(device.root());
+  FakeSystemLog log;
+  std::unique_ptr<EntrySource> source = MakeLiveChannels(LoggingRoot(device.root(), log));
   std::map<std::string, std::uint64_t> types;
 };
 
@@ -224,7 +226,7 @@ TEST_F(LiveChannelsTest, AnOddFileCostsItsOwnChannelOnly) {
       {kDisks + std::string("/1:0:0:0/block/sda/diskseq"), "5\n", sdaAndTotals},
   };
   for (const auto& [path, bytes, lost] : cases) {
-    source = MakeLiveChannels(device.root());
+    source = MakeLiveChannels(LoggingRoot(device.root(), log));
     const std::string before = device.read(path);
     const Channels channels = describe();
     auto expected = read(channels);
@@ -245,6 +247,13 @@ TEST_F(LiveChannelsTest, AnOddFileCostsItsOwnChannelOnly) {
     EXPECT_EQ(found, expected) << path << ": " << bytes.substr(0, 50);
     device.write(path, before);
   }
+  // A directory that cannot be read costs its own channels too, and says so.
+  EXPECT_EQ(log.lines.size(), 0u);
+  const std::string zones = device.path("/sys/class/thermal");
+  std::filesystem::remove_all(zones);
+  device.write("/sys/class/thermal", "");
+  EXPECT_GT(describe().size(), 0u);
+  EXPECT_EQ(log.errors(), std::vector{"Cannot read " + zones + ": Not a directory"});
 }
 
 TEST_F(LiveChannelsTest, CountersThatFallHaveWrappedOrStartedAnew) {

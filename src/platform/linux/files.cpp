@@ -289,12 +289,6 @@ std::variant<std::vector<std::string>, int> ReadDirectory(const std::string& dir
   return names;
 }
 
-std::vector<std::string> ListDirectory(const std::string& directory) {
-  auto names = ReadDirectory(directory);
-  auto* read = std::get_if<std::vector<std::string>>(&names);
-  return read != nullptr ? std::move(*read) : std::vector<std::string>();
-}
-
 int MoveAsideAsDamaged(const std::string& path, std::string& aside) {
   constexpr int kMostKept = 9;
   timespec oldest{};

@@ -107,8 +107,6 @@ std::string JoinPath(const std::string& directory, std::string_view name);
 // no such directory.
 [[nodiscard]] std::variant<std::vector<std::string>, int> ReadDirectory(
     const std::string& directory);
-// The same for whoever can do without: empty when it cannot be read.
-std::vector<std::string> ListDirectory(const std::string& directory);
 
 // Moves the file at `path` aside as "<path>.damaged", or as ".damaged.2" to ".damaged.9" where that
 // is taken; the oldest of them goes when all are. Writes the new name to `aside`. 0 or the errno.

@@ -25,7 +25,7 @@ std::vector<std::unique_ptr<EntrySource>> EntrySources(const Root& root, SystemL
   std::vector<std::unique_ptr<EntrySource>> sources;
   sources.push_back(MakeDriverFiles(root, log));
   sources.push_back(MakeDriveExports(drives));
-  sources.push_back(MakeLiveChannels(root, MakeDrivesPublisher(drives)));
+  sources.push_back(MakeLiveChannels(LoggingRoot(root, log), MakeDrivesPublisher(drives)));
   return sources;
 }
 
@@ -49,11 +49,12 @@ struct LinuxPlatform::Services {
         supportLibrary(MakeLinuxSupportLibrary()),
         kernelParameters(MakeLinuxKernelParameters(root, access, *log)),
         applications(MakeLinuxApplications(root, *log)),
-        locale(MakeLinuxLocale(root, [](const char* name) { return getenv(name); })),
+        locale(MakeLinuxLocale(LoggingRoot(root, *log),
+                               [](const char* name) { return getenv(name); })),
         passLock(MakeLinuxPassLock(root, access, *log)),
         namedService(MakeLinuxNamedService(root, *log)),
         notifications(MakeLinuxNotifications(root, *log)),
-        drives(std::make_shared<DriveReader>(root)),
+        drives(std::make_shared<DriveReader>(LoggingRoot(root, *log))),
         driverRegistry(MakeLinuxDriverRegistry(EntrySources(root, *log, drives))),
         taskSnapshot(MakeLinuxTaskSnapshot(root, *log)),
         networkUsage(MakeLinuxNetworkUsage(root, *log)) {}

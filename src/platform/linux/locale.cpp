@@ -35,7 +35,7 @@ class LanguageList {
 
 class LinuxLocale : public LocaleService {
  public:
-  LinuxLocale(const Root& root, EnvironmentVariable environment)
+  LinuxLocale(const LoggingRoot& root, EnvironmentVariable environment)
       : root_(root), environment_(std::move(environment)) {}
 
   // Every source adds its languages after those of the sources before it.
@@ -57,7 +57,7 @@ class LinuxLocale : public LocaleService {
   std::vector<std::string> SystemLanguages() override {
     LanguageList languages;
     const std::string directory = root_.path(kTranslations);
-    for (const std::string& name : ListDirectory(directory)) {
+    for (const std::string& name : root_.names(directory)) {
       struct stat status = {};
       const std::string messages = JoinPath(directory, name) + "/LC_MESSAGES";
       if (stat(messages.c_str(), &status) == 0 && S_ISDIR(status.st_mode)) languages.add(name);
@@ -87,13 +87,14 @@ class LinuxLocale : public LocaleService {
     return value != nullptr ? value : "";
   }
 
-  const Root root_;
+  const LoggingRoot root_;
   const EnvironmentVariable environment_;
 };
 
 }  // namespace
 
-std::unique_ptr<LocaleService> MakeLinuxLocale(const Root& root, EnvironmentVariable environment) {
+std::unique_ptr<LocaleService> MakeLinuxLocale(const LoggingRoot& root,
+                                               EnvironmentVariable environment) {
   return std::make_unique<LinuxLocale>(root, std::move(environment));
 }
 

@@ -30,7 +30,7 @@ struct Machine {
   static std::vector<std::unique_ptr<EntrySource>> Sources(const Root& root, SystemLog& log) {
     std::vector<std::unique_ptr<EntrySource>> sources;
     sources.push_back(MakeDriverFiles(root, log));
-    sources.push_back(MakeLiveChannels(root));
+    sources.push_back(MakeLiveChannels(LoggingRoot(root, log)));
     return sources;
   }
 

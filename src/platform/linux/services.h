@@ -17,7 +17,7 @@
 #include "platform/environment.h"
 #include "platform/kernel_parameters.h"
 #include "platform/linux/access.h"
-#include "platform/linux/files.h"
+#include "platform/linux/logging_root.h"
 #include "platform/linux/registry_entry.h"
 #include "platform/locale.h"
 #include "platform/os_version.h"
@@ -90,7 +90,8 @@ std::unique_ptr<Applications> MakeLinuxApplications(const Root& root, SystemLog&
 // The value of an environment variable, or nullptr.
 using EnvironmentVariable = std::function<const char*(const char* name)>;
 
-std::unique_ptr<LocaleService> MakeLinuxLocale(const Root& root, EnvironmentVariable environment);
+std::unique_ptr<LocaleService> MakeLinuxLocale(const LoggingRoot& root,
+                                               EnvironmentVariable environment);
 
 // /run/quorlet/pass.lock; with read-only access there is no lock.
 std::unique_ptr<PassLock> MakeLinuxPassLock(const Root& root, Access access, SystemLog& log);

@@ -120,7 +120,7 @@ Data ThreadItems(const std::string& directory) {
 
 class LinuxTaskSnapshot : public TaskSnapshot {
  public:
-  LinuxTaskSnapshot(const Root& root, SystemLog& log) : root_(root), log_(log) {}
+  LinuxTaskSnapshot(const Root& root, SystemLog& log) : root_(root, log), log_(log) {}
 
   std::optional<Data> CaptureTaskSnapshot(std::uint32_t flags) override {
     if (flags != kTaskSnapshotTaggedItems) return std::nullopt;
@@ -141,12 +141,12 @@ class LinuxTaskSnapshot : public TaskSnapshot {
   std::optional<Data> takeSnapshot() const {
     const std::string processes = root_.kernelPath(kProcesses);
     Data items;
-    for (const std::string& name : ListDirectory(processes)) {
+    for (const std::string& name : root_.names(processes)) {
       const auto process = Number(name);
       if (!process) continue;
       const std::string directory = JoinPath(processes, name) + "/task";
       Data threads;
-      for (const std::string& threadName : ListDirectory(directory)) {
+      for (const std::string& threadName : root_.names(directory)) {
         if (const auto thread = Number(threadName)) {
           AppendContainer(kThread, kThreadMark | *thread,
                           ThreadItems(JoinPath(directory, threadName)), threads);
@@ -162,7 +162,7 @@ class LinuxTaskSnapshot : public TaskSnapshot {
     return items;
   }
 
-  const Root root_;
+  const LoggingRoot root_;
   SystemLog& log_;
 };
 

@@ -9,7 +9,7 @@
 
 #include "platform/linux/drives/bounded_answer.h"
 #include "platform/linux/drives/drive_statistics.h"
-#include "platform/linux/live/kernel_text.h"
+#include "platform/linux/kernel_text.h"
 #include "values/byte_reader.h"
 
 namespace quorlet {

@@ -5,7 +5,7 @@
 #include <algorithm>
 #include <map>
 
-#include "platform/linux/live/kernel_text.h"
+#include "platform/linux/kernel_text.h"
 
 namespace quorlet {
 namespace {
@@ -38,8 +38,8 @@ std::string Place(const std::string& directory, const std::string& name) {
 
 class Finder {
  public:
-  explicit Finder(const Root& root)
-      : root_(root), blocks_(root.kernelPath(kBlockDevices)), disks_(ListDirectory(blocks_)) {}
+  explicit Finder(const LoggingRoot& root)
+      : root_(root), blocks_(root.kernelPath(kBlockDevices)), disks_(root.names(blocks_)) {}
 
   std::vector<FoundDrive> find() {
     addControllers();
@@ -65,7 +65,7 @@ class Finder {
 
   void addControllers() {
     const std::string directory = root_.kernelPath("/sys/class/nvme");
-    for (const auto& [number, name] : NumberedNames(directory, "nvme")) {
+    for (const auto& [number, name] : NumberedNames(root_, directory, "nvme")) {
       if (number >= kMaxControllers || !Exists(root_.path("/dev/" + name))) continue;
       FoundDrive drive{DriveKind::kNvme, name, "", JoinPath(directory, name), {}};
       drive.place = Place(drive.directory, name);
@@ -77,7 +77,7 @@ class Finder {
   }
 
   void addCards() {
-    for (const auto& [number, name] : NumberedNames(blocks_, "mmcblk")) {
+    for (const auto& [number, name] : NumberedNames(root_, blocks_, "mmcblk")) {
       FoundDrive drive{DriveKind::kEmmc, name, "", JoinPath(blocks_, name), {name}};
       const auto type = ReadKernelText(drive.directory + "/device/type");
       if (type != "MMC" && type != "SD") continue;
@@ -89,9 +89,9 @@ class Finder {
 
   void addUfsHosts(const std::string& bus) {
     const std::string drivers = root_.kernelPath("/sys/bus/" + bus + "/drivers");
-    for (const std::string& driver : ListDirectory(drivers)) {
+    for (const std::string& driver : root_.names(drivers)) {
       if (!driver.starts_with("ufshcd")) continue;
-      for (const std::string& host : ListDirectory(JoinPath(drivers, driver))) {
+      for (const std::string& host : root_.names(JoinPath(drivers, driver))) {
         FoundDrive drive{DriveKind::kUfs, host, "", drivers + "/" + driver + "/" + host, {}};
         if (!Exists(drive.directory + "/health_descriptor")) continue;
         // DevicePlace leaves the device itself out.
@@ -120,7 +120,7 @@ class Finder {
     }
   }
 
-  const Root root_;
+  const LoggingRoot root_;
   const std::string blocks_;
   const std::vector<std::string> disks_;
   std::vector<FoundDrive> drives_;
@@ -133,16 +133,16 @@ bool IsAwake(const std::string& device) {
 
 }  // namespace
 
-std::vector<FoundDrive> FindDrives(const Root& root) {
+std::vector<FoundDrive> FindDrives(const LoggingRoot& root) {
   const bool isOwn = root.isMachine() || root.kernelPath("/sys") == root.path("/sys");
   return isOwn ? Finder(root).find() : std::vector<FoundDrive>();
 }
 
-bool IsAsleep(const FoundDrive& drive) {
+bool IsAsleep(const LoggingRoot& root, const FoundDrive& drive) {
   if (drive.kind != DriveKind::kUfs) return !IsAwake(drive.directory + "/device");
   if (!IsAwake(drive.directory)) return true;
   // The host may be awake while the device behind it, which is its well-known unit, sleeps.
-  for (const std::string& host : ListDirectory(drive.directory)) {
+  for (const std::string& host : root.names(drive.directory)) {
     if (!NumberBehind("host", host)) continue;
     const std::string number = host.substr(4);
     if (!IsAwake(drive.directory + "/" + host + "/target" + number + ":0:0/" + number +

@@ -7,7 +7,7 @@
 #include <vector>
 
 #include "platform/drives.h"
-#include "platform/linux/files.h"
+#include "platform/linux/kernel_text.h"
 
 namespace quorlet {
 
@@ -23,14 +23,14 @@ struct FoundDrive {
 
 // NVMe controllers that have their device in /dev, cards and eMMC, UFS hosts, and SATA disks that
 // do not spin; by place. /sys must be the root's own: a root that has none is another machine's.
-std::vector<FoundDrive> FindDrives(const Root& root);
+std::vector<FoundDrive> FindDrives(const LoggingRoot& root);
 
 // Whether the drive's device sleeps, as far as the kernel says.
-bool IsAsleep(const FoundDrive& drive);
+bool IsAsleep(const LoggingRoot& root, const FoundDrive& drive);
 
 // The whole disks, by the names in /sys/block, that the root's file system lies on; empty when that
 // cannot be told.
-std::set<std::string> RootDisks(const Root& root);
+std::set<std::string> RootDisks(const LoggingRoot& root);
 
 }  // namespace quorlet
 

@@ -4,7 +4,7 @@
 
 #include "platform/linux/drives/bounded_answer.h"
 #include "platform/linux/drives/drive_figures.h"
-#include "platform/linux/live/kernel_text.h"
+#include "platform/linux/kernel_text.h"
 
 namespace quorlet {
 namespace {
@@ -90,7 +90,7 @@ const NvmePages& DriveReader::pages(const FoundDrive& drive) {
     return known->second.pages;
   }
   NvmePages pages;
-  if (IsAsleep(drive)) {
+  if (IsAsleep(root_, drive)) {
     pages.answer = DriveAnswer::kAsleep;
   } else {
     pages = reader_(root_.path("/dev/" + drive.name), kLimit);
@@ -120,7 +120,7 @@ void DriveReader::readUfs(const FoundDrive& found, Drive& drive) {
   if (late_.contains(found.name)) return;
   const auto deadline = steady_clock::now() + kLimit;
   const auto ask = [&](const char* attribute) {
-    if (IsAsleep(found)) drive.answer = DriveAnswer::kAsleep;
+    if (IsAsleep(root_, found)) drive.answer = DriveAnswer::kAsleep;
     const auto left = std::chrono::ceil<std::chrono::milliseconds>(deadline - steady_clock::now());
     if (drive.answer == DriveAnswer::kAsleep || left.count() <= 0) return std::string();
     std::string text = ReadAttributeWithin(JoinPath(found.directory, attribute), left);

@@ -21,13 +21,13 @@ namespace quorlet {
 // channels, quorletctl. For one thread.
 class DriveReader final : public Drives {
  public:
-  explicit DriveReader(const Root& root, NvmePagesReader reader = ReadNvmePages)
+  explicit DriveReader(const LoggingRoot& root, NvmePagesReader reader = ReadNvmePages)
       : root_(root), reader_(std::move(reader)) {}
 
   std::vector<FoundDrive> find() const { return FindDrives(root_); }
   std::vector<Drive> read() override;
   Drive read(const FoundDrive& drive);
-  const Root& root() const { return root_; }
+  const LoggingRoot& root() const { return root_; }
   // The pages of an NVMe drive, of which it is asked at most once a second; not while it sleeps.
   const NvmePages& pages(const FoundDrive& drive);
 
@@ -39,7 +39,7 @@ class DriveReader final : public Drives {
   void readNvme(const FoundDrive& found, Drive& drive);
   void readUfs(const FoundDrive& found, Drive& drive);
 
-  const Root root_;
+  const LoggingRoot root_;
   const NvmePagesReader reader_;
   std::map<std::string, Asked> asked_;  // by name
   std::set<std::string> late_;          // UFS hosts that did not answer in time

@@ -2,7 +2,7 @@
 
 #include <utility>
 
-#include "platform/linux/live/kernel_text.h"
+#include "platform/linux/kernel_text.h"
 
 namespace quorlet {
 namespace {

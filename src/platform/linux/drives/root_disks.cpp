@@ -7,7 +7,7 @@
 #include <optional>
 
 #include "platform/linux/drives/drive_list.h"
-#include "platform/linux/live/kernel_text.h"
+#include "platform/linux/kernel_text.h"
 
 namespace quorlet {
 namespace {
@@ -49,7 +49,7 @@ std::optional<Mount> ParseMount(std::string_view line) {
                std::string(dash[3])};
 }
 
-std::vector<Mount> ReadMounts(const Root& root) {
+std::vector<Mount> ReadMounts(const LoggingRoot& root) {
   std::vector<Mount> mounts;
   const auto text = ReadKernelText(root.kernelPath("/proc/self/mountinfo"), kMaxMountBytes);
   if (!text) return mounts;
@@ -81,8 +81,8 @@ std::string UpperDirectory(std::string_view options) {
 
 class DiskSearch {
  public:
-  explicit DiskSearch(const Root& root)
-      : root_(root), blocks_(root.kernelPath("/sys/block")), names_(ListDirectory(blocks_)) {}
+  explicit DiskSearch(const LoggingRoot& root)
+      : root_(root), blocks_(root.kernelPath("/sys/block")), names_(root.names(blocks_)) {}
 
   void addMount(const Mount& mount) {
     // A file system that has no device of its own, or several, has one of number 0:N.
@@ -107,7 +107,7 @@ class DiskSearch {
     for (const std::string& disk : names_) {
       const std::string directory = JoinPath(blocks_, disk);
       if (condition(disk, directory)) return disk;
-      for (const std::string& part : ListDirectory(directory)) {
+      for (const std::string& part : root_.names(directory)) {
         if (part.starts_with(disk) && condition(part, JoinPath(directory, part))) return disk;
       }
     }
@@ -126,12 +126,12 @@ class DiskSearch {
   }
   void addDisk(const std::string& disk, std::size_t depth) {
     if (disk.empty() || depth > kMaxDepth || !found_.insert(disk).second) return;
-    for (const std::string& part : ListDirectory(blocks_ + "/" + disk + "/slaves")) {
+    for (const std::string& part : root_.names(blocks_ + "/" + disk + "/slaves")) {
       addName(part, depth + 1);
     }
   }
 
-  const Root root_;
+  const LoggingRoot root_;
   const std::string blocks_;
   const std::vector<std::string> names_;
   std::set<std::string> found_;
@@ -139,7 +139,7 @@ class DiskSearch {
 
 }  // namespace
 
-std::set<std::string> RootDisks(const Root& root) {
+std::set<std::string> RootDisks(const LoggingRoot& root) {
   const std::vector<Mount> mounts = ReadMounts(root);
   const Mount* mount = MountOf(mounts, "/");
   if (mount != nullptr && mount->type == "overlay") {

@@ -11,7 +11,7 @@
 #include <set>
 #include <variant>
 
-#include "platform/linux/live/kernel_text.h"
+#include "platform/linux/kernel_text.h"
 #include "platform/linux/live/publishers.h"
 #include "platform/linux/live/running_totals.h"
 
@@ -84,7 +84,7 @@ std::string Identity(const BlockDevice& device) {
 
 class BlockDevicesPublisher : public LivePublisher {
  public:
-  explicit BlockDevicesPublisher(const Root& root) : root_(root) {}
+  explicit BlockDevicesPublisher(const LoggingRoot& root) : root_(root) {}
 
   LiveLegend describe() override {
     find();
@@ -140,7 +140,7 @@ class BlockDevicesPublisher : public LivePublisher {
     devices_.clear();
     const std::string directory = root_.kernelPath(kBlockDevices);
     std::map<std::string, int> identities;
-    for (std::string& name : ListDirectory(directory)) {
+    for (std::string& name : root_.names(directory)) {
       if (devices_.size() == kMaxDevices) break;
       BlockDevice device;
       device.directory = JoinPath(directory, name);
@@ -185,7 +185,7 @@ class BlockDevicesPublisher : public LivePublisher {
     }
   }
 
-  const Root root_;
+  const LoggingRoot root_;
   std::vector<BlockDevice> devices_;
   RunningTotals totals_;
   std::map<std::string, std::map<std::string, std::int64_t>> ofDisks_;  // by column key, by disk
@@ -193,7 +193,7 @@ class BlockDevicesPublisher : public LivePublisher {
 
 }  // namespace
 
-std::unique_ptr<LivePublisher> MakeBlockDevicesPublisher(const Root& root) {
+std::unique_ptr<LivePublisher> MakeBlockDevicesPublisher(const LoggingRoot& root) {
   return std::make_unique<BlockDevicesPublisher>(root);
 }
 

@@ -13,7 +13,7 @@
 #include <cerrno>
 #include <variant>
 
-#include "platform/linux/live/kernel_text.h"
+#include "platform/linux/kernel_text.h"
 #include "platform/linux/live/publishers.h"
 #include "platform/linux/live/running_totals.h"
 
@@ -79,13 +79,13 @@ std::vector<Frequency> ReadTimes(const std::string& directory) {
 
 class CpuFrequencyPublisher : public LivePublisher {
  public:
-  explicit CpuFrequencyPublisher(const Root& root) : root_(root) {}
+  explicit CpuFrequencyPublisher(const LoggingRoot& root) : root_(root) {}
 
   LiveLegend describe() override {
     LiveLegend legend;
     cpus_.clear();
     const std::string cpus = root_.kernelPath(kCpus);
-    for (const auto& [number, name] : NumberedNames(cpus, "cpu")) {
+    for (const auto& [number, name] : NumberedNames(root_, cpus, "cpu")) {
       const std::string title = "CPU" + std::to_string(number);
       const Cpu cpu{PackedID(title), JoinPath(cpus, name) + "/cpufreq/stats"};
       const std::size_t states = ReadTimes(cpu.directory).size();
@@ -129,14 +129,14 @@ class CpuFrequencyPublisher : public LivePublisher {
     std::string directory;
   };
 
-  const Root root_;
+  const LoggingRoot root_;
   std::vector<Cpu> cpus_;
   RunningTotals totals_;
 };
 
 }  // namespace
 
-std::unique_ptr<LivePublisher> MakeCpuFrequencyPublisher(const Root& root) {
+std::unique_ptr<LivePublisher> MakeCpuFrequencyPublisher(const LoggingRoot& root) {
   return std::make_unique<CpuFrequencyPublisher>(root);
 }
 

@@ -8,7 +8,7 @@
 #include <algorithm>
 #include <array>
 
-#include "platform/linux/live/kernel_text.h"
+#include "platform/linux/kernel_text.h"
 #include "platform/linux/live/publishers.h"
 #include "platform/linux/live/running_totals.h"
 
@@ -61,7 +61,7 @@ std::map<std::uint64_t, std::uint64_t> BusyMicroseconds(std::string_view activit
 
 class CpuIdlePublisher : public LivePublisher {
  public:
-  explicit CpuIdlePublisher(const Root& root) : root_(root) {}
+  explicit CpuIdlePublisher(const LoggingRoot& root) : root_(root) {}
 
   LiveLegend describe() override {
     LiveLegend legend;
@@ -71,10 +71,10 @@ class CpuIdlePublisher : public LivePublisher {
     const bool isOneMachine = (root_.kernelPath(kCpus) == root_.path(kCpus)) ==
                               (root_.kernelPath(kActivity) == root_.path(kActivity));
     hasActivity_ = isOneMachine && access(root_.kernelPath(kActivity).c_str(), R_OK) == 0;
-    for (const auto& [number, name] : NumberedNames(cpus, "cpu")) {
+    for (const auto& [number, name] : NumberedNames(root_, cpus, "cpu")) {
       Cpu cpu{number, PackedID("CPU" + std::to_string(number)), {}};
       const std::string directory = JoinPath(cpus, name) + "/cpuidle";
-      for (const auto& [stateNumber, state] : NumberedNames(directory, "state")) {
+      for (const auto& [stateNumber, state] : NumberedNames(root_, directory, "state")) {
         cpu.states.push_back({JoinPath(directory, state), 0});
       }
       if (cpu.states.empty()) continue;
@@ -143,7 +143,7 @@ class CpuIdlePublisher : public LivePublisher {
     return true;
   }
 
-  const Root root_;
+  const LoggingRoot root_;
   bool hasActivity_ = false;
   std::vector<Cpu> cpus_;
   RunningTotals totals_;
@@ -151,7 +151,7 @@ class CpuIdlePublisher : public LivePublisher {
 
 }  // namespace
 
-std::unique_ptr<LivePublisher> MakeCpuIdlePublisher(const Root& root) {
+std::unique_ptr<LivePublisher> MakeCpuIdlePublisher(const LoggingRoot& root) {
   return std::make_unique<CpuIdlePublisher>(root);
 }
 

@@ -2,7 +2,7 @@
 // Most kernels let only root read it.
 //
 // Zones are numbered ("intel-rapl:0:1"); their names ("package-0", below it "core") are stable.
-#include "platform/linux/live/kernel_text.h"
+#include "platform/linux/kernel_text.h"
 #include "platform/linux/live/publishers.h"
 #include "platform/linux/live/running_totals.h"
 
@@ -20,14 +20,14 @@ struct Zone {
 
 class EnergyPublisher : public LivePublisher {
  public:
-  explicit EnergyPublisher(const Root& root) : root_(root) {}
+  explicit EnergyPublisher(const LoggingRoot& root) : root_(root) {}
 
   LiveLegend describe() override {
     zones_.clear();
     LiveLegend legend;
     const std::string directory = root_.kernelPath(kZones);
     std::map<std::string, int> names;
-    for (const std::string& zoneName : ListDirectory(directory)) {
+    for (const std::string& zoneName : root_.names(directory)) {
       const std::size_t controlEnd = zoneName.find(':');
       if (controlEnd == std::string::npos || zones_.size() == kMaxZones) continue;
       std::string name = fullName(directory, zoneName, controlEnd);
@@ -67,14 +67,14 @@ class EnergyPublisher : public LivePublisher {
     return CleanName(name);
   }
 
-  const Root root_;
+  const LoggingRoot root_;
   std::vector<Zone> zones_;
   RunningTotals totals_;
 };
 
 }  // namespace
 
-std::unique_ptr<LivePublisher> MakeEnergyPublisher(const Root& root) {
+std::unique_ptr<LivePublisher> MakeEnergyPublisher(const LoggingRoot& root) {
   return std::make_unique<EnergyPublisher>(root);
 }
 

@@ -48,7 +48,7 @@ class LiveDriver {
 
 class LiveChannels : public EntrySource {
  public:
-  LiveChannels(const Root& root, std::unique_ptr<LivePublisher> drives) {
+  LiveChannels(const LoggingRoot& root, std::unique_ptr<LivePublisher> drives) {
     // The place in this list makes the entry ID: new ones go to the end.
     drivers_.emplace_back("cpu-idle", MakeCpuIdlePublisher(root));
     drivers_.emplace_back("cpu-frequency", MakeCpuFrequencyPublisher(root));
@@ -95,7 +95,7 @@ class LiveChannels : public EntrySource {
 
 }  // namespace
 
-std::unique_ptr<EntrySource> MakeLiveChannels(const Root& root,
+std::unique_ptr<EntrySource> MakeLiveChannels(const LoggingRoot& root,
                                               std::unique_ptr<LivePublisher> drives) {
   return std::make_unique<LiveChannels>(root, std::move(drives));
 }

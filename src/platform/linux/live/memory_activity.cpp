@@ -3,7 +3,7 @@
 
 #include <array>
 
-#include "platform/linux/live/kernel_text.h"
+#include "platform/linux/kernel_text.h"
 #include "platform/linux/live/publishers.h"
 #include "platform/linux/live/running_totals.h"
 
@@ -50,7 +50,7 @@ std::uint64_t Factor(Counted counted) {
 
 class MemoryActivityPublisher : public LivePublisher {
  public:
-  explicit MemoryActivityPublisher(const Root& root) : root_(root) {}
+  explicit MemoryActivityPublisher(const LoggingRoot& root) : root_(root) {}
 
   LiveLegend describe() override {
     const auto found = readings();
@@ -91,13 +91,13 @@ class MemoryActivityPublisher : public LivePublisher {
     return found;
   }
 
-  const Root root_;
+  const LoggingRoot root_;
   RunningTotals totals_;
 };
 
 }  // namespace
 
-std::unique_ptr<LivePublisher> MakeMemoryActivityPublisher(const Root& root) {
+std::unique_ptr<LivePublisher> MakeMemoryActivityPublisher(const LoggingRoot& root) {
   return std::make_unique<MemoryActivityPublisher>(root);
 }
 

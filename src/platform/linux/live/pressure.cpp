@@ -3,7 +3,7 @@
 // one simple channel a line, the total in microseconds.
 #include <array>
 
-#include "platform/linux/live/kernel_text.h"
+#include "platform/linux/kernel_text.h"
 #include "platform/linux/live/publishers.h"
 #include "platform/linux/live/running_totals.h"
 
@@ -41,7 +41,7 @@ std::optional<std::uint64_t> Total(std::string_view text, std::string_view wante
 
 class PressurePublisher : public LivePublisher {
  public:
-  explicit PressurePublisher(const Root& root) : root_(root) {}
+  explicit PressurePublisher(const LoggingRoot& root) : root_(root) {}
 
   LiveLegend describe() override {
     LiveLegend legend;
@@ -70,13 +70,13 @@ class PressurePublisher : public LivePublisher {
     return found;
   }
 
-  const Root root_;
+  const LoggingRoot root_;
   RunningTotals totals_;
 };
 
 }  // namespace
 
-std::unique_ptr<LivePublisher> MakePressurePublisher(const Root& root) {
+std::unique_ptr<LivePublisher> MakePressurePublisher(const LoggingRoot& root) {
   return std::make_unique<PressurePublisher>(root);
 }
 

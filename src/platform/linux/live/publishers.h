@@ -5,19 +5,19 @@
 
 #include <memory>
 
-#include "platform/linux/files.h"
+#include "platform/linux/kernel_text.h"
 #include "platform/linux/live/live_publisher.h"
 
 namespace quorlet {
 
-std::unique_ptr<LivePublisher> MakeCpuIdlePublisher(const Root& root);
-std::unique_ptr<LivePublisher> MakeCpuFrequencyPublisher(const Root& root);
-std::unique_ptr<LivePublisher> MakeBlockDevicesPublisher(const Root& root);
-std::unique_ptr<LivePublisher> MakeTemperaturesPublisher(const Root& root);
-std::unique_ptr<LivePublisher> MakeEnergyPublisher(const Root& root);
-std::unique_ptr<LivePublisher> MakePressurePublisher(const Root& root);
-std::unique_ptr<LivePublisher> MakeMemoryActivityPublisher(const Root& root);
-std::unique_ptr<LivePublisher> MakeRunQueuePublisher(const Root& root);
+std::unique_ptr<LivePublisher> MakeCpuIdlePublisher(const LoggingRoot& root);
+std::unique_ptr<LivePublisher> MakeCpuFrequencyPublisher(const LoggingRoot& root);
+std::unique_ptr<LivePublisher> MakeBlockDevicesPublisher(const LoggingRoot& root);
+std::unique_ptr<LivePublisher> MakeTemperaturesPublisher(const LoggingRoot& root);
+std::unique_ptr<LivePublisher> MakeEnergyPublisher(const LoggingRoot& root);
+std::unique_ptr<LivePublisher> MakePressurePublisher(const LoggingRoot& root);
+std::unique_ptr<LivePublisher> MakeMemoryActivityPublisher(const LoggingRoot& root);
+std::unique_ptr<LivePublisher> MakeRunQueuePublisher(const LoggingRoot& root);
 
 }  // namespace quorlet
 

@@ -8,7 +8,7 @@
 #include <algorithm>
 #include <array>
 
-#include "platform/linux/live/kernel_text.h"
+#include "platform/linux/kernel_text.h"
 #include "platform/linux/live/publishers.h"
 
 namespace quorlet {
@@ -71,7 +71,7 @@ std::optional<std::map<std::uint64_t, Waits>> ParseStatistics(std::string_view t
 
 class RunQueuePublisher : public LivePublisher {
  public:
-  explicit RunQueuePublisher(const Root& root) : root_(root) {}
+  explicit RunQueuePublisher(const LoggingRoot& root) : root_(root) {}
 
   LiveLegend describe() override {
     LiveLegend legend;
@@ -122,14 +122,14 @@ class RunQueuePublisher : public LivePublisher {
     total += static_cast<std::int64_t>(std::min(growth, room));
   }
 
-  const Root root_;
+  const LoggingRoot root_;
   std::map<std::uint64_t, Waits> last_;
   std::array<LiveValues, kBuckets> buckets_{};
 };
 
 }  // namespace
 
-std::unique_ptr<LivePublisher> MakeRunQueuePublisher(const Root& root) {
+std::unique_ptr<LivePublisher> MakeRunQueuePublisher(const LoggingRoot& root) {
   return std::make_unique<RunQueuePublisher>(root);
 }
 

@@ -5,7 +5,7 @@
 // drivetemp, whose question a disk may have to spin up for.
 #include <algorithm>
 
-#include "platform/linux/live/kernel_text.h"
+#include "platform/linux/kernel_text.h"
 #include "platform/linux/live/publishers.h"
 
 namespace quorlet {
@@ -40,13 +40,13 @@ bool IsAsleep(const std::string& directory) {
 
 class TemperaturesPublisher : public LivePublisher {
  public:
-  explicit TemperaturesPublisher(const Root& root) : root_(root) {}
+  explicit TemperaturesPublisher(const LoggingRoot& root) : root_(root) {}
 
   LiveLegend describe() override {
     sensors_.clear();
     LiveLegend legend;
     const std::string zones = root_.kernelPath(kZones);
-    for (const auto& [number, name] : NumberedNames(zones, "thermal_zone")) {
+    for (const auto& [number, name] : NumberedNames(root_, zones, "thermal_zone")) {
       const std::string directory = JoinPath(zones, name);
       const auto kind = ReadKernelText(directory + "/type");
       if (!kind) continue;
@@ -57,7 +57,7 @@ class TemperaturesPublisher : public LivePublisher {
           {0, directory, "temp", "type", *kind, LinkTarget(directory)});
     }
     const std::string monitors = root_.kernelPath(kMonitors);
-    for (const auto& [number, name] : NumberedNames(monitors, "hwmon")) {
+    for (const auto& [number, name] : NumberedNames(root_, monitors, "hwmon")) {
       addMonitor(legend, JoinPath(monitors, name));
     }
     return legend;
@@ -83,7 +83,7 @@ class TemperaturesPublisher : public LivePublisher {
     const std::string link = LinkTarget(directory);
     const std::string place = DevicePlace(link);
     const std::string stable = CleanName(*kind) + (place.empty() ? "" : " " + place);
-    for (const std::string& file : ListDirectory(directory)) {
+    for (const std::string& file : root_.names(directory)) {
       if (!file.starts_with("temp") || !file.ends_with(kInput)) continue;
       const std::string sensor = file.substr(0, file.size() - kInput.size());
       if (!NumberBehind("temp", sensor)) continue;
@@ -108,13 +108,13 @@ class TemperaturesPublisher : public LivePublisher {
     sensors_.push_back(std::move(sensor));
   }
 
-  const Root root_;
+  const LoggingRoot root_;
   std::vector<Sensor> sensors_;
 };
 
 }  // namespace
 
-std::unique_ptr<LivePublisher> MakeTemperaturesPublisher(const Root& root) {
+std::unique_ptr<LivePublisher> MakeTemperaturesPublisher(const LoggingRoot& root) {
   return std::make_unique<TemperaturesPublisher>(root);
 }
 

@@ -2,8 +2,8 @@
 //
 // Nothing read here is trusted: files are capped, numbers are whole decimal numbers or nothing, and
 // names become short printable ASCII.
-#ifndef QUORLET_PLATFORM_LINUX_LIVE_KERNEL_TEXT_H_
-#define QUORLET_PLATFORM_LINUX_LIVE_KERNEL_TEXT_H_
+#ifndef QUORLET_PLATFORM_LINUX_KERNEL_TEXT_H_
+#define QUORLET_PLATFORM_LINUX_KERNEL_TEXT_H_
 
 #include <cstddef>
 #include <cstdint>
@@ -12,6 +12,8 @@
 #include <string_view>
 #include <utility>
 #include <vector>
+
+#include "platform/linux/logging_root.h"
 
 namespace quorlet {
 
@@ -34,7 +36,8 @@ std::string_view TakeLine(std::string_view& rest);
 // The number behind `prefix` when `name` is nothing else, without leading zeros.
 std::optional<std::uint64_t> NumberBehind(std::string_view prefix, std::string_view name);
 // The names of a directory that are `prefix` and a number, by number: state2 before state10.
-std::vector<std::pair<std::uint64_t, std::string>> NumberedNames(const std::string& directory,
+std::vector<std::pair<std::uint64_t, std::string>> NumberedNames(const LoggingRoot& root,
+                                                                 const std::string& directory,
                                                                  std::string_view prefix);
 
 // At most 64 characters of printable ASCII; what is not becomes "?", a run of blanks one blank.
@@ -63,4 +66,4 @@ constexpr std::uint64_t PackedID(std::string_view text) {
 
 }  // namespace quorlet
 
-#endif  // QUORLET_PLATFORM_LINUX_LIVE_KERNEL_TEXT_H_
+#endif  // QUORLET_PLATFORM_LINUX_KERNEL_TEXT_H_

@@ -1,4 +1,4 @@
-#include "platform/linux/live/kernel_text.h"
+#include "platform/linux/kernel_text.h"
 
 #include <unistd.h>
 
@@ -8,8 +8,6 @@
 #include <climits>
 #include <system_error>
 #include <variant>
-
-#include "platform/linux/files.h"
 
 namespace quorlet {
 namespace {
@@ -106,10 +104,11 @@ std::optional<std::uint64_t> NumberBehind(std::string_view prefix, std::string_v
   return ParseWhole<std::uint64_t>(name);
 }
 
-std::vector<std::pair<std::uint64_t, std::string>> NumberedNames(const std::string& directory,
+std::vector<std::pair<std::uint64_t, std::string>> NumberedNames(const LoggingRoot& root,
+                                                                 const std::string& directory,
                                                                  std::string_view prefix) {
   std::vector<std::pair<std::uint64_t, std::string>> found;
-  for (std::string& name : ListDirectory(directory)) {
+  for (std::string& name : root.names(directory)) {
     const auto number = NumberBehind(prefix, name);
     if (number && found.size() < kMaxNumberedNames) found.emplace_back(*number, std::move(name));
   }
