@@ -48,6 +48,13 @@ void Status(Session& session, const ConsentArguments& arguments) {
 
 }  // namespace
 
+void RequireConsent(Platform& services) {
+  if (services.diagnostics.DiagnosticLogSubmissionEnabled()) return;
+  throw Failure(
+      "the device's owner has not consented to logs being submitted: see \"quorletctl consent "
+      "on\"");
+}
+
 void AddConsentCommands(CLI::App& app, Session& session) {
   CLI::App* consent =
       AddFamily(app, "consent", "The owner's consent to submitting logs", "quorletctl consent on");

@@ -17,13 +17,13 @@
 #include "ctl/options.h"
 #include "ctl/session.h"
 #include "platform/linux/descriptor.h"
+#include "platform/linux/paths.h"
 #include "values/property_list.h"
 #include "values/text.h"
 
 namespace quorlet {
 namespace {
 
-constexpr std::string_view kLogsDirectory = "/var/mobile/Library/Logs/Diagwell/";
 // In the order in which a log passes through them.
 constexpr std::array<std::string_view, 2> kStages = {"pending", "outbox"};
 // All logs together take no more.
@@ -47,7 +47,7 @@ struct StoredLog {
 };
 
 std::string StageDirectory(std::string_view stage) {
-  return Root::FromEnvironment().path(std::string(kLogsDirectory).append(stage));
+  return Root::FromEnvironment().path(std::string(kSpoolDirectory).append("/").append(stage));
 }
 
 // The log's first line, or nothing when it is not a JSON object.
@@ -200,9 +200,7 @@ void Show(Session& session, const LogsArguments& arguments) {
 void Submit(Session& session) {
   const auto platform = session.open(Access::kReadWrite);
   Platform& services = platform->services();
-  if (!services.diagnostics.DiagnosticLogSubmissionEnabled()) {
-    throw Failure("the device's owner has not consented to logs being submitted");
-  }
+  RequireConsent(services);
   const PassHold hold(services.passLock);
   if (hold.isHeld()) services.diagnostics.SubmitDiagnosticLogs();
   if (!session.messages.errors().empty()) throw Failure(session.messages.errors().front());

@@ -31,6 +31,7 @@ void AddCommands(CLI::App& app, Session& session) {
   AddReportCommands(app, session);
   AddLogsCommands(app, session);
   AddConsentCommands(app, session);
+  AddStatusCommand(app, session);
   AddWhitelistCommands(app, session);
   AddChannelsCommands(app, session);
   AddStorageCommands(app, session);

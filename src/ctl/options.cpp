@@ -3,24 +3,9 @@
 #include <CLI/CLI.hpp>
 #include <chrono>
 
+#include "values/text.h"
+
 namespace quorlet {
-
-namespace {
-
-// The day of a date such as 2026-03-04, which must be one of the calendar.
-std::optional<std::int32_t> DayOfDate(std::string_view text) {
-  if (text.size() != 10 || text[4] != '-' || text[7] != '-') return std::nullopt;
-  const auto year = ParseNumber<std::uint16_t>(text.substr(0, 4));
-  const auto month = ParseNumber<std::uint8_t>(text.substr(5, 2));
-  const auto day = ParseNumber<std::uint8_t>(text.substr(8, 2));
-  if (!year || !month || !day) return std::nullopt;
-  const std::chrono::year_month_day date{std::chrono::year(*year), std::chrono::month(*month),
-                                         std::chrono::day(*day)};
-  if (!date.ok()) return std::nullopt;
-  return static_cast<std::int32_t>(std::chrono::sys_days(date).time_since_epoch().count());
-}
-
-}  // namespace
 
 std::int32_t Today() {
   using std::chrono::days;
@@ -38,7 +23,7 @@ std::int32_t ParseDay(const std::string& option, const std::string& text) {
   if (text == "today") return today;
   if (text == "yesterday") return today - 1;
   const auto number = ParseNumber<std::int32_t>(text);
-  const auto day = number ? number : DayOfDate(text);
+  const auto day = number ? number : ParseDate(text);
   if (!day) {
     throw CLI::ValidationError(option,
                                "not a day number, YYYY-MM-DD, \"today\" or \"yesterday\": " + text);
@@ -46,6 +31,10 @@ std::int32_t ParseDay(const std::string& option, const std::string& text) {
   if (*day < 0) throw CLI::ValidationError(option, "a day before 1970: " + text);
   if (*day > today) throw CLI::ValidationError(option, "a day in the future: " + text);
   return *day;
+}
+
+std::string DayText(std::int32_t day) {
+  return Rfc3339({day * 86400.0}).substr(0, 10) + " (day " + std::to_string(day) + ")";
 }
 
 std::optional<std::int32_t> ParseSecond(std::string_view text) {

@@ -42,6 +42,8 @@ std::optional<std::int32_t> ParseDayNumber(std::string_view text);
 // A DAY of the command line: a day number, "YYYY-MM-DD", "today" or "yesterday"; not before 1970
 // and not in the future. Throws CLI::ValidationError, which names `option`.
 std::int32_t ParseDay(const std::string& option, const std::string& text);
+// "2026-03-04 (day 20516)"
+std::string DayText(std::int32_t day);
 // A second of the day, 0 to kLastSecond.
 std::optional<std::int32_t> ParseSecond(std::string_view text);
 

@@ -5,12 +5,12 @@
 #include "ctl/json_value.h"
 #include "ctl/options.h"
 #include "ctl/session.h"
+#include "platform/linux/paths.h"
 #include "values/property_list.h"
 
 namespace quorlet {
 namespace {
 
-constexpr char kPreferencesDirectory[] = "/var/mobile/Library/Preferences/";
 constexpr char kTags[] =
     "Dates and data, which JSON lacks, are {\"$date\": \"2026-03-04T05:06:07Z\"} and\n"
     "{\"$data\": \"AAEC\"} (base64).";
@@ -82,8 +82,8 @@ void Remove(Session& session, const PrefsArguments& arguments) {
 
 void List(Session& session, const PrefsArguments& arguments) {
   CheckDomain(arguments.domain);
-  const std::string path =
-      Root::FromEnvironment().path(kPreferencesDirectory + arguments.domain + ".plist");
+  const std::string path = Root::FromEnvironment().path(std::string(kPreferencesDirectory) + "/" +
+                                                        arguments.domain + ".plist");
   const auto bytes = ReadWholeFile(path, kMaxPropertyListBytes);
   Dictionary values;
   if (const int* error = std::get_if<int>(&bytes)) {

@@ -1,4 +1,4 @@
-// quorletctl report: the aggregated log that a pass would write.
+// quorletctl report: the aggregated log that a pass would write, and the logs of days without one.
 #include "report/report.h"
 
 #include <CLI/CLI.hpp>
@@ -7,6 +7,7 @@
 #include "ctl/json_value.h"
 #include "ctl/options.h"
 #include "ctl/session.h"
+#include "driver/run_driver.h"
 #include "values/property_list.h"
 
 namespace quorlet {
@@ -97,6 +98,16 @@ void Preview(Session& session, const PreviewArguments& arguments) {
   }
 }
 
+void CloseMissing(Session& session) {
+  const auto platform = session.open(Access::kReadWrite);
+  Platform& services = platform->services();
+  RequireConsent(services);
+  const auto print = [&](std::int32_t day) { session.out.line(DayText(day)); };
+  if (!RunDriver(services).closeMissingDays(print)) {
+    throw Failure(session.messages.lastErrorOr("not every missing day could be closed"));
+  }
+}
+
 }  // namespace
 
 void AddReportCommands(CLI::App& app, Session& session) {
@@ -110,6 +121,13 @@ void AddReportCommands(CLI::App& app, Session& session) {
   preview->callback([&session, arguments] {
     session.command = [&session, arguments] { Preview(session, *arguments); };
   });
+  CLI::App* close = AddCommand(
+      *report, "close-missing", "Write the logs of past days that have none",
+      "For each day of the last 30 before yesterday that has counters, but that no pass\n"
+      "came to its end for: its log is written, the oldest first, and the day printed.\n"
+      "Refused without the owner's consent.",
+      "quorletctl report close-missing");
+  close->callback([&session] { session.command = [&session] { CloseMissing(session); }; });
 }
 
 }  // namespace quorlet

@@ -13,6 +13,7 @@
 #include "ctl/session.h"
 #include "platform/linux/frame_buffer.h"
 #include "platform/linux/named_service.h"
+#include "platform/linux/paths.h"
 #include "platform/linux/unix_socket.h"
 #include "values/property_list.h"
 

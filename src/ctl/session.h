@@ -15,9 +15,6 @@ class App;
 
 namespace quorlet {
 
-// Below the data home.
-inline constexpr char kCounterStorePath[] = "/Library/TallyLedger/TLDataStore.sqlitedb";
-
 struct Session {
   Output out;
   Messages messages;
@@ -31,6 +28,9 @@ struct Session {
   }
 };
 
+// Throws Failure, which names the remedy, while the device's owner has not consented.
+void RequireConsent(Platform& services);
+
 // Each adds one command family to the command line. Parsing sets `session.command`; the session
 // outlives the application.
 void AddInitCommand(CLI::App& app, Session& session);
@@ -41,6 +41,7 @@ void AddReportCommands(CLI::App& app, Session& session);
 void AddConsentCommands(CLI::App& app, Session& session);
 void AddLogsCommands(CLI::App& app, Session& session);
 void AddSendCommands(CLI::App& app, Session& session);
+void AddStatusCommand(CLI::App& app, Session& session);
 void AddStorageCommands(CLI::App& app, Session& session);
 void AddWhitelistCommands(CLI::App& app, Session& session);
 

@@ -15,7 +15,9 @@
 #include "ctl/session.h"
 #include "ctl/tally_import.h"
 #include "ctl/tally_lines.h"
+#include "ctl/whitelist.h"
 #include "platform/linux/descriptor.h"
+#include "platform/linux/paths.h"
 
 namespace quorlet {
 namespace {
@@ -49,6 +51,7 @@ void ChangeScalar(Session& session, const TallyArguments& arguments, bool add) {
   const bool kept = add ? ledger.addToScalar(arguments.key, day, arguments.scalar)
                         : ledger.setScalar(arguments.key, day, arguments.scalar);
   if (!kept) throw Failure(session.messages.lastErrorOr(kStoreSilent));
+  NoteUnlisted(session, arguments.key, KeyKind::kScalar);
 }
 
 void Record(Session& session, const TallyArguments& arguments) {
@@ -60,6 +63,7 @@ void Record(Session& session, const TallyArguments& arguments) {
   if (!platform->ledger().recordValues(arguments.key, day, samples)) {
     throw Failure(session.messages.lastErrorOr(kStoreSilent));
   }
+  NoteUnlisted(session, arguments.key, KeyKind::kDistribution);
 }
 
 void Import(Session& session, const TallyArguments& arguments) {

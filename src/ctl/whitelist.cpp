@@ -1,13 +1,20 @@
-// quorletctl whitelist: what a whitelist allows, and what in it will not work.
+// quorletctl whitelist: what a whitelist allows, what in it will not work, and what it makes of a
+// value.
+#include "ctl/whitelist.h"
+
+#include <unistd.h>
+
 #include <CLI/CLI.hpp>
 #include <array>
 #include <memory>
+#include <utility>
 #include <vector>
 
 #include "ctl/json_value.h"
 #include "ctl/options.h"
 #include "ctl/session.h"
 #include "report/config.h"
+#include "report/report.h"
 #include "values/property_list.h"
 
 namespace quorlet {
@@ -96,6 +103,8 @@ std::string OptionsText(const PropertyValue& options) {
     for (const auto& [name, value] : *dictionary) {
       text += "  " + Escape(name) + "=" + JsonText(value, JsonForm::kPlain);
     }
+    const auto last = ExpiryOption(*dictionary);
+    if (last && *last < Today()) text += "  EXPIRED";
   }
   return text;
 }
@@ -145,7 +154,164 @@ void Check(Session& session, const CheckArguments& arguments) {
   if (faults != 0) throw AnswerIsNo();
 }
 
+// The device's whitelist as today's report would use it. What is wrong elsewhere in it is for
+// `whitelist check` to say.
+struct DeviceWhitelist {
+  DeviceWhitelist() {
+    if (config) config->setReportedDay(platform.services().counterStore.TLDaysSince1970());
+  }
+
+  Messages messages;
+  LinuxPlatform platform{Root::FromEnvironment(), Access::kReadOnly,
+                         messages.makeLog(Access::kReadOnly)};
+  std::optional<TLConfig> config = TLConfig::init(platform.services());
+};
+
+struct ExplainArguments {
+  std::string key;
+  std::optional<std::string> value;
+  bool json = false;
+};
+
+// One recorded value.
+class OneValue final : public TLHistoryDistributionEnumerator {
+ public:
+  explicit OneValue(double value) : sample_{value, 0} {}
+
+ protected:
+  std::span<const DistributionSample> nextBlock() override {
+    return std::exchange(isRead_, true) ? std::span<const DistributionSample>()
+                                        : std::span(&sample_, 1);
+  }
+
+ private:
+  const DistributionSample sample_;
+  bool isRead_ = false;
+};
+
+std::string_view KindWord(KeyKind kind) {
+  return kind == KeyKind::kScalar ? "scalar" : "distribution";
+}
+
+// What the log would hold of the value.
+PropertyValue Reported(TLReport& report, const KeyMatch& match, KeyKind kind, std::string_view key,
+                       const std::string& text) {
+  if (kind == KeyKind::kScalar) {
+    const auto value = ParseNumber<std::int64_t>(text);
+    return value ? Int64(report.addScalarForKeyWithOptions(*value, key, match.options))
+                 : PropertyValue("not a whole number of 64 bits");
+  }
+  const auto value = ParseNumber<double>(text);
+  if (!value) return "not a number";
+  OneValue values(*value);
+  report.computeAndAddDistributionForKeyWithOptions(values, key, match.options);
+  if (const Dictionary* histogram = DictionaryEntry(report.histogramsOutput(), key)) {
+    return FormatText("counted in %@, and summed up with the day's values",
+                      histogram->begin()->first);
+  }
+  return "summed up with the day's values: minimum, maximum, mean, squared deviations, count";
+}
+
+std::string_view MatchWord(KeyMatch::Kind kind) {
+  switch (kind) {
+    case KeyMatch::Kind::kExact:
+      return "key";
+    case KeyMatch::Kind::kPrefix:
+      return "prefix";
+    case KeyMatch::Kind::kInternalDevice:
+      break;
+  }
+  return "no entry, but the device is internal";
+}
+
+// The kinds for which the whitelist has an entry for the key.
+Array Explanations(DeviceWhitelist& device, const ExplainArguments& arguments) {
+  Array explanations;
+  TLReport report(device.platform.services());
+  for (const KeyKind kind : {KeyKind::kScalar, KeyKind::kDistribution}) {
+    const auto match = device.config->matchForKey(arguments.key, kind);
+    if (!match) continue;
+    Dictionary explanation{{"kind", KindWord(kind)},
+                           {"match", MatchWord(match->kind)},
+                           {"entry", match->entry},
+                           {"options", match->options},
+                           {"expired", match->isExpired}};
+    if (arguments.value && !match->isExpired) {
+      explanation["reported"] = Reported(report, *match, kind, arguments.key, *arguments.value);
+    }
+    Array faults;
+    for (const std::string& fault : KeyOptionFaults(match->options, kind)) faults.push_back(fault);
+    explanation["faults"] = faults;
+    explanations.push_back(explanation);
+  }
+  return explanations;
+}
+
+void Explain(Session& session, const ExplainArguments& arguments) {
+  DeviceWhitelist device;
+  if (!device.config) throw Failure(device.messages.lastErrorOr("there is no whitelist"));
+  const Array explanations = Explanations(device, arguments);
+  bool isReported = false;
+  for (const PropertyValue& value : explanations) {
+    const Dictionary& explanation = *value.asDictionary();
+    const bool hasExpired = *explanation.find("expired") == PropertyValue(true);
+    isReported |= !hasExpired;
+    if (arguments.json) continue;
+    session.out.line(*StringEntry(explanation, "kind") + ": " + *StringEntry(explanation, "match") +
+                     " " + Escape(*StringEntry(explanation, "entry")) +
+                     OptionsText(*explanation.find("options")));
+    for (const PropertyValue& fault : *ArrayEntry(explanation, "faults")) {
+      session.out.line("  WILL NOT WORK: " + Escape(*fault.asString()));
+    }
+    if (const PropertyValue* reported = explanation.find("reported")) {
+      session.out.line("  reported: " + Escape(reported->description()));
+    }
+  }
+  if (arguments.json) {
+    session.out.line(
+        JsonText(Dictionary{{"key", arguments.key}, {"entries", explanations}}, JsonForm::kPlain));
+  } else if (explanations.empty()) {
+    session.out.line("no entry names " + Escape(arguments.key) + ": it is not reported");
+  }
+  if (!isReported) throw AnswerIsNo();
+}
+
+void AddExplainCommand(CLI::App& whitelist, Session& session) {
+  const auto arguments = std::make_shared<ExplainArguments>();
+  CLI::App* explain = AddCommand(
+      whitelist, "explain", "Say which entry applies to a key, and what it reports",
+      "With VALUE: what a log would hold of that value. The exit status is 0 when the key\n"
+      "is reported, otherwise 1.",
+      "quorletctl whitelist explain nuvex.demo.launches 1234");
+  explain->add_option("KEY", arguments->key, "The counter's key")->required();
+  explain->add_option("VALUE", arguments->value, "A value that was counted or recorded");
+  AddJsonFlag(*explain, arguments->json);
+  explain->callback([&session, arguments] {
+    session.command = [&session, arguments] { Explain(session, *arguments); };
+  });
+}
+
 }  // namespace
+
+void NoteUnlisted(Session& session, std::string_view key, KeyKind kind) {
+  if (::isatty(STDERR_FILENO) == 0) return;
+  const DeviceWhitelist device;
+  const auto match = device.config ? device.config->matchForKey(key, kind) : std::nullopt;
+  if (match && !match->isExpired) return;
+  session.messages.add(LogLevel::kDefault,
+                       "note: no entry of the whitelist names " + std::string(key) +
+                           " (see: quorletctl whitelist explain), so no log will hold it");
+}
+
+WhitelistSummary SummariseWhitelist(const std::string& path) {
+  WhitelistSummary summary;
+  for (const auto& [name, value] : ReadWhitelist(path)) {
+    const Group group = CheckGroup(name, value);
+    for (const Table& table : kTables) summary.entries += (group.tables.*table.entries).size();
+    summary.faults += group.faults.size();
+  }
+  return summary;
+}
 
 void AddWhitelistCommands(CLI::App& app, Session& session) {
   CLI::App* whitelist =
@@ -160,6 +326,7 @@ void AddWhitelistCommands(CLI::App& app, Session& session) {
   check->callback([&session, arguments] {
     session.command = [&session, arguments] { Check(session, *arguments); };
   });
+  AddExplainCommand(*whitelist, session);
 }
 
 }  // namespace quorlet

@@ -17,7 +17,7 @@ namespace quorlet {
 namespace {
 
 constexpr char kNote[] = "passes";
-constexpr std::int32_t kDaysKept = 30;
+constexpr std::int32_t kDaysKept = 31;  // as long as their counters, and yesterday's pass
 constexpr std::string_view kAggregatedLog = "log-aggregated";
 constexpr std::string_view kPreviousOSVersion = "previous_os_version";
 constexpr char kOwnDomain[] = "nuvex.aggregated.quorlet";
@@ -73,6 +73,22 @@ void SetLogs(Dictionary& entry, std::string_view name, const std::vector<std::st
 }
 
 }  // namespace
+
+std::optional<std::set<std::int32_t>> closedDays(CounterStore& store, std::int64_t gateDay) {
+  std::optional<Dictionary> stored;
+  if (!store.readNote(kNote, stored)) return std::nullopt;
+  std::set<std::int32_t> closed;
+  if (!stored) return closed;
+  for (const auto& [name, value] : *stored) {
+    const std::optional<std::int32_t> day = DayOf(name);
+    const Dictionary* entry = value.asDictionary();
+    if (!day || entry == nullptr || !IsSet(*entry, "submission")) continue;
+    if (IsSet(*entry, "finished") || (IsSet(*entry, "gated") && gateDay >= *day)) {
+      closed.insert(*day);
+    }
+  }
+  return closed;
+}
 
 PassJournal::PassJournal(Platform& platform, std::int32_t day, bool isGated, std::int64_t gateDay)
     : platform_(platform),

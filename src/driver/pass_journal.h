@@ -6,6 +6,7 @@
 
 #include <cstdint>
 #include <optional>
+#include <set>
 #include <string>
 #include <vector>
 
@@ -15,6 +16,11 @@
 #include "values/property_value.h"
 
 namespace quorlet {
+
+// The days that are closed: a pass for the day came to its end while logs were submitted, whether
+// it had anything to report or not. `gateDay` is the gate's. Nothing, after an error line, when
+// that cannot be known.
+std::optional<std::set<std::int32_t>> closedDays(CounterStore& store, std::int64_t gateDay);
 
 // The record of one pass. Made with the pass lock held, before the pass does anything; nothing is
 // written until the pass writes its first log or figures.

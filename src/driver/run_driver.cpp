@@ -1,5 +1,7 @@
 #include "driver/run_driver.h"
 
+#include <algorithm>
+#include <iterator>
 #include <string>
 
 #include "collectors/platform_statistics.h"
@@ -18,6 +20,9 @@ constexpr char kLastDay[] = "LastCrashLogSerializationDateInDaysSince1970";
 // A gate that is further ahead than this was recorded while the clock was wrong.
 constexpr std::int32_t kFarAhead = 30;
 
+// The pass for yesterday is due; before these, a pass drops what was counted.
+constexpr std::int32_t kDaysBeforeYesterday = 30;
+
 // What repeats the pass for `day` by hand.
 std::string CommandFor(std::int32_t day, std::int32_t today) {
   if (day == today - 1) return "quorlet -f";
@@ -34,20 +39,20 @@ void RunDriver::runDailyTasksIfNewDay(const std::optional<Array>& appInfo) {
     platform_.log.error("No daily pass without its lock; the next start tries again");
     return;
   }
-  Preferences& preferences = platform_.preferences;
-  if (!preferences.isReadable(kDomain)) {
+  const std::optional<std::int64_t> last = gateDay();
+  if (!last) {
     platform_.log.error("No daily pass while the day of the last one cannot be read");
     return;
   }
   const std::int32_t yesterday = platform_.counterStore.TLDaysSince1970() - 1;
-  const std::int64_t last = preferences.DGWPreferencesGetIntegerValue(kLastDay, kDomain);
-  if (last >= yesterday) {
+  if (*last >= yesterday) {
     platform_.log.log("Day unchanged since last run");
-    if (last > std::int64_t{yesterday} + kFarAhead) warnOfFutureDay(last);
+    if (*last > std::int64_t{yesterday} + kFarAhead) warnOfFutureDay(*last);
     return;
   }
-  PassJournal journal(platform_, yesterday, /*isGated=*/true, last);
+  PassJournal journal(platform_, yesterday, /*isGated=*/true, *last);
   runSequence(yesterday, appInfo, journal);
+  Preferences& preferences = platform_.preferences;
   preferences.DGWPreferencesSetValue(kLastDay, Int32(yesterday), kDomain);
   preferences.DGWPreferencesSynchronize(kDomain);
   journal.end();
@@ -59,6 +64,51 @@ void RunDriver::runDailyTasks(std::int32_t day, const std::optional<Array>& appI
   PassJournal journal(platform_, day, /*isGated=*/false, last);
   runSequence(day, appInfo, journal);
   journal.end();
+}
+
+std::optional<std::int64_t> RunDriver::gateDay() {
+  Preferences& preferences = platform_.preferences;
+  if (!preferences.isReadable(kDomain)) return std::nullopt;
+  return preferences.DGWPreferencesGetIntegerValue(kLastDay, kDomain);
+}
+
+std::optional<std::vector<std::int32_t>> RunDriver::missingDays() {
+  CounterStore& store = platform_.counterStore;
+  const std::int32_t last = store.TLDaysSince1970() - 2;
+  const std::optional<std::int64_t> gate = gateDay();
+  const auto closed = gate ? closedDays(store, *gate) : std::nullopt;
+  const auto counted =
+      closed ? store.daysWithCounters(last - kDaysBeforeYesterday, last) : std::nullopt;
+  if (!counted) {
+    platform_.log.error("Which days have no log cannot be known");
+    return std::nullopt;
+  }
+  std::vector<std::int32_t> missing;
+  std::ranges::set_difference(*counted, *closed, std::back_inserter(missing));
+  return missing;
+}
+
+bool RunDriver::closeMissingDays(const std::function<void(std::int32_t day)>& closed) {
+  const PassHold hold(platform_.passLock);
+  // What was counted without consent is no day's.
+  if (!hold.isHeld() || !finishDueDrop(platform_)) return false;
+  const auto missing = missingDays();
+  if (!missing) return false;
+  bool areAllClosed = true;
+  for (const std::int32_t day : *missing) {
+    const std::optional<std::int64_t> gate = gateDay();
+    if (!gate) return false;
+    PassJournal journal(platform_, day, /*isGated=*/false, *gate);
+    const ReportOutcome outcome = reportDay(day, std::nullopt, journal);
+    journal.settle(outcome);
+    if (outcome == ReportOutcome::kLost) {
+      areAllClosed = false;
+      continue;
+    }
+    journal.end();
+    closed(day);
+  }
+  return areAllClosed;
 }
 
 void RunDriver::warnOfFutureDay(std::int64_t day) {
@@ -82,23 +132,29 @@ ReportOutcome RunDriver::writeLog(std::int32_t day, const std::optional<Array>& 
   return report.writeLogForYesterdayWithAppInfo(day, records);
 }
 
+// With an error line, and the command that helps, for a log that was lost.
+ReportOutcome RunDriver::reportDay(std::int32_t day, const std::optional<Array>& appInfo,
+                                   PassJournal& journal) {
+  SystemLog& log = platform_.log;
+  auto outcome = ReportOutcome::kLost;
+  RunStep(log, "aggregated log", [&] { outcome = writeLog(day, appInfo, journal); });
+  if (outcome != ReportOutcome::kLost) return outcome;
+  const std::string command = CommandFor(day, platform_.counterStore.TLDaysSince1970());
+  if (!journal.keepsLeftLog()) {
+    log.error("The log of day %d is not in the spool; \"%s\" repeats it", day, command);
+    return outcome;
+  }
+  log.error("The log of day %d stays that of a pass that was cut short; \"%s\" writes another", day,
+            command);
+  return ReportOutcome::kWritten;
+}
+
 void RunDriver::runSequence(std::int32_t day, const std::optional<Array>& appInfo,
                             PassJournal& journal) {
   SystemLog& log = platform_.log;
   log.log("daily tasks for day %d", day);
   RunStep(log, "checkpoint", [&] { platform_.counterStore.TLClientCheckpoint(); });
-  auto outcome = ReportOutcome::kLost;
-  RunStep(log, "aggregated log", [&] { outcome = writeLog(day, appInfo, journal); });
-  if (outcome == ReportOutcome::kLost) {
-    const std::string command = CommandFor(day, platform_.counterStore.TLDaysSince1970());
-    if (journal.keepsLeftLog()) {
-      outcome = ReportOutcome::kWritten;
-      log.error("The log of day %d stays that of a pass that was cut short; \"%s\" writes another",
-                day, command);
-    } else {
-      log.error("The log of day %d is not in the spool; \"%s\" repeats it", day, command);
-    }
-  }
+  const ReportOutcome outcome = reportDay(day, appInfo, journal);
   RunStep(log, "platform statistics", [&] {
     Platform platform = platform_.with({.diagnostics = &journal.diagnostics()});
     collectPlatformStatistics(platform, journal.progress());

@@ -3,7 +3,9 @@
 #define QUORLET_DRIVER_RUN_DRIVER_H_
 
 #include <cstdint>
+#include <functional>
 #include <optional>
+#include <vector>
 
 #include "platform/platform.h"
 #include "report/report.h"
@@ -14,9 +16,9 @@ namespace quorlet {
 class PassJournal;
 
 // `appInfo` is an array of app-info records, passed through to the aggregated log unread, or none.
-// Both operations hold the pass lock while they work, and neither reports a result: a step that
-// fails says so in the system log, and the next step runs. A pass that was cut short is repeated,
-// not doubled, by the next one for its day (driver/pass_journal.h).
+// What runs a pass holds the pass lock meanwhile and reports no result: a step that fails says so
+// in the system log, and the next step runs. A pass that was cut short is repeated, not doubled, by
+// the next one for its day (driver/pass_journal.h).
 class RunDriver {
  public:
   explicit RunDriver(Platform& platform) : platform_(platform) {}
@@ -29,10 +31,25 @@ class RunDriver {
   // Runs the daily pass for `day`, without the gate.
   void runDailyTasks(std::int32_t day, const std::optional<Array>& appInfo);
 
+  // The day of the last gated pass, 0 when there was none. Nothing when that cannot be read.
+  std::optional<std::int64_t> gateDay();
+
+  // The days of the last 30 before yesterday that have counters and are not closed, the oldest
+  // first: no pass for the day, nor closeMissingDays, came to its end with submission enabled.
+  // Nothing, after an error line, when that cannot be known.
+  std::optional<std::vector<std::int32_t>> missingDays();
+
+  // Writes the aggregated log, and nothing else of a pass, for each missing day, holding the pass
+  // lock once, and calls `closed` after each. Returns false, after an error line, when a day is
+  // still missing.
+  [[nodiscard]] bool closeMissingDays(const std::function<void(std::int32_t day)>& closed);
+
  private:
   void runSequence(std::int32_t day, const std::optional<Array>& appInfo, PassJournal& journal);
   ReportOutcome writeLog(std::int32_t day, const std::optional<Array>& appInfo,
                          PassJournal& journal);
+  ReportOutcome reportDay(std::int32_t day, const std::optional<Array>& appInfo,
+                          PassJournal& journal);
   void warnOfFutureDay(std::int64_t day);
 
   Platform& platform_;

@@ -10,6 +10,7 @@
 #include <iterator>
 #include <memory>
 #include <optional>
+#include <set>
 #include <span>
 #include <string>
 #include <string_view>
@@ -140,6 +141,22 @@ class CounterStore {
   // A reader on the store's default location, or nullptr when there is no store. One that cannot be
   // opened gives a reader that has failed, after an error line.
   virtual std::unique_ptr<TLHistory> initWithDefaultPath() = 0;
+
+  // The days d with low < d <= high that have counters; nothing when not all could be read.
+  std::optional<std::set<std::int32_t>> daysWithCounters(std::int32_t low, std::int32_t high) {
+    std::set<std::int32_t> days;
+    const auto history = initWithDefaultPath();
+    if (history == nullptr) return days;
+    history->scalarsForKeyPrefixMinDaysSince1970MaxDaysSince1970RowHandler(
+        "", low, high,
+        [&](std::string_view, std::int32_t day, std::int64_t, bool&) { days.insert(day); });
+    history->distributionsForKeyPrefixMinDaysSince1970MaxDaysSince1970RowHandler(
+        "", low, high,
+        [&](std::string_view, std::int32_t day, TLHistoryDistributionEnumerator&, bool&) {
+          days.insert(day);
+        });
+    return history->failed() ? std::nullopt : std::optional(days);
+  }
 
  private:
   void change(ScalarChange::Kind kind, std::string_view key, std::int64_t value) {

@@ -133,30 +133,47 @@ std::optional<TLConfig> TLConfig::init(Platform& platform, bool* isUnreadable) {
 }
 
 std::optional<KeyOptions> TLConfig::configOptionsForScalarKey(std::string_view key) const {
-  return optionsForKey(key, _scalarKeys, _scalarPrefixes, _scalarPrefixLengths);
+  return optionsForKey(key, KeyKind::kScalar);
 }
 
 std::optional<KeyOptions> TLConfig::configOptionsForDistributionKey(std::string_view key) const {
-  return optionsForKey(key, _distributionKeys, _distributionPrefixes, _distributionPrefixLengths);
+  return optionsForKey(key, KeyKind::kDistribution);
 }
 
-std::optional<KeyOptions> TLConfig::optionsForKey(
-    std::string_view key, const Dictionary& keys, const Dictionary& prefixes,
-    const std::vector<std::size_t>& prefixLengths) const {
-  if (const PropertyValue* options = keys.find(key)) return *options->asDictionary();
-  for (const std::size_t length : prefixLengths) {
+std::optional<KeyOptions> TLConfig::optionsForKey(std::string_view key, KeyKind kind) const {
+  auto match = matchForKey(key, kind);
+  if (!match || match->isExpired) return std::nullopt;
+  if (match->kind == KeyMatch::Kind::kPrefix) {
+    _log->debug("prefix match %@ for %@", match->entry, key);
+  } else if (match->kind == KeyMatch::Kind::kInternalDevice) {
+    _log->debug("passing @{} for %@ as device is Nuvex Internal", key);
+  }
+  return std::move(match->options);
+}
+
+std::optional<KeyMatch> TLConfig::matchForKey(std::string_view key, KeyKind kind) const {
+  const bool isScalar = kind == KeyKind::kScalar;
+  const Dictionary& keys = isScalar ? _scalarKeys : _distributionKeys;
+  if (const PropertyValue* options = keys.find(key)) {
+    const Dictionary& exact = *options->asDictionary();
+    return KeyMatch{KeyMatch::Kind::kExact, std::string(key), exact, hasExpired(exact)};
+  }
+  const Dictionary& prefixes = isScalar ? _scalarPrefixes : _distributionPrefixes;
+  for (const std::size_t length : isScalar ? _scalarPrefixLengths : _distributionPrefixLengths) {
     if (length > key.size()) continue;
     const std::string_view prefix = key.substr(0, length);
-    if (const PropertyValue* options = prefixes.find(prefix)) {
-      _log->debug("prefix match %@ for %@", prefix, key);
-      return *options->asDictionary();
-    }
+    const PropertyValue* options = prefixes.find(prefix);
+    if (options == nullptr || hasExpired(*options->asDictionary())) continue;
+    return KeyMatch{KeyMatch::Kind::kPrefix, std::string(prefix), *options->asDictionary()};
   }
-  if (_isInternalDevice) {
-    _log->debug("passing @{} for %@ as device is Nuvex Internal", key);
-    return KeyOptions();
-  }
-  return std::nullopt;
+  if (!_isInternalDevice) return std::nullopt;
+  return KeyMatch{KeyMatch::Kind::kInternalDevice, "", KeyOptions()};
+}
+
+bool TLConfig::hasExpired(const KeyOptions& options) const {
+  if (!_reportedDay) return false;
+  const auto last = ExpiryOption(options);
+  return last && *_reportedDay > *last;
 }
 
 }  // namespace quorlet

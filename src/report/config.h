@@ -7,6 +7,7 @@
 #define QUORLET_REPORT_CONFIG_H_
 
 #include <cstddef>
+#include <cstdint>
 #include <functional>
 #include <optional>
 #include <string>
@@ -48,31 +49,46 @@ std::vector<WhitelistFault> MergeWhitelist(const Dictionary& root,
 // logged; internal devices have all groups.
 bool IsGroupEnabled(const std::string& group, bool isInternalDevice, Platform& platform);
 
+// The entry of the whitelist that applies to a key.
+struct KeyMatch {
+  enum class Kind { kExact, kPrefix, kInternalDevice } kind;
+  std::string entry;  // the key or prefix; empty for what only an internal device reports
+  KeyOptions options;
+  bool isExpired = false;  // an exact entry that hides the prefixes, but answers nothing any more
+};
+
 class TLConfig {
  public:
   // Loads the whitelist file. Nothing, after one message, when it cannot be read or parsed;
   // `isUnreadable` tells whether it is there, but could not be read.
   static std::optional<TLConfig> init(Platform& platform, bool* isUnreadable = nullptr);
 
+  // The day that is reported, for entries that expire; until it is told, none has expired.
+  void setReportedDay(std::int32_t day) { _reportedDay = day; }
+
   // The options with which a key is reported, or nothing when it is left out. An exact entry comes
-  // before a prefix, a longer prefix before a shorter one.
+  // before a prefix, a longer prefix before a shorter one; a prefix that has expired is passed
+  // over.
   std::optional<KeyOptions> configOptionsForScalarKey(std::string_view key) const;
   std::optional<KeyOptions> configOptionsForDistributionKey(std::string_view key) const;
+
+  // The entry that gives the options above, or that has expired; nothing when no entry applies.
+  std::optional<KeyMatch> matchForKey(std::string_view key, KeyKind kind) const;
 
   // The MD5 digest of the whitelist file, 32 lower-case hexadecimal characters.
   const std::string& configFileDigest() const { return _configFileDigest; }
 
  private:
   explicit TLConfig(SystemLog& log) : _log(&log) {}
-  std::optional<KeyOptions> optionsForKey(std::string_view key, const Dictionary& keys,
-                                          const Dictionary& prefixes,
-                                          const std::vector<std::size_t>& prefixLengths) const;
+  std::optional<KeyOptions> optionsForKey(std::string_view key, KeyKind kind) const;
+  bool hasExpired(const KeyOptions& options) const;
 
   Dictionary _scalarKeys;
   Dictionary _scalarPrefixes;
   Dictionary _distributionKeys;
   Dictionary _distributionPrefixes;
   bool _isInternalDevice = false;
+  std::optional<std::int32_t> _reportedDay;
   std::string _configFileDigest;
 
   // The lengths that occur among the prefixes, longest first: a key is looked up once for each.

@@ -45,6 +45,13 @@ std::optional<std::string_view> BoundsFault(const PropertyValue& value) {
   return std::nullopt;
 }
 
+std::optional<std::int64_t> LastDay(const PropertyValue& value) {
+  if (const std::string* text = value.asString()) return ParseDate(*text);
+  const Date* date = value.asDate();
+  if (date == nullptr || !std::isfinite(date->secondsSince1970)) return std::nullopt;
+  return Number::Real(NumberKind::kDouble, std::floor(date->secondsSince1970 / 86400)).toInt64();
+}
+
 std::optional<std::string_view> ValueFault(OptionType type, const PropertyValue& value) {
   const bool isText = value.asString() != nullptr;
   switch (type) {
@@ -55,9 +62,9 @@ std::optional<std::string_view> ValueFault(OptionType type, const PropertyValue&
     case OptionType::kText:
       return isText ? std::nullopt : std::optional<std::string_view>("is not a text");
     case OptionType::kDate:
-      return isText || value.asDate() != nullptr
+      return LastDay(value)
                  ? std::nullopt
-                 : std::optional<std::string_view>("is neither a date nor a text");
+                 : std::optional<std::string_view>("is neither a date nor \"YYYY-MM-DD\"");
   }
   return std::nullopt;
 }
@@ -110,6 +117,11 @@ std::optional<Array> IntervalsOption(const KeyOptions& options) {
   const PropertyValue* value = options.find(kIntervals);
   if (value == nullptr || IntervalsFault(*value)) return std::nullopt;
   return *value->asArray();
+}
+
+std::optional<std::int64_t> ExpiryOption(const KeyOptions& options) {
+  const PropertyValue* value = options.find(kExpires);
+  return value != nullptr ? LastDay(*value) : std::nullopt;
 }
 
 std::optional<std::string> UnknownOptionFault(std::string_view name) {

@@ -19,13 +19,14 @@ using KeyOptions = Dictionary;
 inline constexpr std::string_view kSigFig = "sig_fig";
 inline constexpr std::string_view kBucketInterval = "bucket_interval";
 inline constexpr std::string_view kIntervals = "intervals";
+inline constexpr std::string_view kExpires = "expires";
 
 enum class KeyKind { kScalar, kDistribution };
 enum class OptionType {
   kRounding,   // a non-negative number
   kIntervals,  // an array of numbers
   kText,
-  kDate,  // or its text
+  kDate,  // or "YYYY-MM-DD"
 };
 
 struct OptionRule {
@@ -40,7 +41,7 @@ inline constexpr std::array<OptionRule, 5> kOptionRules{{
     {kBucketInterval, KeyKind::kScalar, OptionType::kRounding},
     {kIntervals, KeyKind::kDistribution, OptionType::kIntervals},
     {"why", std::nullopt, OptionType::kText},
-    {"expires", std::nullopt, OptionType::kDate},
+    {kExpires, std::nullopt, OptionType::kDate},
 }};
 
 // A rounding option (fractions truncated, larger than 64 bits saturated), or nothing when it is
@@ -49,6 +50,9 @@ std::optional<std::uint64_t> RoundingOption(const KeyOptions& options, std::stri
 
 // The "intervals" entry when every element is a number other than NaN, otherwise nothing.
 std::optional<Array> IntervalsOption(const KeyOptions& options);
+
+// The last day for which the entry answers, or nothing when it does not expire.
+std::optional<std::int64_t> ExpiryOption(const KeyOptions& options);
 
 // What is wrong with an option's name: "\"sig_figs\" is not an option, did you mean \"sig_fig\"?".
 // Nothing when there is such an option.

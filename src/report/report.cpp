@@ -48,6 +48,7 @@ ReportOutcome TLReport::writeLogForYesterdayWithAppInfo(std::int32_t yesterday,
                                                         const std::optional<Array>& appInfo) {
   bool allRead = true;
   _platform.log.info("writing aggregated log. yesterday=%d", yesterday);
+  if (_config) _config->setReportedDay(yesterday);
   if (const auto history = _platform.counterStore.initWithDefaultPath()) {
     const std::int32_t before = yesterday > std::numeric_limits<std::int32_t>::min()
                                     ? yesterday - 1

@@ -3,6 +3,7 @@
 
 #include <algorithm>
 #include <array>
+#include <charconv>
 #include <chrono>
 #include <cmath>
 
@@ -121,6 +122,24 @@ void AppendUtf8(std::string& out, std::uint32_t c) {
   constexpr std::array<std::uint32_t, 4> kLeads = {0, 0xC0, 0xE0, 0xF0};
   put(kLeads[more] | c >> (6 * more));
   for (unsigned i = more; i-- > 0;) put(0x80 | (c >> (6 * i) & 0x3F));
+}
+
+std::optional<std::int32_t> ParseDate(std::string_view text) {
+  if (text.size() != 10 || text[4] != '-' || text[7] != '-') return std::nullopt;
+  const auto number = [&](std::size_t at, std::size_t size) -> std::optional<unsigned> {
+    unsigned value = 0;
+    const char* const end = text.data() + at + size;
+    const auto [stopped, error] = std::from_chars(text.data() + at, end, value);
+    return error == std::errc() && stopped == end ? std::optional(value) : std::nullopt;
+  };
+  const auto year = number(0, 4);
+  const auto month = number(5, 2);
+  const auto day = number(8, 2);
+  if (!year || !month || !day) return std::nullopt;
+  const std::chrono::year_month_day date{std::chrono::year(static_cast<int>(*year)),
+                                         std::chrono::month(*month), std::chrono::day(*day)};
+  if (!date.ok()) return std::nullopt;
+  return static_cast<std::int32_t>(std::chrono::sys_days(date).time_since_epoch().count());
 }
 
 std::string Rfc3339(Date date) {

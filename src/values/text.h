@@ -92,6 +92,9 @@ std::size_t ValidUtf8Prefix(std::string_view text);
 
 // "2026-03-04T05:06:07Z"; fractions are dropped. Years outside 0 to 9999 are clamped.
 std::string Rfc3339(Date date);
+// The number of the day, counted from 1970-01-01, that "2026-03-04" names; nothing for a text of
+// another form and for a day that the calendar does not have.
+std::optional<std::int32_t> ParseDate(std::string_view text);
 
 }  // namespace quorlet
 

@@ -116,6 +116,40 @@ TEST_F(RunDriverTest, ALostLogIsSaidAndWhatItUsedUpStandsInTheNext) {
       "The log of day 19998 is not in the spool; \"quorletctl send run-day 19998\" repeats it");
 }
 
+TEST_F(RunDriverTest, MissingDaysAreClosedOnce) {
+  using DayNumbers = std::vector<std::int32_t>;
+  DayNumbers closed;
+  const auto note = [&](std::int32_t day) { closed.push_back(day); };
+  for (std::int32_t day = 19990; day < 19997; ++day) device.counterStore.scalars.erase({"s", day});
+  device.counterStore.hasScalar("s", 19968, 1);                 // 31 days before yesterday
+  device.counterStore.hasDistribution("unlisted", 19969, {1});  // closed without a log
+  const DayNumbers missing = {19969, 19997, 19998};
+  EXPECT_EQ(driver.missingDays(), missing);
+  device.passLock.isFree = false;
+  EXPECT_FALSE(driver.closeMissingDays(note));
+  device.passLock.isFree = true;
+  device.diagnostics.diskIsFull = true;
+  EXPECT_FALSE(driver.closeMissingDays(note));
+  EXPECT_EQ(closed, DayNumbers{19969}) << "the day that has nothing to report";
+  device.diagnostics.diskIsFull = false;
+  EXPECT_TRUE(driver.closeMissingDays(note));
+  EXPECT_EQ(closed, missing);
+  EXPECT_EQ(device.diagnostics.logs.size(), 2u);
+  EXPECT_EQ(device.crashSupport.dumps, 0) << "nothing else of a pass";
+  EXPECT_EQ(recordedDay(), 0);
+  // A pass closes its day where its logs are wanted.
+  driver.runDailyTasksIfNewDay(std::nullopt);
+  device.clock.goToDay(20002);
+  device.diagnostics.submissionEnabled = false;
+  driver.runDailyTasksIfNewDay(std::nullopt);
+  device.diagnostics.submissionEnabled = true;
+  device.clock.goToDay(20003);
+  EXPECT_EQ(driver.missingDays(), (DayNumbers{20000, 20001}));
+  device.counterStore.isUnreadable = true;
+  EXPECT_EQ(driver.missingDays(), std::nullopt);
+  EXPECT_FALSE(driver.closeMissingDays(note));
+}
+
 TEST_F(RunDriverTest, WhatWasCountedWithoutConsentIsNeverReported) {
   device.diagnostics.submissionEnabled = false;
   ASSERT_TRUE(giveConsent(device.services, false));

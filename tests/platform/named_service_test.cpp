@@ -14,6 +14,7 @@
 #include "fakes/temp_root.h"
 #include "platform/linux/frame_buffer.h"
 #include "platform/linux/listening_socket.h"
+#include "platform/linux/paths.h"
 #include "platform/linux/unix_socket.h"
 #include "values/property_list.h"
 

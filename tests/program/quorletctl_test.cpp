@@ -451,6 +451,90 @@ TEST_F(QuorletctlTest, WhitelistCheckShowsWhatDoesNotWork) {
   EXPECT_EQ(keys, (Words{"", "ScalarKey", "slip", "text"}));
 }
 
+TEST_F(QuorletctlTest, ExplainShowsWhatALogWouldHold) {
+  device.write(kWhitelist, R"(<plist version="1.0"><dict><key>G</key><dict>
+      <key>ScalarKeys</key><dict><key>old</key><dict><key>expires</key><string>2020-01-01</string>
+        </dict></dict>
+      <key>ScalarKeyPrefixes</key><dict><key>o</key><dict/><key>s.</key><dict>
+        <key>sig_fig</key><integer>1</integer></dict></dict>
+      <key>DistributionKeys</key><dict><key>s.d</key><dict><key>intervals</key><array>
+        <integer>1</integer><integer>5</integer></array></dict></dict></dict></dict></plist>)");
+  const std::tuple<Words, int, std::string> cases[] = {
+      {{"s.d", "1234"},
+       0,
+       "scalar: prefix s.  sig_fig=1\n  reported: 1000\n"
+       "distribution: key s.d  intervals=[1,5]\n"
+       "  reported: counted in (5, inf), and summed up with the day's values\n"},
+      {{"old", "3"}, 1, "scalar: key old  expires=\"2020-01-01\"  EXPIRED\n"},
+      {{"none"}, 1, "no entry names none: it is not reported\n"},
+  };
+  for (const auto& [arguments, status, out] : cases) {
+    Words words = {"whitelist", "explain"};
+    words.insert(words.end(), arguments.begin(), arguments.end());
+    const ProgramResult result = run(words);
+    EXPECT_EQ(std::tie(result.status, result.out), std::tie(status, out)) << result.err;
+    EXPECT_EQ(result.err, "");
+  }
+  device.write(kWhitelist, "cut");
+  expectFailure({"whitelist", "explain", "k"}, 1, "parse");
+}
+
+TEST_F(QuorletctlTest, StatusNamesWhatIsWrongAndItsRemedy) {
+  const auto states = [&](int status) {
+    const ProgramResult result = run({"status", "--json"});
+    EXPECT_EQ(result.status, status);
+    EXPECT_EQ(result.err, "");
+    std::map<std::string, std::string> found;
+    std::string order;
+    const Json document = Json::parse(result.out);
+    for (const Json& check : document["checks"]) {
+      const std::string name = check["name"];
+      const std::string remedy = check["remedy"];
+      found[name] = check["state"];
+      EXPECT_EQ(remedy.empty(), found[name] == "ok") << name;
+      // Remedies of our own are commands that there are.
+      if (remedy.starts_with("quorletctl ")) {
+        Words words = {remedy.substr(11, remedy.find(' ', 11) - 11), "--help"};
+        EXPECT_EQ(run(words).status, 0) << remedy;
+      }
+      order += name + " ";
+    }
+    EXPECT_EQ(order,
+              "root permissions consent whitelist store last-pass spool structured-log clock "
+              "service storage units ");
+    return found;
+  };
+  auto found = states(0);
+  EXPECT_EQ(found["consent"] + found["whitelist"], "warningwarning");
+  run({"init", "--demo"});
+  run({"tally", "add", "nuvex.demo.launches", "1", "--day",
+       std::to_string(std::time(nullptr) / 86400 - 4)});
+  EXPECT_EQ(states(0)["last-pass"], "warning");
+  EXPECT_EQ(std::ranges::count(outputOf({"report", "close-missing"}), '\n'), 1);
+  EXPECT_EQ(outputOf({"report", "close-missing"}), "");
+  device.write("/run/systemd/system/quorlet.socket", "");
+  device.write("/etc/systemd/system/timers.target.wants/quorlet-daily.timer", "");
+  found = states(0);
+  EXPECT_EQ(found["service"] + found["units"], "okwarning");
+  device.write("/usr/lib/systemd/system/quorlet-daily.timer", "");
+  EXPECT_EQ(states(0)["units"], "ok");
+  run({"prefs", "set", "nuvex.aggregated.quorlet", "LastCrashLogSerializationDateInDaysSince1970",
+       "30000"});
+  std::string store = device.read(kStore);
+  std::filesystem::remove(device.path(std::string(kStore) + "-wal"));  // it has the pages as well
+  store.replace(store.size() / 2, store.size() / 4, store.size() / 4, 'x');
+  device.write(kStore, store);
+  device.write(kWhitelist, "cut");
+  run({"prefs", "set", "nuvex.diagwell", "SubmissionEnabled", "1"});
+  const auto before = everything();
+  found = states(1);
+  EXPECT_EQ(everything(), before);
+  for (const char* name : {"consent", "whitelist", "store", "last-pass"}) {
+    EXPECT_EQ(found[name], "error") << name;
+  }
+  EXPECT_EQ(run({"status"}).out.substr(0, 8), "ok root ");
+}
+
 TEST_F(QuorletctlTest, ConsentIsGivenOnceAndWithdrawnWhole) {
   const std::string domain = "nuvex.diagwell";
   run({"prefs", "remove", domain, "SubmissionEnabled"});

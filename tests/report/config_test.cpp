@@ -108,6 +108,26 @@ TEST_F(ConfigTest, FaultyEntriesAreSkippedWithOneLineEach) {
                 "Skipping keyGroup H: it is not a dictionary"}));
 }
 
+TEST_F(ConfigTest, AnEntryAnswersUpToTheDayOnWhichItExpires) {
+  const auto table = [](const char* name, const char* entries) {
+    return std::string("<key>") + name + "</key><dict>" + entries + "</dict>";
+  };
+  const std::string date = "<dict><key>expires</key><date>1970-01-11T23:59:59Z</date></dict>";
+  const std::string worded = "<dict><key>expires</key><string>1970-01-11</string></dict>";
+  whitelist("<key>G</key><dict>" + table("ScalarKeys", ("<key>a.x</key>" + date).c_str()) +
+            table("ScalarKeyPrefixes", ("<key>a.</key><dict/><key>a.y</key>" + worded).c_str()) +
+            "</dict>");
+  for (const bool isInternal : {false, true}) {
+    if (isInternal) makeInternal();
+    TLConfig config = load();
+    for (const std::int32_t day : {10, 11}) {
+      config.setReportedDay(day);
+      EXPECT_EQ(config.configOptionsForScalarKey("a.x").has_value(), day == 10) << "hides a.";
+      EXPECT_EQ(text(config.configOptionsForScalarKey("a.yz")) == "{}", day == 11) << "passed over";
+    }
+  }
+}
+
 TEST_F(ConfigTest, AnUnknownOptionIsToldAndItsEntryUsed) {
   whitelist(Group("G", "ScalarKeys",
                   {{"k", "sig_figs", "1"}, {"ok", "sig_fig", "1"}, {"ok.why", "why", "1"}}));
@@ -154,7 +174,9 @@ TEST(KeyOptionFaults, NameEachOptionThatWillNotWorkAsMeant) {
       {kScalar, "why", "asked for", ""},
       {kDistribution, "why", true, "\"why\" is not a text"},
       {kDistribution, "expires", Date{0}, ""},
-      {kScalar, "expires", Int64(1), "\"expires\" is neither a date nor a text"},
+      {kScalar, "expires", "2026-02-28", ""},
+      {kScalar, "expires", "2026-02-29", "\"expires\" is neither a date nor \"YYYY-MM-DD\""},
+      {kScalar, "expires", Int64(1), "\"expires\" is neither a date nor \"YYYY-MM-DD\""},
   };
   for (const auto& [kind, name, value, fault] : cases) {
     const auto faults = KeyOptionFaults(Dictionary{{name, value}}, kind);

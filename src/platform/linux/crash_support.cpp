@@ -12,6 +12,7 @@
 #include <vector>
 
 #include "platform/linux/descriptor.h"
+#include "platform/linux/paths.h"
 #include "platform/linux/property_json.h"
 #include "platform/linux/services.h"
 #include "platform/linux/structured_log.h"
@@ -20,8 +21,6 @@
 namespace quorlet {
 namespace {
 
-constexpr char kStructuredLogs[] = "/var/mobile/Library/Logs/FaultScribe";
-constexpr char kSupportLogs[] = "/var/mobile/Library/Logs/Carewell";
 constexpr char kMachineId[] = "/etc/machine-id";
 constexpr char kProductName[] = "/sys/devices/virtual/dmi/id/product_name";
 constexpr char kUnknown[] = "unknown";
@@ -76,8 +75,8 @@ class LinuxCrashSupport : public CrashSupport {
   LinuxCrashSupport(const Root& root, Access access, Clock& clock, OSVersion& osVersion,
                     SystemLog& log)
       : root_(root),
-        structuredLog_(root.path(kStructuredLogs)),
-        supportLogs_(root.path(kSupportLogs)),
+        structuredLog_(root.path(kStructuredLogDirectory)),
+        supportLogs_(root.path(kSupportLogDirectory)),
         access_(access),
         clock_(clock),
         osVersion_(osVersion),

@@ -18,14 +18,12 @@
 #include <vector>
 
 #include "platform/linux/descriptor.h"
+#include "platform/linux/paths.h"
 #include "platform/linux/property_json.h"
 #include "platform/linux/services.h"
 
 namespace quorlet {
 namespace {
-
-constexpr char kDirectory[] = "/var/mobile/Library/Logs/Diagwell";
-constexpr std::uint64_t kQuotaBytes = 64UL << 20;  // of both directories together
 
 // A log on disk.
 struct StoredLog {
@@ -90,7 +88,7 @@ class FileOutput : public LogOutput {
   explicit FileOutput(AtomicFile& file) : file_(file) {}
 
   bool write(std::string_view bytes) override {
-    if (error_ == 0) error_ = bytes.size() > kQuotaBytes - size_ ? EFBIG : file_.write(bytes);
+    if (error_ == 0) error_ = bytes.size() > kSpoolQuotaBytes - size_ ? EFBIG : file_.write(bytes);
     if (error_ != 0) return false;
     size_ += bytes.size();
     return true;
@@ -108,7 +106,7 @@ class LinuxDiagnostics : public Diagnostics {
  public:
   LinuxDiagnostics(const Root& root, Access access, Clock& clock, Preferences& preferences,
                    OSVersion& osVersion, SystemLog& log)
-      : directory_(root.path(kDirectory)),
+      : directory_(root.path(kSpoolDirectory)),
         pending_(directory_ + "/pending"),
         outbox_(directory_ + "/outbox"),
         access_(access),
@@ -262,7 +260,7 @@ class LinuxDiagnostics : public Diagnostics {
     std::uint64_t total = size;
     for (const StoredLog& log : logs) total += log.size;
     for (const StoredLog& log : logs) {
-      if (total <= kQuotaBytes) break;
+      if (total <= kSpoolQuotaBytes) break;
       if (unlink(log.path.c_str()) != 0) {
         log_.error("Cannot remove the old log %@: %@", log.path, ErrnoText(errno));
         continue;
@@ -270,7 +268,7 @@ class LinuxDiagnostics : public Diagnostics {
       log_.info("Removed the old log %@ to make room", log.path);
       total -= log.size;
     }
-    return total <= kQuotaBytes ? "" : "there is no room for it";
+    return total <= kSpoolQuotaBytes ? "" : "there is no room for it";
   }
 
   const std::string directory_;

@@ -27,6 +27,7 @@
 
 #include "platform/linux/frame_buffer.h"
 #include "platform/linux/listening_socket.h"
+#include "platform/linux/paths.h"
 #include "values/property_list.h"
 
 namespace quorlet {

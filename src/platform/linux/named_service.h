@@ -12,7 +12,6 @@
 namespace quorlet {
 
 // Where services have their sockets, below the root.
-inline constexpr char kServiceDirectory[] = "/run/quorlet";
 
 // Connections at the same time. A newcomer beyond them takes the place of the one that has been
 // silent longest, so that silent peers do not lock others out.

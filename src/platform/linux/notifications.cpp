@@ -6,6 +6,7 @@
 #include <variant>
 
 #include "platform/linux/named_service.h"
+#include "platform/linux/paths.h"
 
 namespace quorlet {
 namespace {

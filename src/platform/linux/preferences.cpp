@@ -19,13 +19,13 @@
 #include <utility>
 #include <variant>
 
+#include "platform/linux/paths.h"
 #include "platform/linux/services.h"
 #include "values/property_list.h"
 
 namespace quorlet {
 namespace {
 
-constexpr char kDirectory[] = "/var/mobile/Library/Preferences";
 constexpr std::size_t kLongestShownName = 201;  // a byte more than a good name has
 
 // What tells one content of a file from another; `error` is set when there is none to be seen.
@@ -124,7 +124,7 @@ std::string StorableKey(std::string_view key) {
 class LinuxPreferences : public Preferences {
  public:
   LinuxPreferences(const Root& root, Access access, SystemLog& log)
-      : directory_(root.path(kDirectory)), access_(access), log_(log) {}
+      : directory_(root.path(kPreferencesDirectory)), access_(access), log_(log) {}
 
   ~LinuxPreferences() override {
     for (auto& [name, domain] : domains_) {

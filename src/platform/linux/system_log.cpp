@@ -13,12 +13,12 @@
 #include <mutex>
 
 #include "platform/linux/descriptor.h"
+#include "platform/linux/paths.h"
 #include "platform/linux/services.h"
 
 namespace quorlet {
 namespace {
 
-constexpr char kLogDirectory[] = "/var/log";
 constexpr char kLogName[] = "/quorlet.log";
 constexpr char kIdent[] = "quorlet";
 
@@ -100,7 +100,7 @@ class SyslogLog : public SystemLog {
 class FileLog : public SystemLog {
  public:
   FileLog(const Root& root, Clock& clock)
-      : clock_(clock), directory_(root.path(kLogDirectory)), path_(directory_ + kLogName) {}
+      : clock_(clock), directory_(root.path(kSystemLogDirectory)), path_(directory_ + kLogName) {}
 
   ~FileLog() override { (void)flush(); }
 

@@ -10,14 +10,13 @@
 
 #include "platform/linux/descriptor.h"
 #include "platform/linux/lock_holder.h"
+#include "platform/linux/paths.h"
 #include "platform/linux/tally_database.h"
 #include "platform/linux/tally_history.h"
 
 namespace quorlet {
 namespace {
 
-constexpr char kDirectory[] = "/Library/TallyLedger";
-constexpr char kDatabaseName[] = "/TLDataStore.sqlitedb";
 constexpr char kLockName[] = "/.TLDataStore.lock";
 constexpr char kCorruptionCountKey[] = "DatabaseCorruptionCount";
 constexpr char kCorruptionCountDomain[] = "nuvex.aggregated";
@@ -66,6 +65,7 @@ class LinuxTallyLedger final : public TallyLedger {
   bool readNote(std::string_view name, std::optional<std::string>& value) override;
   bool inTransaction(const std::function<bool()>& work) override;
   bool checkpoint(std::int32_t firstDay) override;
+  bool isSound() override;
   std::unique_ptr<TLHistory> openHistory() override;
 
  private:
@@ -110,8 +110,8 @@ bool LinuxTallyLedger::findPath() {
   if (!path_.empty()) return true;
   const std::optional<std::string> home = queries_.dataHomePath();
   if (!home) return false;
-  directory_ = root_.path(*home + kDirectory);
-  path_ = directory_ + kDatabaseName;
+  directory_ = root_.path(*home + kCounterStoreDirectory);
+  path_ = root_.path(*home + kCounterStorePath);
   return true;
 }
 
@@ -240,6 +240,24 @@ bool LinuxTallyLedger::checkpoint(std::int32_t firstDay) {
     if (code == SQLITE_OK && !has) return true;
     if (code == SQLITE_OK) return write({}, [&] { return writer_.dropDaysBefore(firstDay); });
     if (!recover(code, mayTryAgain)) return false;
+  }
+  return false;
+}
+
+bool LinuxTallyLedger::isSound() {
+  const std::lock_guard lock(mutex_);
+  FileIdentity file;
+  if (!findPath()) return false;
+  if (FindIdentity(path_, file) == ENOENT) return true;
+  TallyDatabase reader;
+  int code = reader.openForReading(path_, /*untouched=*/true, patience_);
+  if (code == SQLITE_OK && !reader.isBlank()) code = reader.examine(/*values=*/true);
+  if (code == SQLITE_OK) return true;
+  const std::string why = reader.message(code);
+  if (IsDamage(code)) {
+    log_.error("The counter store %@ is damaged: %@", path_, why);
+  } else {
+    log_.error("Cannot read the counter store %@: %@", path_, why);
   }
   return false;
 }

@@ -63,6 +63,10 @@ class TallyLedger {
   // Looks for damage that reading would not notice, then drops the rows of days before `firstDay`.
   [[nodiscard]] virtual bool checkpoint(std::int32_t firstDay) = 0;
 
+  // Looks for damage, in every value too, and changes nothing. False, after an error line, when
+  // there is some or when it cannot be known; true where there is no database.
+  [[nodiscard]] virtual bool isSound() = 0;
+
   // A reader, or nullptr when there is no database. One that cannot be opened gives, after an error
   // line, a reader that has failed.
   virtual std::unique_ptr<TLHistory> openHistory() = 0;
