@@ -8,7 +8,6 @@ namespace {
 
 std::size_t Count(std::string_view text) {
   static FuzzFiles files;
-  static FuzzFiles files;
   static FakeSystemLog log;
   static const auto applications = MakeLinuxApplications(files.device().root(), log);
   files.set("/usr/share/applications/vendor/one.desktop", text);

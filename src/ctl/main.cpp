@@ -36,6 +36,7 @@ void AddCommands(CLI::App& app, Session& session) {
   AddChannelsCommands(app, session);
   AddStorageCommands(app, session);
   AddSendCommands(app, session);
+  AddCompletionCommand(app, session);
 }
 
 int ReportUsage(const CLI::App& app, std::string_view why) {

@@ -38,6 +38,7 @@ void AddChannelsCommands(CLI::App& app, Session& session);
 void AddTallyCommands(CLI::App& app, Session& session);
 void AddPrefsCommands(CLI::App& app, Session& session);
 void AddReportCommands(CLI::App& app, Session& session);
+void AddCompletionCommand(CLI::App& app, Session& session);
 void AddConsentCommands(CLI::App& app, Session& session);
 void AddLogsCommands(CLI::App& app, Session& session);
 void AddSendCommands(CLI::App& app, Session& session);

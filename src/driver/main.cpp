@@ -1,4 +1,6 @@
 // quorlet: closes the device's daily metrics record.
+#include <unistd.h>
+
 #include <csignal>
 #include <exception>
 #include <optional>
@@ -19,6 +21,20 @@ void RunListener(Platform& platform) {
   quorlet::Listener(platform, driver).serve();
 }
 
+// Scripts get nothing on standard output, whatever they ask for.
+void TellPerson(std::string_view argument) {
+  std::string_view line;
+  if (argument == "--help") {
+    line =
+        "quorlet -d (yesterday, once a day) | -f (yesterday) | -t (today so far): closes the day's "
+        "metrics record; see quorlet(8), quorletctl --help\n";
+  } else if (argument == "--version") {
+    line = "quorlet " QUORLET_VERSION "\n";
+  }
+  if (line.empty() || isatty(STDOUT_FILENO) == 0) return;
+  static_cast<void>(!write(STDOUT_FILENO, line.data(), line.size()));
+}
+
 // Only the first argument counts; the switches are exact.
 void RunArgument(Platform& platform, const char* argument) {
   const std::int32_t today = platform.counterStore.TLDaysSince1970();
@@ -32,6 +48,7 @@ void RunArgument(Platform& platform, const char* argument) {
     driver.runDailyTasks(today, std::nullopt);
   } else {
     platform.log.log("Unknown arg: %s", argument);
+    TellPerson(text);
   }
 }
 
