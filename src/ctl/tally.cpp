@@ -15,6 +15,7 @@
 #include "ctl/session.h"
 #include "ctl/tally_import.h"
 #include "ctl/tally_lines.h"
+#include "ctl/tally_listen.h"
 #include "ctl/whitelist.h"
 #include "platform/linux/descriptor.h"
 #include "platform/linux/paths.h"
@@ -337,6 +338,7 @@ void AddTallyCommands(CLI::App& app, Session& session) {
   AddRecordCommand(*tally, session);
   AddImportCommand(*tally, session);
   AddDumpCommand(*tally, session);
+  AddListenCommand(*tally, session);
 }
 
 }  // namespace quorlet

@@ -40,12 +40,24 @@ bool SetFlags(int descriptor) {
          fcntl(descriptor, F_SETFD, FD_CLOEXEC) == 0;
 }
 
+// How many descriptors were passed to this process. Asking uses them up.
+int TakePassedCount() {
+  const long count = EnvironmentNumber("LISTEN_FDS");
+  const bool forUs = EnvironmentNumber("LISTEN_PID") == getpid() && count > 0;
+  for (const char* name : {"LISTEN_PID", "LISTEN_FDS", "LISTEN_FDNAMES"}) unsetenv(name);
+  if (!forUs) return 0;
+  // None of them is for a process that we might start.
+  const int passed = static_cast<int>(std::min(count, kMostPassed));
+  for (int i = 0; i < passed; ++i) fcntl(kFirstPassedDescriptor + i, F_SETFD, FD_CLOEXEC);
+  return passed;
+}
+
 // Makes way for a new socket: removes a stale one. Returns why there is no way, or nothing.
-std::string ClearPath(const std::string& path, const UnixSocketAddress& address) {
+std::string ClearPath(const std::string& path, const UnixSocketAddress& address, int type) {
   struct stat status {};
   if (lstat(path.c_str(), &status) != 0) return errno == ENOENT ? "" : ErrnoText(errno);
   if (!S_ISSOCK(status.st_mode)) return "something else has its place";
-  const Descriptor probe(socket(AF_UNIX, SOCK_STREAM | SOCK_CLOEXEC | SOCK_NONBLOCK, 0));
+  const Descriptor probe(socket(AF_UNIX, type | SOCK_CLOEXEC | SOCK_NONBLOCK, 0));
   if (!probe.isOpen()) return ErrnoText(errno);
   const int error = address.connect(probe.get());
   // A full backlog (EAGAIN) is a live listener too.
@@ -64,14 +76,7 @@ ListeningSocket::~ListeningSocket() {
 }
 
 std::optional<std::variant<ListeningSocket, std::string>> ListeningSocket::Passed() {
-  const long count = EnvironmentNumber("LISTEN_FDS");
-  const bool forUs = EnvironmentNumber("LISTEN_PID") == getpid() && count > 0;
-  for (const char* name : {"LISTEN_PID", "LISTEN_FDS", "LISTEN_FDNAMES"}) unsetenv(name);
-  if (!forUs) return std::nullopt;
-  // None of them is for a process that we might start.
-  for (long i = 0; i < std::min(count, kMostPassed); ++i) {
-    fcntl(kFirstPassedDescriptor + static_cast<int>(i), F_SETFD, FD_CLOEXEC);
-  }
+  if (TakePassedCount() == 0) return std::nullopt;
   Descriptor first(kFirstPassedDescriptor);
   if (SocketOption(first.get(), SO_DOMAIN) != AF_UNIX ||
       SocketOption(first.get(), SO_TYPE) != SOCK_STREAM ||
@@ -79,6 +84,24 @@ std::optional<std::variant<ListeningSocket, std::string>> ListeningSocket::Passe
     return std::string("the descriptor passed is not a listening stream socket");
   }
   return ListeningSocket(std::move(first));
+}
+
+std::optional<std::variant<std::vector<ListeningSocket>, std::string>>
+ListeningSocket::PassedDatagrams() {
+  const int count = TakePassedCount();
+  if (count == 0) return std::nullopt;
+  std::vector<ListeningSocket> sockets;
+  for (int i = 0; i < count; ++i) {
+    ListeningSocket passed{Descriptor(kFirstPassedDescriptor + i)};
+    const int domain = SocketOption(passed.get(), SO_DOMAIN);
+    if ((domain != AF_UNIX && domain != AF_INET && domain != AF_INET6) ||
+        SocketOption(passed.get(), SO_TYPE) != SOCK_DGRAM || !SetFlags(passed.get())) {
+      return "the descriptor " + std::to_string(passed.get()) +
+             " that was passed is not a datagram socket";
+    }
+    sockets.push_back(std::move(passed));
+  }
+  return sockets;
 }
 
 namespace {
@@ -99,23 +122,24 @@ void GiveToOwnerOf(const std::string& directory, const std::string& path) {
 }  // namespace
 
 std::variant<ListeningSocket, std::string> ListeningSocket::Make(const std::string& directory,
-                                                                 const std::string& name) {
+                                                                 const std::string& name,
+                                                                 const SocketShape& shape) {
   // Held until the new socket listens: before that it looks stale to another starting process.
   const FileLock lock(directory + "/." + name + ".lock");
   if (lock.error() != 0) return ErrnoText(lock.error());
   const std::string path = directory + "/" + name;
   const UnixSocketAddress address(directory, name);
   if (address.error() != 0) return ErrnoText(address.error());
-  if (std::string reason = ClearPath(path, address); !reason.empty()) return reason;
+  if (std::string reason = ClearPath(path, address, shape.type); !reason.empty()) return reason;
 
-  Descriptor made = MakeUnixSocket();
+  Descriptor made(socket(AF_UNIX, shape.type | SOCK_CLOEXEC, 0));
   struct stat status {};
   // The mode is set before the socket has a name, so that nobody else ever finds it open.
-  if (!made.isOpen() || fchmod(made.get(), 0600) != 0) return ErrnoText(errno);
+  if (!made.isOpen() || fchmod(made.get(), shape.mode) != 0) return ErrnoText(errno);
   if (const int error = address.bind(made.get())) return ErrnoText(error);
   GiveToOwnerOf(directory, path);
-  if (chmod(path.c_str(), 0600) != 0 || lstat(path.c_str(), &status) != 0 ||
-      listen(made.get(), kBacklog) != 0 || !SetFlags(made.get())) {
+  if (chmod(path.c_str(), shape.mode) != 0 || lstat(path.c_str(), &status) != 0 ||
+      (shape.type == SOCK_STREAM && listen(made.get(), kBacklog) != 0) || !SetFlags(made.get())) {
     const int error = errno;
     unlink(path.c_str());
     return ErrnoText(error);

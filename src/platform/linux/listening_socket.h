@@ -2,12 +2,14 @@
 #ifndef QUORLET_PLATFORM_LINUX_LISTENING_SOCKET_H_
 #define QUORLET_PLATFORM_LINUX_LISTENING_SOCKET_H_
 
+#include <sys/socket.h>
 #include <sys/types.h>
 
 #include <optional>
 #include <string>
 #include <string_view>
 #include <variant>
+#include <vector>
 
 #include "platform/linux/descriptor.h"
 
@@ -16,8 +18,17 @@ namespace quorlet {
 // The reason that is no fault: whoever came first serves.
 inline constexpr std::string_view kAlreadyListening = "another process is listening";
 
-// A listening, non-blocking stream socket. One that this process made is removed from its directory
-// at the end, unless somebody has replaced it.
+// What kind of socket a service has.
+struct SocketShape {
+  int type;
+  mode_t mode;
+};
+inline constexpr SocketShape kStreamShape = {SOCK_STREAM, 0600};
+// For whoever is in its group to send to.
+inline constexpr SocketShape kDatagramShape = {SOCK_DGRAM, 0660};
+
+// A listening, or for datagrams a bound, non-blocking socket. One that this process made is removed
+// from its directory at the end, unless somebody has replaced it.
 class ListeningSocket {
  public:
   ListeningSocket(ListeningSocket&&) = default;
@@ -28,9 +39,13 @@ class ListeningSocket {
   // none to this process, a reason when what it passed cannot be used. Asking uses it up.
   static std::optional<std::variant<ListeningSocket, std::string>> Passed();
 
+  // The same for every datagram socket passed, Unix or UDP.
+  static std::optional<std::variant<std::vector<ListeningSocket>, std::string>> PassedDatagrams();
+
   // A socket `name` in `directory` (which is created), or the reason why there is none.
   static std::variant<ListeningSocket, std::string> Make(const std::string& directory,
-                                                         const std::string& name);
+                                                         const std::string& name,
+                                                         const SocketShape& shape = kStreamShape);
 
   int get() const { return descriptor_.get(); }
 

@@ -16,6 +16,7 @@
 
 #include <algorithm>
 #include <cerrno>
+#include <limits>
 #include <memory>
 #include <utility>
 #include <vector>
@@ -388,6 +389,34 @@ int TallyDatabase::addBlock(std::int64_t block, std::uint64_t& before,
   before += added.size();
   samples = samples.subspan(added.size());
   return SqliteRun(database_, putBlock_, block, std::string_view(scratch_)).finish();
+}
+
+int TallyDatabase::keysOfDay(
+    std::int32_t day,
+    const std::function<bool(std::string_view, std::optional<std::uint64_t>)>& handler) {
+  SqliteStatement scalars("SELECT key FROM scalars WHERE day = ?1");
+  SqliteStatement sequences(
+      "SELECT key, (SELECT substr(samples, 1, 12) FROM blocks WHERE blocks.id BETWEEN"
+      " sequences.id * 1048576 AND sequences.id * 1048576 + 1048575 ORDER BY blocks.id DESC LIMIT "
+      "1)"
+      " FROM sequences WHERE day = ?1");
+  static_assert(kBlocksPerSequence == 1048576 && kBlockHeaderSize == 12);
+  int code = SQLITE_OK;
+  {
+    SqliteRun run(database_, scalars, std::int64_t{day});
+    while ((code = run.next()) == SQLITE_ROW) {
+      if (!handler(run.bytes(0), std::nullopt)) return SQLITE_OK;
+    }
+    if (code != SQLITE_DONE) return code;
+  }
+  SqliteRun run(database_, sequences, std::int64_t{day});
+  while ((code = run.next()) == SQLITE_ROW) {
+    const auto last = ReadBlockHeader(run.bytes(1), std::numeric_limits<std::uint32_t>::max());
+    std::uint64_t count = 0;
+    if (!last || __builtin_add_overflow(last->before, last->count, &count)) return SQLITE_CORRUPT;
+    if (!handler(run.bytes(0), count)) return SQLITE_OK;
+  }
+  return code == SQLITE_DONE ? SQLITE_OK : code;
 }
 
 int TallyDatabase::hasDaysBefore(std::int32_t firstDay, bool& has) {

@@ -7,6 +7,7 @@
 
 #include <array>
 #include <cstdint>
+#include <functional>
 #include <optional>
 #include <span>
 #include <string>
@@ -85,6 +86,11 @@ class TallyDatabase {
 
   // The note of that name, or nothing; inside or outside of a transaction.
   [[nodiscard]] int readNote(std::string_view name, std::optional<std::string>& value);
+  // The keys of a day, scalars' first, each with the number of its values (nothing for a scalar),
+  // until `handler` answers false.
+  [[nodiscard]] int keysOfDay(
+      std::int32_t day,
+      const std::function<bool(std::string_view, std::optional<std::uint64_t>)>& handler);
   // Outside of a transaction: whether dropDaysBefore has anything to drop.
   [[nodiscard]] int hasDaysBefore(std::int32_t firstDay, bool& has);
   // Looks for damage: of the file's structure and of what ties its tables together; with `values`,

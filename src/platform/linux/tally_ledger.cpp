@@ -59,6 +59,7 @@ class LinuxTallyLedger final : public TallyLedger {
   bool setNote(std::string_view name, const std::optional<std::string>& value) override {
     return write(name, [&] { return writer_.setNote(name, value); });
   }
+  bool keysOfDay(std::int32_t day, const DayKeyHandler& handler) override;
   bool dropCounters() override {
     return write({}, [&] { return writer_.dropCounters(); });
   }
@@ -224,6 +225,18 @@ bool LinuxTallyLedger::readNote(std::string_view name, std::optional<std::string
   }
   value.reset();
   return false;
+}
+
+bool LinuxTallyLedger::keysOfDay(std::int32_t day, const DayKeyHandler& handler) {
+  const std::lock_guard lock(mutex_);
+  FileIdentity file;
+  if (!findPath()) return false;
+  if (FindIdentity(path_, file) == ENOENT) return true;
+  TallyDatabase reader;
+  int code = reader.openForReading(path_, access_ == Access::kReadOnly, patience_);
+  if (code == SQLITE_OK && !reader.isBlank()) code = reader.keysOfDay(day, handler);
+  if (code != SQLITE_OK) handleReadFailure(reader, code);
+  return code == SQLITE_OK;
 }
 
 bool LinuxTallyLedger::checkpoint(std::int32_t firstDay) {

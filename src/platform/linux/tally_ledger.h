@@ -20,6 +20,10 @@
 
 namespace quorlet {
 
+// Given a key of a day, and how many values it has; nothing for a scalar's. False: no more keys.
+using DayKeyHandler =
+    std::function<bool(std::string_view key, std::optional<std::uint64_t> values)>;
+
 // Opens the database lazily, on first use, and makes it when it is missing. A database that is
 // damaged, on a second look too, is moved aside and a new one started (with one error line, and the
 // preference that counts corruptions goes up); with read-only access nothing changes and a damaged
@@ -59,6 +63,10 @@ class TallyLedger {
   [[nodiscard]] virtual bool readNote(std::string_view name, std::optional<std::string>& value) = 0;
   // Drops every scalar and distribution; the notes stay.
   [[nodiscard]] virtual bool dropCounters() = 0;
+
+  // Names the keys of a day until `handler` answers false. False, after an error line, when they
+  // cannot be read.
+  [[nodiscard]] virtual bool keysOfDay(std::int32_t day, const DayKeyHandler& handler) = 0;
 
   // Looks for damage that reading would not notice, then drops the rows of days before `firstDay`.
   [[nodiscard]] virtual bool checkpoint(std::int32_t firstDay) = 0;

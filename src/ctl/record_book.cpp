@@ -1,0 +1,212 @@
+#include "ctl/record_book.h"
+
+#include <algorithm>
+#include <cmath>
+#include <limits>
+#include <utility>
+
+#include "ctl/options.h"
+
+namespace quorlet {
+namespace {
+
+constexpr uid_t kRootUser = 0;
+// More keys of a day than a listener remembers are only counted.
+constexpr std::size_t kMostRemembered = 20'000;
+constexpr double kBeyond64Bits = 9223372036854775808.0;
+
+template <typename Wide>
+std::int64_t Saturated(Wide value) {
+  constexpr Wide kLowest = std::numeric_limits<std::int64_t>::min();
+  constexpr Wide kHighest = std::numeric_limits<std::int64_t>::max();
+  return static_cast<std::int64_t>(std::clamp(value, kLowest, kHighest));
+}
+
+bool IsReserved(std::string_view key) {
+  return key.starts_with("nuvex.") || key.starts_with("datausage.");
+}
+
+}  // namespace
+
+void RecordBook::Sum::add(const StatsdNumber& number, double rate) {
+  if (number.whole && rate == 1) {
+    whole += *number.whole;
+  } else {
+    const double real = std::clamp(number.real / rate, -kBeyond64Bits, kBeyond64Bits);
+    const double part = std::trunc(real);
+    whole += static_cast<Wide>(part);
+    fraction += real - part;
+  }
+  if (fraction == 0) return;
+  // Carries, then gives both parts one sign, which is what rounding goes by.
+  const double carried = std::trunc(fraction);
+  whole += static_cast<Wide>(carried);
+  fraction -= carried;
+  if (whole > 0 && fraction < 0) {
+    --whole;
+    fraction += 1;
+  } else if (whole < 0 && fraction > 0) {
+    ++whole;
+    fraction -= 1;
+  }
+}
+
+// Half away from zero.
+RecordBook::Wide RecordBook::Sum::rounded() const {
+  if (fraction >= 0.5) return whole + 1;
+  return fraction <= -0.5 ? whole - 1 : whole;
+}
+
+bool RecordBook::enterDay(std::int32_t day, TallyLedger& ledger) {
+  if (day_ == day) return true;
+  if (day_) closeDay();
+  day_ = day;
+  forgetOldKeys();
+  keysOfDay_ = 0;
+  const bool isRead =
+      ledger.keysOfDay(day, [this](std::string_view key, std::optional<std::uint64_t> values) {
+        const bool isExact = whitelist_.match(key) == RecordWhitelist::Match::kNamedExactly;
+        if (!isExact) ++keysOfDay_;
+        const bool isKept = isExact || entries_.size() < kMostRemembered;
+        if (key.size() <= kLongestRecordedKey && isKept) {
+          Entry& entry = entries_[std::string(key)];
+          // A key of both kinds was counted with its scalar.
+          if (entry.isKnown && !isExact) --keysOfDay_;
+          entry.isKnown = true;
+          entry.isNamedExactly = isExact;
+          if (values) entry.valuesOfDay = *values;
+        }
+        return true;
+      });
+  readOwners(ledger);
+  return isRead;
+}
+
+// Its fractions stay with the keys.
+void RecordBook::forgetOldKeys() {
+  const bool isCrowded = entries_.size() > kMostRemembered;
+  std::erase_if(entries_, [isCrowded](const auto& item) {
+    const Entry& entry = item.second;
+    return entry.sum.fraction == 0 || (isCrowded && !entry.wasUsed);
+  });
+  for (auto& [key, entry] : entries_) {
+    entry.isKnown = false;
+    entry.wasUsed = false;
+    entry.valuesOfDay = 0;
+  }
+}
+
+std::optional<Refusal> RecordBook::admit(std::string_view key, Sender sender,
+                                         Entries::iterator& found) {
+  const bool isTrusted = sender == kRootUser || sender == self_;
+  const RecordWhitelist::Match match = whitelist_.match(key);
+  if (match == RecordWhitelist::Match::kNone) return Refusal::kNotInWhitelist;
+  const bool isExact = match == RecordWhitelist::Match::kNamedExactly;
+  if (!isExact) {
+    if (keysOfDay_ >= limits_.keys) return Refusal::kTooManyKeys;
+    if (!isTrusted) {
+      std::size_t& owned = owners_[sender];
+      if (owned >= limits_.keysOfUser) return Refusal::kTooManyKeysOfUser;
+      ++owned;
+      ownersChanged_ = true;
+    }
+    ++keysOfDay_;
+  }
+  if (found == entries_.end()) found = entries_.emplace(std::string(key), Entry()).first;
+  found->second.isKnown = true;
+  found->second.isNamedExactly = isExact;
+  return std::nullopt;
+}
+
+std::optional<Refusal> RecordBook::add(const StatsdLine& line, Sender sender, std::int32_t second) {
+  if (IsReserved(line.key) && sender != kRootUser && sender != self_) return Refusal::kReserved;
+  auto found = entries_.find(line.key);
+  if (found == entries_.end() || !found->second.isKnown) {
+    if (const auto refusal = admit(line.key, sender, found)) return refusal;
+  } else if (!found->second.wasUsed && !found->second.isNamedExactly &&
+             whitelist_.match(line.key) == RecordWhitelist::Match::kNone) {
+    // Others may have put it into the store.
+    return Refusal::kNotInWhitelist;
+  }
+  Entry& entry = found->second;
+  if (line.kind == StatsdKind::kValues &&
+      entry.valuesOfDay + line.numbers.size() > limits_.values) {
+    return Refusal::kTooManyValues;
+  }
+  entry.wasUsed = true;
+  if (!entry.isListed) changed_.push_back(&*found);
+  entry.isListed = true;
+  if (line.kind == StatsdKind::kValues) {
+    for (const StatsdNumber& number : line.numbers) entry.values.push_back(number.real);
+    if (entry.runs.empty() || entry.runs.back().second != second) entry.runs.push_back({second, 0});
+    entry.runs.back().count += line.numbers.size();
+    entry.valuesOfDay += line.numbers.size();
+    waitingValues_ += line.numbers.size();
+    return std::nullopt;
+  }
+  entry.hasScalar = true;
+  for (const StatsdNumber& number : line.numbers) {
+    if (line.kind == StatsdKind::kGauge && !number.isSigned) {
+      entry.sum = {};
+      entry.written = 0;
+      entry.isSet = true;
+    }
+    entry.sum.add(number, line.kind == StatsdKind::kCounter ? line.rate : 1);
+  }
+  return std::nullopt;
+}
+
+// Moves what is to be written of the day over to what is ready.
+void RecordBook::closeDay() {
+  for (Entries::value_type* item : changed_) {
+    auto& [key, entry] = *item;
+    if (entry.hasScalar) {
+      const Wide rounded = entry.sum.rounded();
+      const auto kind = entry.isSet ? ScalarChange::Kind::kSet : ScalarChange::Kind::kAdd;
+      closed_.scalars.push_back({kind, key, Saturated(rounded - entry.written), *day_});
+      entry.written = rounded;
+    }
+    if (!entry.values.empty()) {
+      closed_.values.push_back({key, *day_, std::exchange(entry.values, {}), {}});
+      closed_.values.back().runs = std::exchange(entry.runs, {});
+    }
+    entry.isSet = entry.hasScalar = entry.isListed = false;
+  }
+  changed_.clear();
+  if (ownersChanged_) closed_.keyOwners = ownersNote();
+  ownersChanged_ = false;
+}
+
+RecordBatch RecordBook::take() {
+  closeDay();
+  waitingValues_ = 0;
+  return std::exchange(closed_, {});
+}
+
+// "DAY", then "UID COUNT" in each line; "-" is the user that the kernel does not tell.
+std::string RecordBook::ownersNote() const {
+  std::string note = std::to_string(*day_);
+  for (const auto& [owner, count] : owners_) {
+    note += "\n" + (owner ? std::to_string(*owner) : "-") + " " + std::to_string(count);
+  }
+  return note;
+}
+
+void RecordBook::readOwners(TallyLedger& ledger) {
+  owners_.clear();
+  std::optional<std::string> note;
+  if (!ledger.readNote(kKeyOwnersNote, note) || !note) return;
+  std::string_view rest = *note;
+  for (bool isFirst = true; const auto line = NextStatsdLine(rest); isFirst = false) {
+    if (isFirst) {
+      if (ParseNumber<std::int32_t>(*line) != day_) return;
+      continue;
+    }
+    const std::size_t blank = std::min(line->find(' '), line->size());
+    const auto count = ParseNumber<std::size_t>(line->substr(std::min(blank + 1, line->size())));
+    const auto owner = ParseNumber<uid_t>(line->substr(0, blank));
+    if (count && owners_.size() < limits_.keys) owners_[owner] = *count;
+  }
+}
+
+}  // namespace quorlet

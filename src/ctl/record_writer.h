@@ -1,0 +1,54 @@
+// Writes what the recording socket took in, while more is taken in.
+#ifndef QUORLET_CTL_RECORD_WRITER_H_
+#define QUORLET_CTL_RECORD_WRITER_H_
+
+#include <condition_variable>
+#include <mutex>
+#include <optional>
+#include <thread>
+
+#include "ctl/record_book.h"
+#include "platform/linux/descriptor.h"
+#include "platform/linux/tally_ledger.h"
+
+namespace quorlet {
+
+// A thread of its own that writes one batch at a time, each in one transaction, and tries again
+// until it is written or the end has come.
+class RecordWriter {
+ public:
+  // An operation of the ledger, which outlives the writer, must have returned on this thread.
+  explicit RecordWriter(TallyLedger& ledger);
+  RecordWriter(const RecordWriter&) = delete;
+  RecordWriter& operator=(const RecordWriter&) = delete;
+  ~RecordWriter();
+
+  // Whether a batch is being written.
+  bool isBusy();
+  // Takes over a batch; only while it is not busy.
+  void write(RecordBatch batch);
+  // Becomes readable when a batch was written.
+  int doneEvent() const { return done_.get(); }
+  void clearDoneEvent();
+  // Waits until the last batch is written, trying some times more. False when it is lost.
+  [[nodiscard]] bool finish();
+
+ private:
+  void run();
+
+  TallyLedger& ledger_;
+  Descriptor done_;
+  std::mutex mutex_;
+  std::condition_variable changed_;
+  std::optional<RecordBatch> batch_;
+  bool isEnding_ = false;
+  bool isLost_ = false;
+  std::thread thread_;  // last: it uses the others
+};
+
+// All of the batch in one transaction.
+[[nodiscard]] bool WriteRecordBatch(const RecordBatch& batch, TallyLedger& ledger);
+
+}  // namespace quorlet
+
+#endif  // QUORLET_CTL_RECORD_WRITER_H_
