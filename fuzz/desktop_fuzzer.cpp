@@ -1,4 +1,5 @@
 // Any desktop file is one application or none, whatever its line ends and comments.
+#include "fakes/fake_system_log.h"
 #include "fuzz_support.h"
 #include "platform/linux/services.h"
 
@@ -7,7 +8,9 @@ namespace {
 
 std::size_t Count(std::string_view text) {
   static FuzzFiles files;
-  static const auto applications = MakeLinuxApplications(files.device().root());
+  static FuzzFiles files;
+  static FakeSystemLog log;
+  static const auto applications = MakeLinuxApplications(files.device().root(), log);
   files.set("/usr/share/applications/vendor/one.desktop", text);
   std::size_t count = 0;
   applications->EnumerateApplicationBundles([&count](ApplicationBundleType type) {

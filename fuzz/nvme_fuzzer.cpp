@@ -4,20 +4,19 @@
 #include <limits>
 
 #include "fuzz_support.h"
-#include "platform/linux/nvme_statistics.h"
+#include "platform/linux/drives/drive_figures.h"
+#include "platform/linux/drives/drive_statistics.h"
+#include "platform/linux/drives/nvme_pages.h"
 #include "storage/statistics_parser.h"
 #include "values/byte_reader.h"
 
 namespace quorlet {
 namespace {
 
-void CheckExport(const NvmeFacts& facts) {
-  const auto bytes = EncodeNvmeStatistics(facts);
-  Expect(bytes.has_value() == (facts.healthPage.size() == kNvmeHealthPageBytes),
-         "a page of another length");
-  if (!bytes) return;
+void CheckExport(const DriveFacts& facts) {
+  const Data bytes = EncodeDriveStatistics(facts);
   std::size_t records = 0;
-  for (ByteReader reader(*bytes); reader.remaining() != 0; ++records) {
+  for (ByteReader reader(bytes); reader.remaining() != 0; ++records) {
     const auto word = reader.little<std::uint64_t>();
     const auto value = reader.little<std::uint64_t>();
     Expect(word >> 32 == 1, "not one value");
@@ -27,9 +26,20 @@ void CheckExport(const NvmeFacts& facts) {
     Expect(reader.ok(), "half a record");
   }
   FSPParseContext context;
-  Expect(FSPParseBufferToCxt(context, *bytes), "the export is refused");
+  Expect(FSPParseBufferToCxt(context, bytes), "the export is refused");
   Expect(context.exportVersion != 0 && context.pairs.size() <= records, "the export is read wrong");
   FSPReleaseContext(context);
+}
+
+// The figures are the export's, in other units.
+void CheckFigures(std::span<const std::byte> page) {
+  DriveFigures figures;
+  AddNvmeHealth(page, figures);
+  Expect(figures.empty() == (page.size() != kNvmePageBytes), "a page of another length");
+  for (const DriveFigureInfo& info : kDriveFigures) {
+    Expect(figures[info.figure].value_or(0) >= 0, "a figure that is negative", info.name);
+  }
+  Expect(figures[DriveFigure::kUsed].value_or(0) <= 255, "more than a byte is used");
 }
 
 }  // namespace
@@ -41,19 +51,20 @@ extern "C" int LLVMFuzzerTestOneInput(const std::uint8_t* data, std::size_t size
   const std::string_view input = AsText(data, size);
   ByteReader reader(std::as_bytes(std::span(data, size)));
   const auto used = reader.little<std::uint64_t>();
-  NvmeFacts facts;
-  facts.healthPage = reader.take(std::min(reader.remaining(), kNvmeHealthPageBytes));
+  DriveFacts facts;
+  facts.healthPage = reader.take(std::min(reader.remaining(), kNvmePageBytes));
   CheckExport(facts);
+  CheckFigures(facts.healthPage);
   if (!reader.ok()) return 0;
   if (used != 0) facts.usedBytes = used;
 
-  NvmeBlockCounters counters;
+  BlockCounters counters;
   bool isWhole = true;
   std::string_view lines = input.substr(reader.position());
   while (!lines.empty()) {
     const std::string_view line = lines.substr(0, lines.find('\n'));
     lines.remove_prefix(std::min(lines.size(), line.size() + 1));
-    const NvmeBlockCounters before = counters;
+    const BlockCounters before = counters;
     const bool isTaken = AddBlockCounters(line, counters);
     Expect(isTaken || (counters.discards == before.discards && counters.flushes == before.flushes),
            "a refused line counts", line);

@@ -1,4 +1,4 @@
-"""Kills the installed programs at their system calls, fails those calls, and checks the promises."""
+"""Kills the installed programs at their system calls, fails these, and checks the promises."""
 from __future__ import annotations
 
 import argparse
@@ -8,6 +8,7 @@ import os
 import pathlib
 import random
 import shutil
+import signal
 import subprocess
 import sys
 import tempfile
@@ -38,7 +39,7 @@ checks it again; --trees DIR keeps the tree as the hit command leaves it.
 Exit status: 0 nothing is broken, 1 something is (--prove: not noticed), 77 this cannot run here.
 """
 USAGE_FILE = story.USAGE
-SHORT = 420  # points
+SHORT = 800  # points
 PROVEN = 12  # points of each scene with each lie
 LIES = ("rename", "unlink")
 
@@ -120,9 +121,8 @@ def list_points(theatre: Theatre, name: str, options: argparse.Namespace,
     hits = [calls.Hit(call) for call in found if call.writes]
     errors = itertools.cycle(draw.sample(calls.ERRORS, len(calls.ERRORS)))
     for call in found:
-        if call.writes or scene.fails_reads:
-            chosen = calls.ERRORS if options.all_errors or options.point else [next(errors)]
-            hits += [calls.Hit(call, error) for error in chosen]
+        chosen = calls.ERRORS if options.all_errors or options.point else [next(errors)]
+        hits += [calls.Hit(call, error) for error in chosen]
     return [(name, hit) for hit in hits]
 
 
@@ -154,19 +154,29 @@ def repeat_command(name: str, hit: calls.Hit, options: argparse.Namespace) -> st
     return f"scripts/kill-points{programs} --point {name}:{hit}"
 
 
+def print_broken(name: str, hit: calls.Hit, broken: list[str],
+                 options: argparse.Namespace) -> None:
+    again = repeat_command(name, hit, options)
+    if options.point:
+        print("\n".join([f"broken: {name}:{hit} ({hit.about()})", *(f"  {one}" for one in broken)]))
+        return
+    print(f"broken: {name}:{hit} ({hit.about()}): {'; '.join(broken)} [{again}]", flush=True)
+
+
 def check(theatre: Theatre, points: list[tuple[str, calls.Hit]], options: argparse.Namespace,
           lie: str | None = None) -> int:
     """Prints each broken point, unless a lie is to break them; how many there are."""
     started, count, missed = time.monotonic(), 0, 0
-    with concurrent.futures.ThreadPoolExecutor(options.jobs) as pool:
+    pool = concurrent.futures.ThreadPoolExecutor(options.jobs)
+    try:
         results = pool.map(lambda point: check_point(theatre, *point, lie, options.trees), points)
         for (name, hit), (was_hit, broken) in zip(points, results):
             missed += not was_hit
             count += bool(broken)
             if broken and not lie:
-                separator = "\n  " if options.point else "; "
-                print(f"broken: {name}:{hit} ({hit.about()}): {separator.join(['', *broken])[2:]}"
-                      f" [{repeat_command(name, hit, options)}]", flush=True)
+                print_broken(name, hit, broken, options)
+    finally:
+        pool.shutdown(cancel_futures=True)
     kills = sum(hit.error is None for _, hit in points)
     with_lie = f", {lie} only saying that it was done" if lie else ""
     print(f"{count} of {len(points)} points broken{with_lie}; {kills} kills, "
@@ -192,6 +202,7 @@ def prove(theatre: Theatre, points: list[tuple[str, calls.Hit]], options: argpar
 
 def main() -> int:
     options = parse_options()
+    signal.signal(signal.SIGTERM, lambda *_: sys.exit(1))  # the trees go then too
     programs = find_programs(options.bin or HERE.parents[1] / "build/release/src")
     draw = random.Random(options.seed)
     memory = "/dev/shm" if os.access("/dev/shm", os.W_OK) else None

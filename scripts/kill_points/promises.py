@@ -63,7 +63,8 @@ class Judgement:
         try:
             check()
         except (Broken, OSError, ValueError, KeyError) as why:
-            self.broken.append(f"{why}" if isinstance(why, Broken) else f"{check.__name__}: {why!r}")
+            what = str(why) if isinstance(why, Broken) else f"{check.__name__}: {why!r}"
+            self.broken.append(what)
             return False
         return True
 
@@ -200,7 +201,8 @@ class Judgement:
         odd = {key: value for key, value in found.items() if stored.get(key) != value}
         require(not odd, f"the log has {odd}, the store {stored}")
         missing = sorted(set(stored) - set(found))
-        require(not missing or self.is_excused, f"the log lacks {missing}, and no error line says so")
+        require(not missing or self.is_excused,
+                f"the log lacks {missing}, and no error line says so")
 
     def check_told_once(self) -> None:
         """The OS version before, the corruptions and app info stand in a log."""
@@ -229,12 +231,14 @@ class Judgement:
         verdict.check_structured(self.root, scenes.EVENTS, doubled)
 
     def check_rest(self) -> None:
-        """No support log is lost, and nothing unfinished stays that the next command does not use."""
+        """No support log is lost, and what is left unfinished is used by the next writer."""
         log = self.root / scenes.SUPPORT_LOG
-        kept = sum(path.read_text() == scenes.SUPPORT_TEXT for path in log.parent.glob(log.name + "*"))
+        copies = [path.read_text() for path in log.parent.glob(log.name + "*")]
+        kept = copies.count(scenes.SUPPORT_TEXT)
         require(kept == 1, f"a support log is there {kept} times")
+        known = re.compile(r"\.([A-Za-z.-]+\.)?(lock|tmp)")  # no number: no new name each time
         litter = [path.name for path in self.root.rglob(".*")
-                  if path.is_file() and not re.fullmatch(r"\.([A-Za-z.-]+\.)?(lock|tmp)", path.name)]
+                  if path.is_file() and not known.fullmatch(path.name)]
         require(not litter, f"unfinished files stay: {litter}")
 
 

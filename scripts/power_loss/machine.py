@@ -45,7 +45,8 @@ def _module_files(kernel: pathlib.Path) -> dict[str, pathlib.Path]:
             for path in kernel.glob("lib/modules/*/kernel/**/*.ko*")}
 
 
-def _load_order(kernel: pathlib.Path) -> dict[str, bytes]:
+def _load_order(kernel: pathlib.Path, modules: tuple[str, ...],
+                needed_files: tuple[str, ...]) -> dict[str, bytes]:
     """The modules, decompressed, each after those that it depends on."""
     files = _module_files(kernel)
     order: dict[str, bytes] = {}
@@ -62,9 +63,9 @@ def _load_order(kernel: pathlib.Path) -> dict[str, bytes]:
             add(dependency)
         order[name] = code
 
-    for module in MODULES:
+    for module in modules:
         add(module)
-    for module in ("dm-log-writes", "ext4"):
+    for module in needed_files:
         if module not in order:
             raise CannotRun(f"the kernel package has no module {module}")
     return order
@@ -74,7 +75,9 @@ class Machine:
     """Boots the unpacked kernel with the programs under test."""
 
     def __init__(self, kernel: pathlib.Path, programs: list[pathlib.Path], work: pathlib.Path,
-                 emulate: bool = False):
+                 emulate: bool = False, init: pathlib.Path = HERE / "guest_init",
+                 modules: tuple[str, ...] = MODULES,
+                 needed_files: tuple[str, ...] = ("dm-log-writes", "ext4")):
         self.work = work
         self.console = work / "console"  # what the last run printed
         self.boot_seconds: list[float] = []
@@ -83,7 +86,8 @@ class Machine:
             raise CannotRun("no kernel: run scripts/install-deps --power-loss")
         self._image = images[-1]
         self._stage = work / "initramfs"
-        self._lay_out(kernel, programs)
+        self._lay_out(programs, init)
+        self._add_modules(_load_order(kernel, modules, needed_files))
         kvm = not emulate and os.access("/dev/kvm", os.R_OK | os.W_OK)
         self._accelerators = ["kvm", "tcg"] if kvm else ["tcg"]
 
@@ -92,11 +96,11 @@ class Machine:
         path.parent.mkdir(parents=True, exist_ok=True)
         shutil.copy(source, path)
 
-    def _lay_out(self, kernel: pathlib.Path, programs: list[pathlib.Path]) -> None:
+    def _lay_out(self, programs: list[pathlib.Path], init: pathlib.Path) -> None:
         for directory in ("proc", "sys", "dev", "tmp", "mnt", "sbin", "bin", "modules", "run"):
             (self._stage / directory).mkdir(parents=True, exist_ok=True)
         self._copy("/bin/busybox", "/bin/busybox")
-        self._copy(HERE / "guest_init", "/init")
+        self._copy(init, "/init")
         (self._stage / "init").chmod(0o755)
         dmsetup = pathlib.Path(shutil.which("dmsetup") or "/usr/sbin/dmsetup")
         self._copy(dmsetup, "/usr/sbin/dmsetup")
@@ -105,7 +109,8 @@ class Machine:
         for program in (dmsetup, *programs):
             for library in _libraries(program):
                 self._copy(library, library)
-        modules = _load_order(kernel)
+
+    def _add_modules(self, modules: dict[str, bytes]) -> None:
         for name, code in modules.items():
             (self._stage / "modules" / name).write_bytes(code)
         (self._stage / "modules/order").write_text("".join(f"{name}\n" for name in modules))
@@ -123,14 +128,15 @@ class Machine:
                                input=listed.stdout, stdout=out, check=True)
         return initrd
 
-    def run(self, disks: list[pathlib.Path], words: dict[str, str | int],
-            seconds: int) -> list[str]:
+    def run(self, disks: list[pathlib.Path], words: dict[str, str | int], seconds: int,
+            devices: tuple[str, ...] = ()) -> list[str]:
         """Boots, waits until the machine turns itself off, and returns what its init said."""
         initrd = self._pack()
         line = "console=ttyS0 quiet panic=-1 " + " ".join(f"{k}={v}" for k, v in words.items())
         command = ["qemu-system-x86_64", "-nographic", "-no-reboot", "-nodefaults",
                    "-serial", "stdio", "-m", "768", "-cpu", "max", "-kernel", str(self._image),
                    "-initrd", str(initrd), "-append", line]
+        command += devices
         for disk in disks:
             command += ["-drive", f"file={disk},if=none,id={disk.name},format=raw,cache=unsafe",
                         "-device", f"virtio-blk-pci,drive={disk.name}"]

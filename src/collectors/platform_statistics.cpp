@@ -9,6 +9,7 @@
 #include "collectors/reporting_channels.h"
 #include "platform/run_step.h"
 #include "storage/daily_push.h"
+#include "storage/flash_record.h"
 
 namespace quorlet {
 namespace {
@@ -41,6 +42,7 @@ void collectPlatformStatistics(Platform& platform, const PassProgress& progress)
   if (logsStorage) static_cast<void>(support.stageEntries());
   RunStep(log, "disk usage", [&] { CollectDiskUsage(platform.deviceInfo, counters); });
   RunStep(log, "storage", [&] { PushNANDInfoScalars(platform, counters, logsStorage); });
+  RunStep(log, "wear of drives", [&] { RecordFlash(platform, counters); });
   // Before the network's answer, which may be waited for into the next day.
   RunStep(log, "storage counters", [&] {
     if (logsStorage && progress.storageLoggedNote) counters.add(progress.storageLoggedNote());

@@ -1,15 +1,13 @@
 // quorletctl storage: what the flash-storage controller tells.
-#include <unistd.h>
-
 #include <CLI/CLI.hpp>
 #include <algorithm>
-#include <cerrno>
 #include <memory>
 #include <variant>
 
 #include "ctl/json_value.h"
 #include "ctl/options.h"
 #include "ctl/session.h"
+#include "ctl/storage_health.h"
 #include "storage/exporters.h"
 #include "storage/nand_info.h"
 #include "storage/snapshot.h"
@@ -52,12 +50,6 @@ struct StorageServices {
   Platform platform;
 };
 
-std::string FirstLineOf(const std::string& path) {
-  const auto bytes = ReadWholeFile(path, 4096);
-  const auto* text = std::get_if<std::string>(&bytes);
-  return text != nullptr ? text->substr(0, text->find('\n')) : std::string();
-}
-
 // Why a command got no answer, in words for people: what is below speaks to its own developers.
 std::string WhyNoAnswer(StorageServices& services) {
   DriverRegistry& registry = services.platform.driverRegistry;
@@ -67,24 +59,12 @@ std::string WhyNoAnswer(StorageServices& services) {
   std::string name;
   if (registry.GetEntryName(service, name) != kKernelSuccess) name.clear();
   registry.ReleaseHandle(service);
-  const std::string drive = "the storage drive " + name;
-  // A drive of the machine's own has a controller of that name; others are described in files.
-  const Root& root = services.linux->root();
-  const std::string controller = root.kernelPath("/sys/class/nvme/" + name);
-  if (!IsSafeName(name) || ::access(controller.c_str(), F_OK) != 0) {
-    return drive + " does not answer";
+  // A drive of the machine's own has that name; others are described in files.
+  for (const Drive& drive : services.platform.drives.read()) {
+    const std::string trouble = drive.name == name ? DriveTrouble(drive) : "";
+    if (!trouble.empty()) return trouble;
   }
-  const std::string power = FirstLineOf(controller + "/device/power/runtime_status");
-  if (power == "suspended" || power == "suspending") return drive + " is asleep";
-  const std::string device = root.path("/dev/" + name);
-  if (::access(device.c_str(), R_OK) != 0) {
-    const int error = errno;
-    return "cannot ask " + drive + ": " + device + ": " + ErrnoText(error) +
-           (error == EACCES ? " (this needs root)" : "");
-  }
-  // The kernel takes such commands from its administrator only, whatever the file's mode.
-  if (::geteuid() != 0) return "cannot ask " + drive + ": this needs root";
-  return drive + " does not answer";
+  return "the storage drive " + name + " does not answer";
 }
 
 void PrintDictionary(Session& session, const Dictionary& dictionary, bool json) {
@@ -243,6 +223,12 @@ void AddStorageCommands(CLI::App& app, Session& session) {
     });
     return command;
   };
+  add("health", "Print how worn every drive is, and how long it will last",
+      "Days left come from the days that passes have recorded; what a drive does\n"
+      "not tell, or what cannot be told from so few days, is \"unknown\".",
+      "quorletctl storage health", [](Session& running, const StorageArguments& given) {
+        PrintStorageHealth(running, given.json);
+      });
   add("info", "Print the NAND dictionary", "One key and its value a line.",
       "quorletctl storage info --json", PrintInfo);
   CLI::App* snapshot = add("snapshot", "Print the controller's snapshot as text",

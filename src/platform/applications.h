@@ -12,8 +12,9 @@ class Applications {
  public:
   virtual ~Applications() = default;
 
-  // Visits every installed application bundle once.
-  virtual void EnumerateApplicationBundles(
+  // Visits every installed application bundle once. False, after an error line, when not all of
+  // them could be looked for.
+  virtual bool EnumerateApplicationBundles(
       const std::function<void(ApplicationBundleType)>& visit) = 0;
 };
 

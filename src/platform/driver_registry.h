@@ -28,6 +28,10 @@ inline constexpr KernelReturn kKernelNotFound = 0xE00002F0;
 
 using RegistryHandle = std::uint32_t;
 
+// A boolean property of a storage driver's entry: a figure that its statistics export lacks is not
+// known, rather than 0.
+inline constexpr std::string_view kTellsOnlyWhatItHas = "QuorletTellsOnlyWhatItHas";
+
 // Keys of a match dictionary; an entry must satisfy all that are there.
 inline constexpr std::string_view kMatchClassName = "ClassName";  // string: the entry's class
 inline constexpr std::string_view kMatchProperties =

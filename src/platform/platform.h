@@ -9,6 +9,7 @@
 #include "platform/device_info.h"
 #include "platform/diagnostics.h"
 #include "platform/driver_registry.h"
+#include "platform/drives.h"
 #include "platform/environment.h"
 #include "platform/environment_queries.h"
 #include "platform/kernel_parameters.h"
@@ -48,6 +49,7 @@ struct Platform {
   Notifications& notifications;
   NetworkUsage& networkUsage;
   Semaphores& semaphores;
+  Drives& drives;
   DriverRegistry& driverRegistry;
   TaskSnapshot& taskSnapshot;
   StandardError& standardError;
@@ -56,6 +58,7 @@ struct Platform {
     CounterStore* counterStore = nullptr;
     Diagnostics* diagnostics = nullptr;
     CrashSupport* crashSupport = nullptr;
+    DriverRegistry* driverRegistry = nullptr;
     StandardError* standardError = nullptr;
   };
   // The same services, but for those given.

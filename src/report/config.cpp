@@ -85,13 +85,16 @@ bool IsGroupEnabled(const std::string& group, bool isInternalDevice, Platform& p
   return true;
 }
 
-std::optional<TLConfig> TLConfig::init(Platform& platform) {
+std::optional<TLConfig> TLConfig::init(Platform& platform, bool* isUnreadable) {
   TLConfig config(platform.log);
   config._isInternalDevice = platform.queries.TLIsInternalDevice();
 
   const auto bytes = platform.environment.readFile(kWhitelistPath, kMaxPropertyListBytes);
   if (!bytes) {
     platform.log.error("Couldn't load whitelist");
+    if (isUnreadable != nullptr) {
+      *isUnreadable = platform.environment.stat(kWhitelistPath).has_value();
+    }
     return std::nullopt;
   }
   config._configFileDigest = HexDigest(DigestKind::kMd5, *bytes);

@@ -50,8 +50,9 @@ bool IsGroupEnabled(const std::string& group, bool isInternalDevice, Platform& p
 
 class TLConfig {
  public:
-  // Loads the whitelist file. Nothing, after one message, when it cannot be read or parsed.
-  static std::optional<TLConfig> init(Platform& platform);
+  // Loads the whitelist file. Nothing, after one message, when it cannot be read or parsed;
+  // `isUnreadable` tells whether it is there, but could not be read.
+  static std::optional<TLConfig> init(Platform& platform, bool* isUnreadable = nullptr);
 
   // The options with which a key is reported, or nothing when it is left out. An exact entry comes
   // before a prefix, a longer prefix before a shorter one.

@@ -103,10 +103,11 @@ void TLReport::addInstalledAppInfo() {
   if (!allOptions && !userOptions) return;
   std::int64_t all = 0;
   std::int64_t user = 0;
-  _platform.applications.EnumerateApplicationBundles([&](ApplicationBundleType type) {
+  const auto visit = [&](ApplicationBundleType type) {
     ++all;
     if (type == ApplicationBundleType::UserApplicationBundleType) ++user;
-  });
+  };
+  if (!_platform.applications.EnumerateApplicationBundles(visit)) return;
   if (allOptions) addScalarForKeyWithOptions(all, kAllApps, *allOptions);
   if (userOptions) addScalarForKeyWithOptions(user, kThirdPartyApps, *userOptions);
 }

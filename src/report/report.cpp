@@ -40,7 +40,9 @@ std::int64_t RoundToDigits(std::int64_t value, std::uint64_t digits) {
 }  // namespace
 
 TLReport::TLReport(Platform& platform, UsedUp& usedUp)
-    : _platform(platform), _usedUp(usedUp), _config(TLConfig::init(platform)) {}
+    : _platform(platform),
+      _usedUp(usedUp),
+      _config(TLConfig::init(platform, &_isWhitelistUnreadable)) {}
 
 ReportOutcome TLReport::writeLogForYesterdayWithAppInfo(std::int32_t yesterday,
                                                         const std::optional<Array>& appInfo) {
@@ -68,8 +70,8 @@ ReportOutcome TLReport::writeLogForYesterdayWithAppInfo(std::int32_t yesterday,
     allRead = !history->failed();
   }
   if (_scalarsOutput.empty() && _distributionsOutput.empty() && _histogramsOutput.empty()) {
-    // Without a whitelist there is nothing to report; one that cannot be used hides what there is.
-    const bool isLost = !allRead || (!_config && _platform.environment.stat(kWhitelistPath));
+    // Without a whitelist there is nothing to report; one that cannot be read hides what there is.
+    const bool isLost = !allRead || _isWhitelistUnreadable;
     return isLost ? ReportOutcome::kLost : ReportOutcome::kNothingToReport;
   }
   return serializeWithDateAndAppInfo(yesterday, appInfo) ? ReportOutcome::kWritten

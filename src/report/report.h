@@ -95,6 +95,7 @@ class TLReport {
   Platform& _platform;
   UsedUp _nothingUsedUp;
   UsedUp& _usedUp;
+  bool _isWhitelistUnreadable = false;
   std::optional<TLConfig> _config;
   Dictionary _scalarsOutput;
   Dictionary _distributionsOutput;

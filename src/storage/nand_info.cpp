@@ -1,5 +1,7 @@
 #include "storage/nand_info.h"
 
+#include <algorithm>
+#include <array>
 #include <cstddef>
 #include <cstdio>
 
@@ -165,6 +167,61 @@ Dictionary ErrorDictionary(std::string_view message) {
   return {{kNANDInfoErrorKey, "1"}, {kNANDInfoErrorMessageKey, message}};
 }
 
+// What the fixed entries of the dictionary are made of.
+struct FixedEntry {
+  std::string_view key;
+  StatisticsSlot slot;
+};
+// clang-format off
+constexpr auto kFixedEntries = std::to_array<FixedEntry>({
+    {kNANDInfoNumVirtualBlocksKey, StatisticsSlotOf("numVirtualBlocks")},
+    {kNANDInfoPagesPerVirtualBlockKey, StatisticsSlotOf("pagesPerVirtualBlock")},
+    {kNANDInfoBytesPerPageKey, StatisticsSlotOf("bytesPerPage")},
+    {kNANDInfoNumLogicalReadsKey, StatisticsSlotOf("hostReads")},
+    {kNANDInfoNumLogicalWritesKey, StatisticsSlotOf("hostWrites")},
+    {kNANDInfoNumFreeVirtualBlocksKey, StatisticsSlotOf("numFreeVirtualBlocks")},
+    {kNANDInfoNumWearLevelOpsKey, StatisticsSlotOf("wearLevMoves")},
+    {kNANDInfoNumPhysicalReadsKey, StatisticsSlotOf("nandReads")},
+    {kNANDInfoNumPhysicalWritesKey, StatisticsSlotOf("nandWrites")},
+    {kNANDInfoNumPhysicalErasesKey, StatisticsSlotOf("bandErases")},
+    {kNANDInfoNumNodesFreeKey, StatisticsSlotOf("IND_pool_free")},
+    {kNANDInfoNumNodesTotalKey, StatisticsSlotOf("IND_pool_count")},
+    {kNANDInfoFormatWeeksSince2000Key, StatisticsSlotOf("utilFormatTime")},
+    {kNANDInfoNumSleepOpsKey, StatisticsSlotOf("numSleepOps")},
+    {kNANDInfoHighEnduranceBlockEraseCountKey, StatisticsSlotOf("maxHighEnduranceBlockErases")},
+    {kNANDInfoBlocksPerVirtualBlock, StatisticsSlotOf("blocksPerVirtualBlock")},
+    {kNANDInfoReadsBeforeErasureKeys[0], StatisticsSlotOf("readCountHisto0")},
+    {kNANDInfoReadsBeforeErasureKeys[1], StatisticsSlotOf("readCountHisto1")},
+    {kNANDInfoReadsBeforeErasureKeys[2], StatisticsSlotOf("readCountHisto2")},
+    {kNANDInfoReadsBeforeErasureKeys[3], StatisticsSlotOf("readCountHisto3")},
+    {kNANDInfoReadsBeforeErasureKeys[4], StatisticsSlotOf("readCountHisto4")},
+    {kNANDInfoNumMaintenanceRequestsKey, StatisticsSlotOf("numBootBlockRefreshSuccess0")},
+    {kNANDInfoMaintenanceFailedReadKey, StatisticsSlotOf("mspBootBlockReadFail0")},
+    {kNANDInfoMaintenanceFailedProgKey, StatisticsSlotOf("mspBootBlockProgFail0")},
+    {kNANDInfoMaintenanceFailedEraseKey, StatisticsSlotOf("mspBootBlockEraseFail0")},
+});
+// clang-format on
+
+// Whether the driver that was asked leaves out of its export what it does not know.
+bool TellsOnlyWhatItHas(Platform& platform) {
+  const StorageExporter* row = nullptr;
+  const RegistryHandle service = findNandExporter(platform.driverRegistry, row);
+  const auto property = platform.driverRegistry.CopyEntryProperty(service, kTellsOnlyWhatItHas);
+  platform.driverRegistry.ReleaseHandle(service);
+  const bool* tells = property ? property->asBoolean() : nullptr;
+  return tells != nullptr && *tells;
+}
+
+// Drops the zeros that stand for what the export does not say.
+void DropUntold(const FSPParseContext& context, Dictionary& dictionary) {
+  for (const FixedEntry& entry : kFixedEntries) {
+    if (std::ranges::find(context.pairs, entry.slot, &StatisticsPair::slot) ==
+        context.pairs.end()) {
+      dictionary.remove(entry.key);
+    }
+  }
+}
+
 // The dictionary of the driver's export, or nothing when that cannot be read.
 std::optional<Dictionary> FetchDictionary(Platform& platform, bool forMerge) {
   FSPParseContext context;
@@ -172,6 +229,7 @@ std::optional<Dictionary> FetchDictionary(Platform& platform, bool forMerge) {
   std::optional<Dictionary> dictionary;
   if (FetchAndParseStats(platform, row, context)) {
     dictionary = BuildNANDInfoDictionary(platform, context, forMerge);
+    if (dictionary && TellsOnlyWhatItHas(platform)) DropUntold(context, *dictionary);
   }
   if (row->releaseContext != nullptr) row->releaseContext(context);
   return dictionary;

@@ -40,6 +40,9 @@ class HardDays {
     driver.properties["DrvReportLegend"] = Array{Dictionary{
         {"DrvReportChannels", Array{PropertyValue(Array{Int64(1), Int64(0x100000001), "c"})}}}};
     device.driverRegistry.entries.push_back(driver);
+    Drive& drive = device.drives.drives.emplace_back();
+    drive.place = "slot";
+    drive.figures.set(DriveFigure::kUsed, 5);
   }
 
   std::int32_t today() { return device.counterStore.TLDaysSince1970(); }
@@ -144,6 +147,11 @@ class HardDays {
       if (row.first == "datausage.wifiInKB.nuvex.p") growth += value;
     }
     EXPECT_EQ(growth, transferred) << "network usage";
+    // A drive's wear is stored together with which drive it is of.
+    const auto worn = device.counterStore.scalars.lower_bound({"nuvex.flash.slot.used", 0});
+    if (worn != device.counterStore.scalars.end() && worn->first.first.starts_with("nuvex.flash")) {
+      EXPECT_TRUE(device.counterStore.notes.contains("flash"));
+    }
     std::set<std::string> seen;
     for (const auto& [type, entry] : device.crashSupport.entries) {
       if (type == 172) seen.insert(PropertyValue(entry).description());

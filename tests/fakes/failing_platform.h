@@ -26,12 +26,12 @@ class FailingPlatform {
       : real_(real), strike_(std::move(strike)), queries_(deviceInfo_, environment_, real.log) {}
 
   Platform services() {
-    return {
-        real_.log,          real_.clock,        preferences_,  counterStore_,    diagnostics_,
-        crashSupport_,      supportLibrary_,    deviceInfo_,   osVersion_,       kernelParameters_,
-        environment_,       queries_,           applications_, locale_,          passLock_,
-        real_.namedService, notifications_,     networkUsage_, real_.semaphores, driverRegistry_,
-        taskSnapshot_,      real_.standardError};
+    return {real_.log,       real_.clock,       preferences_,       counterStore_,
+            diagnostics_,    crashSupport_,     supportLibrary_,    deviceInfo_,
+            osVersion_,      kernelParameters_, environment_,       queries_,
+            applications_,   locale_,           passLock_,          real_.namedService,
+            notifications_,  networkUsage_,     real_.semaphores,   drives_,
+            driverRegistry_, taskSnapshot_,     real_.standardError};
   }
 
  private:
@@ -48,6 +48,13 @@ class FailingPlatform {
     }
     const Platform& real;
     const Strike& strike;
+  };
+
+  struct FailingDrives : Drives, Service {
+    using Service::Service;
+    std::vector<Drive> read() override {
+      return make<std::vector<Drive>>("drives", {}, [&] { return real.drives.read(); });
+    }
   };
 
   struct FailingPreferences : Preferences, Service {
@@ -226,9 +233,10 @@ class FailingPlatform {
 
   struct FailingApplications : Applications, Service {
     using Service::Service;
-    void EnumerateApplicationBundles(
+    bool EnumerateApplicationBundles(
         const std::function<void(ApplicationBundleType)>& visit) override {
-      make("list applications", [&] { real.applications.EnumerateApplicationBundles(visit); });
+      return make("list applications", false,
+                  [&] { return real.applications.EnumerateApplicationBundles(visit); });
     }
   };
 
@@ -367,6 +375,7 @@ class FailingPlatform {
   FailingPassLock passLock_{*this};
   FailingNotifications notifications_{*this};
   FailingNetworkUsage networkUsage_{*this};
+  FailingDrives drives_{*this};
   FailingDriverRegistry driverRegistry_{*this};
   FailingTaskSnapshot taskSnapshot_{*this};
   EnvironmentQueries queries_;

@@ -240,10 +240,11 @@ class FakeEnvironment : public Environment {
 
 class FakeApplications : public Applications {
  public:
-  void EnumerateApplicationBundles(
+  bool EnumerateApplicationBundles(
       const std::function<void(ApplicationBundleType)>& visit) override {
     ++enumerations;
     for (const ApplicationBundleType type : bundles) visit(type);
+    return true;
   }
   std::vector<ApplicationBundleType> bundles;
   int enumerations = 0;
@@ -365,6 +366,12 @@ class FakeStandardError : public StandardError {
   std::string text;
 };
 
+class FakeDrives : public Drives {
+ public:
+  std::vector<Drive> read() override { return drives; }
+  std::vector<Drive> drives;
+};
+
 // The services, bundled. The clock starts at noon of day 20000.
 struct FakePlatform {
   FakeSystemLog log;
@@ -386,14 +393,33 @@ struct FakePlatform {
   FakeNotifications notifications;
   FakeNetworkUsage networkUsage;
   FakeSemaphores semaphores;
+  FakeDrives drives;
   FakeDriverRegistry driverRegistry;
   FakeTaskSnapshot taskSnapshot;
   FakeStandardError standardError;
-  Platform services{log,          clock,          preferences,  counterStore, diagnostics,
-                    crashSupport, supportLibrary, deviceInfo,   osVersion,    kernelParameters,
-                    environment,  queries,        applications, locale,       passLock,
-                    namedService, notifications,  networkUsage, semaphores,   driverRegistry,
-                    taskSnapshot, standardError};
+  Platform services{log,
+                    clock,
+                    preferences,
+                    counterStore,
+                    diagnostics,
+                    crashSupport,
+                    supportLibrary,
+                    deviceInfo,
+                    osVersion,
+                    kernelParameters,
+                    environment,
+                    queries,
+                    applications,
+                    locale,
+                    passLock,
+                    namedService,
+                    notifications,
+                    networkUsage,
+                    semaphores,
+                    drives,
+                    driverRegistry,
+                    taskSnapshot,
+                    standardError};
 };
 
 }  // namespace quorlet

@@ -78,7 +78,7 @@ TEST_F(UnitUsage, TrafficHasAKindWhereEveryUsedInterfaceHasIt) {
       };
   for (const auto& [name, type, received, event, kind] : steps) {
     has(name, type, received, event);
-    EXPECT_EQ(SoleLinkKind(root.root()), kind) << name << " " << received;
+    EXPECT_EQ(SoleLinkKind(root.root()), SoleLink(kind)) << name << " " << received;
   }
 }
 

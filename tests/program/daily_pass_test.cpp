@@ -99,7 +99,8 @@ TEST_F(DailyPassTest, DamageOfAnyFileCostsOnlyWhatWasInIt) {
     EXPECT_EQ(logs().size(), c.logExpected ? 1u : 0u);
     EXPECT_EQ(lines("default").back(), "quorlet ended");
     // A log that is lost is told of beside its reason.
-    EXPECT_LE(lines("error").size(), c.logExpected ? 1u : 2u) << testing::PrintToString(lines("error"));
+    EXPECT_LE(lines("error").size(), c.logExpected ? 1u : 2u)
+        << testing::PrintToString(lines("error"));
     existed ? device.write(c.path, before) : static_cast<void>(fs::remove(device.path(c.path)));
   }
 }

@@ -108,6 +108,7 @@ TEST_F(QuorletctlTest, FailuresGetOneLineAndStatusOne) {
       {{"whitelist", "check", device.path("/cut.plist")}, "cannot parse"},
       {{"tally", "import", device.directory()}, "cannot read"},
       {{"storage", "info"}, "there is no storage drive"},
+      {{"storage", "health"}, "there is no drive"},
       {{"storage", "snapshot"}, "there is no storage drive"},
       {{"storage", "advice"}, "there is no storage drive"},
       {{"storage", "vmfreezer"}, "no memory freezer"},
@@ -163,12 +164,31 @@ TEST_F(QuorletctlTest, ASnapshotHeaderThatCannotBeReadIsNotAMissingOne) {
   expectFailure({"storage", "info"}, 1, "does not answer");
 }
 
-TEST_F(QuorletctlTest, ADriveThatSleepsIsSaidToSleep) {
-  device.write("/sys/class/nvme/nvme0/device/power/runtime_status", "suspended\n");
+TEST_F(QuorletctlTest, ADriveThatSleepsOrIsNoneIsSaidToBe) {
+  const std::string power = "/sys/class/nvme/nvme0/device/power/runtime_status";
+  const std::string broken = "cannot ask the storage drive nvme0: " + ErrnoText(ENOTTY);
   device.write("/dev/nvme0", "");
-  expectFailure({"storage", "info"}, 1, "the storage drive nvme0 is asleep");
-  device.write("/sys/class/nvme/nvme0/device/power/runtime_status", "active\n");
-  expectFailure({"storage", "info"}, 1, "nvme0");
+  for (const char* command : {"info", "health"}) {
+    device.write(power, "suspended\n");
+    expectFailure({"storage", command}, 1, "the storage drive nvme0 is asleep");
+    device.write(power, "active\n");
+    expectFailure({"storage", command}, 1, broken);
+  }
+  // Beside one that tells.
+  device.write("/sys/block/mmcblk1/device/type", "MMC\n");
+  device.write("/sys/block/mmcblk1/device/life_time", "0x01 0x03\n");
+  const ProgramResult partly = run({"storage", "health", "--json"});
+  EXPECT_EQ(partly.status, 1);
+  EXPECT_EQ(partly.err, "quorletctl: " + broken + "\n");
+  EXPECT_EQ(Json::parse(partly.out)["drives"][0]["usedPercent"], 30);
+  device.write(power, "suspended\n");
+  const ProgramResult note = run({"storage", "health"});
+  EXPECT_EQ(note.status, 0);
+  EXPECT_NE(note.err.find("nvme0 is asleep"), std::string::npos) << note.err;
+  EXPECT_EQ(note.out,
+            "drive       used  written  per day  days left   errors\n"
+            "mmcblk1  20-30 %  unknown  unknown    unknown  unknown\n"
+            "nvme0    unknown  unknown  unknown    unknown  unknown\n");
 }
 
 TEST_F(QuorletctlTest, ARootThatIsNoneIsRefused) {

@@ -58,19 +58,28 @@ bool IsApplication(std::string_view text) {
 
 class LinuxApplications : public Applications {
  public:
-  explicit LinuxApplications(const Root& root) : root_(root) {}
+  LinuxApplications(const Root& root, SystemLog& log) : root_(root), log_(log) {}
 
-  void EnumerateApplicationBundles(
+  bool EnumerateApplicationBundles(
       const std::function<void(ApplicationBundleType)>& visit) override {
+    bool isComplete = true;
     for (const ApplicationDirectory& directory : kDirectories) {
       const auto found = [&] { visit(directory.type); };
-      search(root_.path(directory.path), 0, found);
+      isComplete &= search(root_.path(directory.path), 0, found);
     }
+    return isComplete;
   }
 
  private:
-  void search(const std::string& directory, int depth, const std::function<void()>& found) {
-    for (const std::string& name : ListDirectory(directory)) {
+  bool search(const std::string& directory, int depth, const std::function<void()>& found) {
+    const auto names = ReadDirectory(directory);
+    if (const int* error = std::get_if<int>(&names)) {
+      log_.error("The applications are not counted: cannot read %@: %@", directory,
+                 ErrnoText(*error));
+      return false;
+    }
+    bool isComplete = true;
+    for (const std::string& name : std::get<std::vector<std::string>>(names)) {
       if (name.starts_with('.')) continue;
       const std::string path = JoinPath(directory, name);
       struct stat status = {};
@@ -82,18 +91,20 @@ class LinuxApplications : public Applications {
         if (entry != nullptr && IsApplication(*entry)) found();
       } else if (depth < kMaxDepth && lstat(path.c_str(), &status) == 0 &&
                  S_ISDIR(status.st_mode)) {
-        search(path, depth + 1, found);
+        isComplete &= search(path, depth + 1, found);
       }
     }
+    return isComplete;
   }
 
   const Root root_;
+  SystemLog& log_;
 };
 
 }  // namespace
 
-std::unique_ptr<Applications> MakeLinuxApplications(const Root& root) {
-  return std::make_unique<LinuxApplications>(root);
+std::unique_ptr<Applications> MakeLinuxApplications(const Root& root, SystemLog& log) {
+  return std::make_unique<LinuxApplications>(root, log);
 }
 
 }  // namespace quorlet

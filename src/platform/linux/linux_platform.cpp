@@ -7,11 +7,12 @@
 
 #include "platform/linux/counter_store.h"
 #include "platform/linux/driver_files.h"
+#include "platform/linux/drives/drive_exports.h"
+#include "platform/linux/drives/drive_reader.h"
+#include "platform/linux/drives/drives_publisher.h"
 #include "platform/linux/live/live_source.h"
 #include "platform/linux/named_service.h"
 #include "platform/linux/network_usage.h"
-#include "platform/linux/nvme_health_page.h"
-#include "platform/linux/nvme_source.h"
 #include "platform/linux/semaphores.h"
 #include "platform/linux/services.h"
 
@@ -19,11 +20,12 @@ namespace quorlet {
 namespace {
 
 // The driver files first: what they describe comes before what the machine has.
-std::vector<std::unique_ptr<EntrySource>> EntrySources(const Root& root, SystemLog& log) {
+std::vector<std::unique_ptr<EntrySource>> EntrySources(const Root& root, SystemLog& log,
+                                                       const std::shared_ptr<DriveReader>& drives) {
   std::vector<std::unique_ptr<EntrySource>> sources;
   sources.push_back(MakeDriverFiles(root, log));
-  sources.push_back(MakeNvmeSource(root, ReadNvmeHealthPage));
-  sources.push_back(MakeLiveChannels(root));
+  sources.push_back(MakeDriveExports(drives));
+  sources.push_back(MakeLiveChannels(root, MakeDrivesPublisher(drives)));
   return sources;
 }
 
@@ -46,12 +48,13 @@ struct LinuxPlatform::Services {
         crashSupport(MakeLinuxCrashSupport(root, access, *clock, *osVersion, *log)),
         supportLibrary(MakeLinuxSupportLibrary()),
         kernelParameters(MakeLinuxKernelParameters(root, access, *log)),
-        applications(MakeLinuxApplications(root)),
+        applications(MakeLinuxApplications(root, *log)),
         locale(MakeLinuxLocale(root, [](const char* name) { return getenv(name); })),
         passLock(MakeLinuxPassLock(root, access, *log)),
         namedService(MakeLinuxNamedService(root, *log)),
         notifications(MakeLinuxNotifications(root, *log)),
-        driverRegistry(MakeLinuxDriverRegistry(EntrySources(root, *log))),
+        drives(std::make_shared<DriveReader>(root)),
+        driverRegistry(MakeLinuxDriverRegistry(EntrySources(root, *log, drives))),
         taskSnapshot(MakeLinuxTaskSnapshot(root, *log)),
         networkUsage(MakeLinuxNetworkUsage(root, *log)) {}
 
@@ -75,6 +78,7 @@ struct LinuxPlatform::Services {
   const std::unique_ptr<NamedService> namedService;
   const std::unique_ptr<Notifications> notifications;
   const std::unique_ptr<Semaphores> semaphores = MakeLinuxSemaphores();
+  const std::shared_ptr<DriveReader> drives;
   const std::unique_ptr<DriverRegistry> driverRegistry;
   const std::unique_ptr<TaskSnapshot> taskSnapshot;
   const std::unique_ptr<StandardError> standardError = MakeLinuxStandardError();
@@ -99,6 +103,7 @@ struct LinuxPlatform::Services {
                   .notifications = *notifications,
                   .networkUsage = *networkUsage,
                   .semaphores = *semaphores,
+                  .drives = *drives,
                   .driverRegistry = *driverRegistry,
                   .taskSnapshot = *taskSnapshot,
                   .standardError = *standardError};

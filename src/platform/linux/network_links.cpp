@@ -51,15 +51,17 @@ class Interface {
 
 }  // namespace
 
-std::optional<LinkKind> SoleLinkKind(const Root& root) {
+SoleLink SoleLinkKind(const Root& root) {
   const std::string directory = root.kernelPath("/sys/class/net");
+  const auto names = ReadDirectory(directory);
+  if (const int* error = std::get_if<int>(&names)) return *error;
   std::optional<LinkKind> sole;
-  for (const std::string& name : ListDirectory(directory)) {
+  for (const std::string& name : std::get<std::vector<std::string>>(names)) {
     if (name == "bonding_masters") continue;  // a file
     const Interface interface(directory + "/" + name);
     if (!interface.isUsed()) continue;
     const auto kind = interface.kind();
-    if (!kind || (sole && *sole != *kind)) return std::nullopt;
+    if (!kind || (sole && *sole != *kind)) return std::optional<LinkKind>();
     sole = kind;
   }
   return sole;

@@ -3,12 +3,16 @@
 #define QUORLET_PLATFORM_LINUX_NETWORK_LINKS_H_
 
 #include <optional>
+#include <variant>
 
 #include "platform/linux/files.h"
 
 namespace quorlet {
 
 enum class LinkKind { kWifi, kCellular };
+
+// What the interfaces are, or the errno of why nobody knows.
+using SoleLink = std::variant<std::optional<LinkKind>, int>;
 
 // The one kind of all the network interfaces in /sys/class/net that have carried anything since
 // they appeared; nullopt when they are of several kinds or of another kind (a cable), or when there
@@ -23,7 +27,7 @@ enum class LinkKind { kWifi, kCellular };
 // It does not matter which interface is in use now: a total that began earlier may have gone over
 // every one of them. An interface that is gone cannot be known any more; what went over it counts
 // as the others'.
-std::optional<LinkKind> SoleLinkKind(const Root& root);
+SoleLink SoleLinkKind(const Root& root);
 
 }  // namespace quorlet
 

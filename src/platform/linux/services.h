@@ -85,7 +85,7 @@ std::unique_ptr<StandardError> MakeLinuxStandardError();
 std::unique_ptr<Environment> MakeLinuxEnvironment(const Root& root, DeviceInfo& deviceInfo,
                                                   SystemLog& log);
 
-std::unique_ptr<Applications> MakeLinuxApplications(const Root& root);
+std::unique_ptr<Applications> MakeLinuxApplications(const Root& root, SystemLog& log);
 
 // The value of an environment variable, or nullptr.
 using EnvironmentVariable = std::function<const char*(const char* name)>;

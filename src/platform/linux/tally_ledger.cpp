@@ -377,7 +377,14 @@ std::unique_ptr<TLHistory> LinuxTallyLedger::openHistory() {
     if (code == SQLITE_OK) {
       if (reader.isBlank()) return nullptr;
       return MakeTallyHistory(std::move(reader), [this](TallyDatabase& database, int failure) {
+        const FileIdentity read = database.identity();
+        const std::string why = database.message(failure);
         handleReadFailure(database, failure);
+        FileIdentity file;
+        const bool isSound = FindIdentity(path_, file) == 0 && file == read;
+        if (!IsDamage(failure) || !isSound || access_ == Access::kReadOnly) return;
+        // Nobody was told, and what was being read is lost to its reader.
+        log_.error("Cannot read all of the counter store %@, which is sound: %@", path_, why);
       });
     }
     handleReadFailure(reader, code);

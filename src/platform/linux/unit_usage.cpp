@@ -143,8 +143,10 @@ bool Connect(BusConnection& connection, const Root& root) {
 
 std::optional<Array> ReadUnitUsage(const Root& root, std::chrono::milliseconds limit) {
   const auto deadline = std::chrono::steady_clock::now() + limit;
-  const auto kind = SoleLinkKind(root);
-  if (!kind) return Array();
+  const SoleLink link = SoleLinkKind(root);
+  const auto* kind = std::get_if<std::optional<LinkKind>>(&link);
+  if (kind == nullptr) return std::nullopt;
+  if (!*kind) return Array();
   BusConnection connection(deadline);
   if (!Connect(connection, root)) {
     const bool isLate = std::chrono::steady_clock::now() >= deadline;
@@ -155,7 +157,7 @@ std::optional<Array> ReadUnitUsage(const Root& root, std::chrono::milliseconds l
   Array records;
   for (const Unit& unit : *units) {
     if (unit.outBytes == kNotCounted || unit.startMicroseconds < kMicroseconds) continue;
-    records.push_back(Record(unit, *kind));
+    records.push_back(Record(unit, **kind));
   }
   return records;
 }

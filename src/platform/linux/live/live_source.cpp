@@ -48,7 +48,7 @@ class LiveDriver {
 
 class LiveChannels : public EntrySource {
  public:
-  explicit LiveChannels(const Root& root) {
+  LiveChannels(const Root& root, std::unique_ptr<LivePublisher> drives) {
     // The place in this list makes the entry ID: new ones go to the end.
     drivers_.emplace_back("cpu-idle", MakeCpuIdlePublisher(root));
     drivers_.emplace_back("cpu-frequency", MakeCpuFrequencyPublisher(root));
@@ -58,6 +58,7 @@ class LiveChannels : public EntrySource {
     drivers_.emplace_back("pressure", MakePressurePublisher(root));
     drivers_.emplace_back("memory-activity", MakeMemoryActivityPublisher(root));
     drivers_.emplace_back("run-queue", MakeRunQueuePublisher(root));
+    if (drives != nullptr) drivers_.emplace_back("drives", std::move(drives));
   }
 
   std::vector<RegistryEntry> entries() override {
@@ -94,8 +95,9 @@ class LiveChannels : public EntrySource {
 
 }  // namespace
 
-std::unique_ptr<EntrySource> MakeLiveChannels(const Root& root) {
-  return std::make_unique<LiveChannels>(root);
+std::unique_ptr<EntrySource> MakeLiveChannels(const Root& root,
+                                              std::unique_ptr<LivePublisher> drives) {
+  return std::make_unique<LiveChannels>(root, std::move(drives));
 }
 
 }  // namespace quorlet

@@ -6,14 +6,16 @@
 #include <memory>
 
 #include "platform/linux/files.h"
+#include "platform/linux/live/live_publisher.h"
 #include "platform/linux/registry_entry.h"
 
 namespace quorlet {
 
 // The entries are of class "QuorletLiveChannels" and have their IDs from 0x4C00000000000001 on. A
 // kind of data that the machine does not have has no entry. After a refresh only the kinds whose
-// elements are asked for are read.
-std::unique_ptr<EntrySource> MakeLiveChannels(const Root& root);
+// elements are asked for are read. `drives`, if any, adds the drives' health.
+std::unique_ptr<EntrySource> MakeLiveChannels(const Root& root,
+                                              std::unique_ptr<LivePublisher> drives = nullptr);
 
 }  // namespace quorlet
 

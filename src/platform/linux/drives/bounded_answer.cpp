@@ -1,12 +1,7 @@
-// A drive that does not answer keeps whoever asks it in the kernel, where no signal reaches. A time
-// limit on the command itself would make the kernel reset the controller. So a child asks, and is
-// left behind when it takes too long.
-#include "platform/linux/nvme_health_page.h"
+#include "platform/linux/drives/bounded_answer.h"
 
 #include <fcntl.h>
-#include <linux/nvme_ioctl.h>
 #include <poll.h>
-#include <sys/ioctl.h>
 #include <sys/resource.h>
 #include <sys/syscall.h>
 #include <sys/wait.h>
@@ -21,19 +16,11 @@
 #include <utility>
 
 #include "platform/linux/descriptor.h"
-#include "platform/linux/nvme_statistics.h"
 
 namespace quorlet {
 namespace {
 
-constexpr std::uint8_t kGetLogPage = 0x02;
-constexpr std::uint32_t kHealthPage = 0x02;
-constexpr std::uint32_t kAllNamespaces = 0xFFFFFFFF;
 constexpr std::size_t kMaxAttributeBytes = 64;
-
-// What a child does: it fills the buffer and says how much of it, or fails below 0. Only what may
-// be called between fork and the end.
-using Question = std::function<ssize_t(std::span<std::byte> answer)>;
 
 // The directory entries as the kernel writes them.
 struct KernelEntry {
@@ -81,7 +68,8 @@ void CloseAllButFirst() {
   for (rlim_t i = 1; i < std::min(count, kMostTried); ++i) close(static_cast<int>(i));
 }
 
-[[noreturn]] void AnswerFromChild(const Question& question, std::span<std::byte> answer, int pipe) {
+[[noreturn]] void AnswerFromChild(const BoundedQuestion& question, std::span<std::byte> answer,
+                                  int pipe) {
   // Whatever else is open, a lock or somebody's pipe, must not stay open with a child that hangs.
   if (dup2(pipe, 0) < 0) _exit(1);
   CloseAllButFirst();
@@ -91,8 +79,10 @@ void CloseAllButFirst() {
   _exit(0);
 }
 
-// The answer, of at most `capacity` bytes; empty when there is none within `limit`.
-Data AnswerWithin(std::chrono::milliseconds limit, std::size_t capacity, const Question& question) {
+}  // namespace
+
+BoundedAnswer AskWithin(std::chrono::milliseconds limit, std::size_t capacity,
+                        const BoundedQuestion& question) {
   Data answer(capacity);
   int ends[2];
   if (pipe2(ends, O_CLOEXEC) != 0) return {};
@@ -117,34 +107,15 @@ Data AnswerWithin(std::chrono::milliseconds limit, std::size_t capacity, const Q
   // One that has answered is gone in no time; one that hangs is not waited for.
   waitpid(child, nullptr, ready > 0 ? 0 : WNOHANG);
   answer.resize(static_cast<std::size_t>(std::max<ssize_t>(size, 0)));
-  return answer;
+  return {std::move(answer), ready == 0};
 }
 
-}  // namespace
-
-std::optional<Data> ReadNvmeHealthPage(const std::string& device, std::chrono::milliseconds limit) {
-  Data page = AnswerWithin(limit, kNvmeHealthPageBytes, [&](std::span<std::byte> answer) {
-    const int drive = open(device.c_str(), O_RDONLY | O_NONBLOCK | O_CLOEXEC);
-    if (drive < 0) return ssize_t{-1};
-    nvme_admin_cmd command{};
-    command.opcode = kGetLogPage;
-    command.nsid = kAllNamespaces;
-    command.addr = reinterpret_cast<std::uintptr_t>(answer.data());
-    command.data_len = kNvmeHealthPageBytes;
-    // The number of 32-bit words less one, and the page.
-    command.cdw10 = (std::uint32_t{kNvmeHealthPageBytes / 4 - 1} << 16) | kHealthPage;
-    const bool isRead = ioctl(drive, NVME_IOCTL_ADMIN_CMD, &command) == 0;
-    return isRead ? static_cast<ssize_t>(answer.size()) : ssize_t{-1};
-  });
-  return page.size() == kNvmeHealthPageBytes ? std::optional(std::move(page)) : std::nullopt;
-}
-
-std::string ReadNvmeAttribute(const std::string& path, std::chrono::milliseconds limit) {
-  const Data text = AnswerWithin(limit, kMaxAttributeBytes, [&](std::span<std::byte> answer) {
+std::string ReadAttributeWithin(const std::string& path, std::chrono::milliseconds limit) {
+  const auto text = AskWithin(limit, kMaxAttributeBytes, [&](std::span<std::byte> answer) {
     const int file = open(path.c_str(), O_RDONLY | O_NONBLOCK | O_CLOEXEC);
     return file < 0 ? ssize_t{-1} : read(file, answer.data(), answer.size());
   });
-  return {reinterpret_cast<const char*>(text.data()), text.size()};
+  return {reinterpret_cast<const char*>(text.bytes.data()), text.bytes.size()};
 }
 
 }  // namespace quorlet

@@ -1,10 +1,11 @@
-#include "platform/linux/nvme_statistics.h"
+#include "platform/linux/drives/drive_statistics.h"
 
 #include <algorithm>
 #include <array>
 #include <charconv>
 #include <limits>
 
+#include "platform/linux/drives/nvme_pages.h"
 #include "values/byte_reader.h"
 
 namespace quorlet {
@@ -18,6 +19,8 @@ enum Key : std::uint32_t {
   kValidLbas = 8,
   kBoots = 10,
   kUncleanBoots = 11,
+  kNandWrites = 18,
+  kNandReads = 19,
   kPowerOnHours = 34,
   kSmartCritWarnings = 36,
   kNumFlushes = 37,
@@ -69,9 +72,27 @@ class Export {
   Data bytes_;
 };
 
+void AddHealthPage(std::span<const std::byte> bytes, Export& out) {
+  ByteReader page(bytes);
+  out.add(kSmartCritWarnings, page.little<std::uint8_t>());
+  page.seek(kDataUnitsRead);
+  for (const Key key : {kHostReads, kHostWrites}) {
+    // 0 also stands for a figure that the drive does not report.
+    const std::uint64_t units = TakeCounter(page);
+    if (units != 0) out.add(key, SaturatingProduct(units, kSectorsPerDataUnit));
+  }
+  out.add(kHostReadXacts, TakeCounter(page));
+  out.add(kHostWriteXacts, TakeCounter(page));
+  (void)TakeCounter(page);  // controller busy time
+  out.add(kBoots, TakeCounter(page));
+  out.add(kPowerOnHours, TakeCounter(page));
+  out.add(kUncleanBoots, TakeCounter(page));
+  out.add(kUeccReads, TakeCounter(page));
+}
+
 }  // namespace
 
-bool AddBlockCounters(std::string_view line, NvmeBlockCounters& counters) {
+bool AddBlockCounters(std::string_view line, BlockCounters& counters) {
   // Reads, merged, sectors, ms; the same of writes; in flight, busy ms, weighted ms; the same four
   // of discards; flushes, ms.
   std::array<std::uint64_t, 17> fields{};
@@ -93,25 +114,17 @@ bool AddBlockCounters(std::string_view line, NvmeBlockCounters& counters) {
   return true;
 }
 
-std::optional<Data> EncodeNvmeStatistics(const NvmeFacts& facts) {
-  if (facts.healthPage.size() != kNvmeHealthPageBytes) return std::nullopt;
+Data EncodeDriveStatistics(const DriveFacts& facts) {
   Export out;
   out.add(kExportVersion, kVersion);
-  ByteReader page(facts.healthPage);
-  out.add(kSmartCritWarnings, page.little<std::uint8_t>());
-  page.seek(kDataUnitsRead);
-  for (const Key key : {kHostReads, kHostWrites}) {
-    // 0 also stands for a figure that the drive does not report.
-    const std::uint64_t units = TakeCounter(page);
-    if (units != 0) out.add(key, SaturatingProduct(units, kSectorsPerDataUnit));
+  if (facts.healthPage.size() == kNvmePageBytes) AddHealthPage(facts.healthPage, out);
+  const std::pair<Key, DriveFigure> media[] = {{kNandWrites, DriveFigure::kMediaBytesWritten},
+                                               {kNandReads, DriveFigure::kMediaBytesRead}};
+  for (const auto& [key, figure] : media) {
+    if (const auto bytes = facts.figures[figure]) {
+      out.add(key, static_cast<std::uint64_t>(*bytes) / kSectorBytes);
+    }
   }
-  out.add(kHostReadXacts, TakeCounter(page));
-  out.add(kHostWriteXacts, TakeCounter(page));
-  (void)TakeCounter(page);  // controller busy time
-  out.add(kBoots, TakeCounter(page));
-  out.add(kPowerOnHours, TakeCounter(page));
-  out.add(kUncleanBoots, TakeCounter(page));
-  out.add(kUeccReads, TakeCounter(page));
   if (facts.usedBytes) out.add(kValidLbas, *facts.usedBytes / kSectorBytes);
   if (facts.counters) {
     out.add(kNumFlushes, facts.counters->flushes);
