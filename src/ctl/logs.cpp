@@ -13,6 +13,7 @@
 #include <tuple>
 #include <vector>
 
+#include "ctl/export_command.h"
 #include "ctl/json_value.h"
 #include "ctl/options.h"
 #include "ctl/session.h"
@@ -218,6 +219,8 @@ void AddLogsCommands(CLI::App& app, Session& session) {
   list->callback([&session, arguments] {
     session.command = [&session, arguments] { List(session, *arguments); };
   });
+
+  AddExportCommand(*logs, session);
 
   CLI::App* submit = AddCommand(*logs, "submit", "Hand the pending logs to the uploader",
                                 "They are moved to outbox/. Refused without the owner's consent.",

@@ -5,6 +5,7 @@
 #include <new>
 #include <vector>
 
+#include "report/bucket_label.h"
 #include "report/report.h"
 
 namespace quorlet {
@@ -128,8 +129,8 @@ std::optional<Dictionary> TLReport::histogramDictForIntervalsWithHistCounts(
   for (std::size_t i = 0; i <= last; ++i) {
     if (counts[i] == 0) continue;
     const PropertyValue lower = i == 0 ? Double(-kInfinity) : intervals[i - 1];
-    const std::string label = i == last ? FormatText("(%@, %@)", lower, Double(kInfinity))
-                                        : FormatText("(%@, %@]", lower, intervals[i]);
+    const bool isLast = i == last;
+    const std::string label = BucketLabel(lower, isLast ? lower : intervals[i], isLast);
     if (!histogram) histogram.emplace();
     (*histogram)[label] = UInt64(counts[i]);
   }
