@@ -173,22 +173,26 @@ std::string Amount(double amount, std::string_view unit) {
   return Decimals(amount, step == 0 ? 0 : 1) + " " + kBytes[step];
 }
 
-// Widths of the columns behind the first one, which takes what is left.
+// Widths of the columns behind the first two, which share what is left.
 constexpr std::size_t kDetailWidth = 22;
-constexpr std::size_t kChangeWidth = 14;
-constexpr std::size_t kRateWidth = 14;
-constexpr std::size_t kNowWidth = 16;
-constexpr std::size_t kSmallestTitleWidth = 12;
+constexpr std::size_t kChangeWidth = 12;
+constexpr std::size_t kRateWidth = 13;
+constexpr std::size_t kNowWidth = 13;
+
+// A number that is too long takes the room of texts: it is never cut.
+std::string NumberColumn(std::string_view number, std::size_t width) {
+  return RightAligned(number, std::max(width, number.size()));
+}
 
 std::string Row(std::size_t columns, std::string_view title, std::string_view detail,
                 std::string_view change, std::string_view rate, std::string_view now) {
-  constexpr std::size_t kOthers = kDetailWidth + kChangeWidth + kRateWidth + kNowWidth + 4;
-  const std::size_t width =
-      std::max(kSmallestTitleWidth, columns > kOthers ? columns - kOthers : 0);
-  const std::string row = LeftAligned(title, width) + " " + LeftAligned(detail, kDetailWidth) +
-                          " " + RightAligned(change, kChangeWidth) + " " +
-                          RightAligned(rate, kRateWidth) + " " + RightAligned(now, kNowWidth);
-  return std::string(FitColumns(row, columns));
+  const std::string numbers = " " + NumberColumn(change, kChangeWidth) + " " +
+                              NumberColumn(rate, kRateWidth) + " " + NumberColumn(now, kNowWidth);
+  const std::size_t left = columns > numbers.size() ? columns - numbers.size() : 0;
+  const std::size_t detailWidth = std::min(kDetailWidth, left / 3);
+  if (detailWidth == 0) return LeftAligned(title, left) + numbers;
+  return LeftAligned(title, left - detailWidth - 1) + " " + LeftAligned(detail, detailWidth) +
+         numbers;
 }
 
 std::string Percent(double share) {

@@ -9,6 +9,7 @@
 #include "channels/drvreport.h"
 #include "ctl/channel_view.h"
 #include "ctl/json_value.h"
+#include "ctl/metrics_text.h"
 #include "ctl/options.h"
 #include "ctl/session.h"
 #include "ctl/terminal.h"
@@ -47,6 +48,7 @@ struct Selection {
 struct ChannelsArguments {
   Selection selection;
   bool json = false;
+  std::optional<MetricsFormat> metrics;
   double interval = 1;
   std::optional<std::uint64_t> count;
 };
@@ -163,6 +165,11 @@ void List(Session& session, const ChannelsArguments& arguments) {
 void Sample(Session& session, const ChannelsArguments& arguments) {
   Sampler sampler(session, arguments.selection);
   Moment moment = sampler.take();
+  if (arguments.metrics) {
+    MetricsText metrics(*arguments.metrics);
+    for (Dictionary& sample : moment.samples) metrics.add(sample);
+    return session.out.write(metrics.text());
+  }
   std::optional<JsonChannels> json;
   if (arguments.json) json.emplace(session.out);
   const std::size_t barWidth = IsTerminal() ? kSampleBarWidth : 0;
@@ -358,6 +365,23 @@ CLI::App* AddChannelsCommand(CLI::App& channels, Session& session, const Argumen
   return command;
 }
 
+void AddSampleCommand(CLI::App& channels, Session& session) {
+  const auto arguments = std::make_shared<ChannelsArguments>();
+  CLI::App* command =
+      AddChannelsCommand(channels, session, arguments, "sample", "Print what channels report now",
+                         "quorletctl channels sample --group Temperatures", Sample);
+  const auto set = [arguments](MetricsFormat format) {
+    return [arguments, format] { arguments->metrics = format; };
+  };
+  CLI::Option* open = command->add_flag_callback("--openmetrics", set(MetricsFormat::kOpenMetrics),
+                                                 "As text in the format OpenMetrics");
+  CLI::Option* prometheus =
+      command->add_flag_callback("--prometheus", set(MetricsFormat::kPrometheus),
+                                 "As text in the format that the node exporter reads from files");
+  open->excludes(prometheus)->excludes(command->get_option("--json"));
+  prometheus->excludes(command->get_option("--json"));
+}
+
 void AddWatchCommand(CLI::App& channels, Session& session) {
   const auto arguments = std::make_shared<ChannelsArguments>();
   CLI::App* command = AddChannelsCommand(
@@ -387,9 +411,7 @@ void AddChannelsCommands(CLI::App& app, Session& session) {
   AddChannelsCommand(*channels, session, std::make_shared<ChannelsArguments>(), "list",
                      "Print what channels there are, one a line",
                      "quorletctl channels list --category 0x100", List);
-  AddChannelsCommand(*channels, session, std::make_shared<ChannelsArguments>(), "sample",
-                     "Print what channels report now",
-                     "quorletctl channels sample --group Temperatures", Sample);
+  AddSampleCommand(*channels, session);
   AddWatchCommand(*channels, session);
 }
 

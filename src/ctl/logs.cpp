@@ -15,8 +15,10 @@
 
 #include "ctl/export_command.h"
 #include "ctl/json_value.h"
+#include "ctl/log_summary.h"
 #include "ctl/options.h"
 #include "ctl/session.h"
+#include "ctl/terminal.h"
 #include "platform/linux/descriptor.h"
 #include "platform/linux/paths.h"
 #include "values/property_list.h"
@@ -36,6 +38,7 @@ constexpr std::string_view kAggregatedType = "193";
 
 struct LogsArguments {
   std::string file;
+  bool raw = false;
   bool json = false;
 };
 
@@ -182,7 +185,10 @@ std::string ReadRequestedLog(const std::string& file) {
 void Show(Session& session, const LogsArguments& arguments) {
   const std::string log = ReadRequestedLog(arguments.file);
   if (!arguments.json) {
-    session.out.write(log);
+    std::variant<ExportedLog, std::string> read = "not asked for";
+    if (!arguments.raw && IsTerminal()) read = ReadExportedLog(log);
+    const auto* summed = std::get_if<ExportedLog>(&read);
+    session.out.write(summed != nullptr ? LogSummary(*summed, GetTerminalSize().columns) : log);
     return;
   }
   const auto header = ParseHeader(log);
@@ -227,13 +233,15 @@ void AddLogsCommands(CLI::App& app, Session& session) {
                                 "quorletctl logs submit");
   submit->callback([&session] { session.command = [&session] { Submit(session); }; });
 
-  CLI::App* show =
-      AddCommand(*logs, "show", "Print a log",
-                 "What is printed is the header, one line of JSON, then the body.\n"
-                 "With --json: one object with \"header\" and \"body\" (a property list as JSON).",
-                 "quorletctl logs show latest");
+  CLI::App* show = AddCommand(
+      *logs, "show", "Print a log",
+      "In a terminal a summary of it. Into a pipe or file, and with --raw, its bytes: the\n"
+      "header, one line of JSON, then the body.\n"
+      "With --json: one object with \"header\" and \"body\" (a property list as JSON).",
+      "quorletctl logs show latest");
   show->add_option("FILE", arguments->file, "A listed name, \"latest\", or a path with a \"/\"")
       ->required();
+  show->add_flag("--raw", arguments->raw, "The log's bytes, in a terminal too");
   AddJsonFlag(*show, arguments->json);
   show->callback([&session, arguments] {
     session.command = [&session, arguments] { Show(session, *arguments); };

@@ -102,6 +102,8 @@ int Run(int argc, char** argv) {
     return kFailed;
   }
   if (!session.out.finish()) {
+    // Whoever read has seen enough.
+    if (session.out.error() == EPIPE) return kFailed;
     PrintErrorLine("cannot write to standard output: " + ErrnoText(session.out.error()));
     return kFailed;
   }
