@@ -39,6 +39,7 @@ bool Run(const std::shared_ptr<Disk>& disk, int diesAt, std::vector<std::string>
                     platform.notifications,
                     platform.networkUsage,
                     platform.semaphores,
+                    platform.drives,
                     platform.driverRegistry,
                     platform.taskSnapshot,
                     platform.standardError};

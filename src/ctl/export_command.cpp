@@ -1,17 +1,15 @@
 // quorletctl logs export: logs as rows for other programs.
 #include "ctl/export_command.h"
 
-#include <sys/stat.h>
 #include <unistd.h>
 
 #include <CLI/CLI.hpp>
-#include <cerrno>
-#include <filesystem>
 #include <memory>
 #include <vector>
 
 #include "ctl/export_format.h"
 #include "ctl/export_sources.h"
+#include "ctl/file_output.h"
 #include "ctl/options.h"
 #include "ctl/progress.h"
 #include "ctl/session.h"
@@ -30,52 +28,6 @@ struct ExportArguments {
   std::string device = kAutomatic;
   std::string output;  // empty: standard output
   std::vector<std::string> paths;
-};
-
-// A file that appears when the export is done, or standard output.
-class ExportOutput {
- public:
-  ExportOutput(Output& standardOutput, const std::string& path) : standardOutput_(standardOutput) {
-    if (path.empty()) return;
-    path_ = std::filesystem::absolute(path).lexically_normal();
-    struct stat status = {};
-    // Renaming would replace the device or the link, not what it stands for.
-    if (::lstat(path_.c_str(), &status) == 0 && !S_ISREG(status.st_mode)) {
-      throw Failure("cannot write " + path + ": it is not a file");
-    }
-    const std::string directory = path_.parent_path();
-    if (::access(directory.c_str(), F_OK) != 0) fail(errno);
-    if (!IsSafeName(path_.filename().string())) throw Failure("not the name of a file: " + path);
-    file_.emplace(directory, path_.filename().string());
-    fail(file_->open());
-  }
-
-  bool isFile() const { return file_.has_value(); }
-  // Whether `path` is the file that this one replaces.
-  bool replaces(const std::string& path) const {
-    return file_ && std::filesystem::absolute(path).lexically_normal() == path_;
-  }
-
-  void write(std::string_view bytes) {
-    if (file_) {
-      fail(file_->write(bytes));
-    } else {
-      standardOutput_.write(bytes);
-    }
-  }
-  bool ok() const { return standardOutput_.ok(); }
-  void finish() {
-    if (file_) fail(file_->publish(path_.filename().string()));
-  }
-
- private:
-  void fail(int error) const {
-    if (error != 0) throw Failure("cannot write " + path_.string() + ": " + ErrnoText(error));
-  }
-
-  Output& standardOutput_;
-  std::filesystem::path path_;
-  std::optional<AtomicFile> file_;
 };
 
 // Different bytes stay different in a text of a row.
@@ -153,7 +105,7 @@ class Exporter final : public LogVisitor {
 
   Session& session_;
   const ExportArguments& arguments_;
-  ExportOutput output_;
+  FileOutput output_;
   Progress progress_;
   std::string lines_;
   // Empty until it was asked for.

@@ -14,6 +14,7 @@
 #include <vector>
 
 #include "ctl/export_command.h"
+#include "ctl/html_command.h"
 #include "ctl/json_value.h"
 #include "ctl/log_summary.h"
 #include "ctl/options.h"
@@ -161,12 +162,12 @@ std::string LogBytes(const std::string& path, std::variant<std::string, int> byt
   return std::get<std::string>(std::move(bytes));
 }
 
-// The log of that name, wherever it has got to.
-std::string ReadNamedLog(const std::string& name) {
+// Where the log of that name has got to.
+std::string PathOfNamedLog(const std::string& name) {
   if (!IsSafeName(name)) throw Failure("not the name of a log: " + name);
   for (const std::string_view stage : kStages) {
     const std::string path = StageDirectory(stage) + "/" + name;
-    if (::access(path.c_str(), F_OK) == 0) return LogBytes(path, ReadOwnFile(path, kMaxLogBytes));
+    if (::access(path.c_str(), F_OK) == 0) return path;
     if (errno != ENOENT) FailReading(path, errno);
   }
   throw Failure("neither pending nor outbox has a log " + name);
@@ -174,12 +175,8 @@ std::string ReadNamedLog(const std::string& name) {
 
 std::string ReadRequestedLog(const std::string& file) {
   if (file.find('/') != std::string::npos) return LogBytes(file, ReadWholeFile(file, kMaxLogBytes));
-  if (file != kLatest) return ReadNamedLog(file);
-  const std::vector<StoredLog> logs = FindLogs();
-  if (logs.empty()) throw Failure("there is no log yet");
-  const auto last =
-      std::ranges::find(logs.rbegin(), logs.rend(), kAggregatedType, &StoredLog::type);
-  return ReadNamedLog(last != logs.rend() ? last->name : logs.back().name);
+  const std::string path = PathOfLog(file);
+  return LogBytes(path, ReadOwnFile(path, kMaxLogBytes));
 }
 
 void Show(Session& session, const LogsArguments& arguments) {
@@ -215,6 +212,15 @@ void Submit(Session& session) {
 
 }  // namespace
 
+std::string PathOfLog(const std::string& name) {
+  if (name != kLatest) return PathOfNamedLog(name);
+  const std::vector<StoredLog> logs = FindLogs();
+  if (logs.empty()) throw Failure("there is no log yet");
+  const auto last =
+      std::ranges::find(logs.rbegin(), logs.rend(), kAggregatedType, &StoredLog::type);
+  return PathOfNamedLog(last != logs.rend() ? last->name : logs.back().name);
+}
+
 void AddLogsCommands(CLI::App& app, Session& session) {
   CLI::App* logs = AddFamily(app, "logs", "Logs written for submission: pending and outbox",
                              "quorletctl logs show latest");
@@ -227,6 +233,7 @@ void AddLogsCommands(CLI::App& app, Session& session) {
   });
 
   AddExportCommand(*logs, session);
+  AddHtmlCommand(*logs, session);
 
   CLI::App* submit = AddCommand(*logs, "submit", "Hand the pending logs to the uploader",
                                 "They are moved to outbox/. Refused without the owner's consent.",
