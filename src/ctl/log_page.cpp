@@ -107,7 +107,7 @@ std::string RangePicture(double minimum, double maximum, double mean, double spr
 
 bool IsOfStorage(std::string_view key) {
   return key.starts_with("nuvex.NANDInfo.") || key.starts_with("nuvex.flash.") ||
-         key.starts_with("nuvex.tilehall.DiskUsage");
+         (key.starts_with("nuvex.tilehall.") && key.find(".Disk") != std::string_view::npos);
 }
 
 }  // namespace

@@ -1,9 +1,14 @@
 // quorletctl logs export, as a fleet's loader sees it.
 #include <gtest/gtest.h>
+#include <pty.h>
+#include <sys/ioctl.h>
 #include <sys/stat.h>
+#include <sys/wait.h>
+#include <unistd.h>
 
 #include <algorithm>
 #include <filesystem>
+#include <sstream>
 #include <string>
 #include <vector>
 
@@ -193,6 +198,78 @@ TEST_F(LogsExportTest, TheDeviceIsTheLogsElseThePathsElseThisOne) {
   EXPECT_EQ(deviceOf({"--device", "text", device.path("/f/named")}), "text");
   EXPECT_EQ(deviceOf({device.path("/f/\xff/outbox/a.log")}), "\\\\xff");
   EXPECT_EQ(deviceOf({device.path("/f/plain/a.log")}), "");
+}
+
+// What a terminal of 80 columns gets.
+std::string ShownInTerminal(const std::string& root, std::vector<const char*> words) {
+  int terminal = -1;
+  const winsize size{24, 80, 0, 0};
+  const pid_t child = forkpty(&terminal, nullptr, nullptr, &size);
+  if (child == 0) {
+    setenv("QUORLET_ROOT", root.c_str(), 1);
+    setenv("TERM", "xterm", 1);
+    words.insert(words.begin(), "quorletctl");
+    words.push_back(nullptr);
+    execv(QUORLETCTL_PROGRAM, const_cast<char**>(words.data()));
+    _exit(127);
+  }
+  std::string shown;
+  char bytes[4096];
+  for (ssize_t got = 0; (got = read(terminal, bytes, sizeof bytes)) > 0;) {
+    shown.append(bytes, static_cast<std::size_t>(got));
+  }
+  close(terminal);
+  waitpid(child, nullptr, 0);
+  std::erase(shown, '\r');
+  return shown;
+}
+
+TEST_F(LogsExportTest, ATerminalGetsASummaryThatFits) {
+  const std::string log =
+      Log(Scalars("<key>launches</key><integer>-9223372036854775807</integer><key>" +
+                  std::string(100, 'k') + "</key><integer>1234</integer>") +
+          Figures("-1234567890.5", "4000000") + Buckets({"(-inf, 2]", "(2, 40]", "(40, inf)"}));
+  device.write("/x.log", log);
+  const std::string path = device.path("/x.log");
+  const std::string shown = ShownInTerminal(device.directory(), {"logs", "show", path.c_str()});
+  std::istringstream lines(shown);
+  for (std::string line; std::getline(lines, line);) EXPECT_LE(line.size(), 80u) << line;
+  for (const char* part : {"Aggregated log of 2026-03-04", " -9,223,372,036,854,775,807\n",
+                           " 1,234\n", " 4,000,000 -1.23457e+09", "    (2, 40]   2 [####"}) {
+    EXPECT_NE(shown.find(part), std::string::npos) << part << " in\n" << shown;
+  }
+  EXPECT_EQ(ShownInTerminal(device.directory(), {"logs", "show", "--raw", path.c_str()}), log);
+}
+
+TEST_F(LogsExportTest, APageShowsHostileNamesAsText) {
+  const auto day = [](const char* date, const char* value) {
+    std::string log = Log(Scalars("<key>&lt;script&gt;\"'&amp;&#10;</key><integer>" +
+                                  std::string(value) + "</integer>") +
+                          Figures("1", "2") + Buckets({"(1, 2]"}));
+    return log.replace(log.find("2026-03-04"), 10, date);
+  };
+  device.write("/d/a", day("2026-03-04", "5"));
+  device.write("/d/b", day("2026-03-05", "12"));
+  const auto page = [&](std::vector<std::string> words) {
+    words.insert(words.begin(), {"logs", "html"});
+    return RunProgram(QUORLETCTL_PROGRAM, std::move(words),
+                      {{{"QUORLET_ROOT", device.directory()}}, {}});
+  };
+  const auto result = page({device.path("/d")});
+  EXPECT_EQ(result.status, 0) << result.err;
+  for (const char* part :
+       {"<title>Logs of 2026-03-04 to 2026-03-05</title>",
+        "&lt;script&gt;&quot;&#39;&amp;\\n</th><td class=\"number\">12</td><td></td>"
+        "<td class=\"number\">+7</td>",
+        "aria-label=\"from 5 to 12 in 2 days\"", "(1, 2]"}) {
+    EXPECT_NE(result.out.find(part), std::string::npos) << part;
+  }
+  EXPECT_EQ(result.out.find("<script>\""), std::string::npos);
+  EXPECT_EQ(result.out.find("http"), std::string::npos) << "nothing is fetched";
+  device.write("/d/c", "cut");
+  EXPECT_EQ(page({"--output", device.path("/page"), device.path("/d")}).status, 1);
+  EXPECT_EQ(device.read("/page"), result.out) << "a log that cannot be read costs only itself";
+  EXPECT_EQ(page({}).status, 1) << "there is no log";
 }
 
 }  // namespace
