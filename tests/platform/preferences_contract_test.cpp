@@ -117,6 +117,8 @@ TEST_F(LinuxPreferencesTest, WhatCannotBeReadIsNeitherEmptyNorReplaced) {
   EXPECT_TRUE(preferences->DGWPreferencesSynchronize("d"));
   const std::string bytes = root.read(kFile);
   preferences = machine.startProcess();
+  // A sanitizer that meets a type for the first time needs descriptors itself.
+  EXPECT_FALSE(ErrnoText(EMFILE).empty());
   rlimit before{};
   getrlimit(RLIMIT_NOFILE, &before);
   const rlimit none{0, before.rlim_max};
