@@ -219,6 +219,8 @@ class Watch {
 
   void run() {
     Interruption interruption;
+    std::optional<LeaveKey> leaveKey;
+    if (isTable_) leaveKey.emplace();
     const auto interval = std::chrono::duration_cast<SteadyClock::duration>(
         std::chrono::duration<double>(arguments_.interval));
     Moment earlier = sampler_.take();

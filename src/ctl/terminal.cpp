@@ -2,6 +2,7 @@
 
 #include <signal.h>
 #include <sys/ioctl.h>
+#include <termios.h>
 #include <unistd.h>
 
 #include <algorithm>
@@ -22,13 +23,14 @@ sigset_t StopSignals() {
   sigemptyset(&signals);
   sigaddset(&signals, SIGINT);
   sigaddset(&signals, SIGTERM);
+  sigaddset(&signals, SIGQUIT);
   return signals;
 }
 
 void HandleStopSignals(void (*handler)(int)) {
   struct sigaction action = {};
   action.sa_handler = handler;  // without SA_RESTART: a write that blocks ends, too
-  for (const int signal : {SIGINT, SIGTERM}) sigaction(signal, &action, nullptr);
+  for (const int signal : {SIGINT, SIGTERM, SIGQUIT}) sigaction(signal, &action, nullptr);
 }
 
 bool IsContinuation(char c) { return (static_cast<unsigned char>(c) & 0xC0) == 0x80; }
@@ -77,6 +79,19 @@ std::string Bar(double share, std::size_t width) {
   const double filled = std::isfinite(share) ? std::clamp(share, 0.0, 1.0) : 0.0;
   const auto marks = static_cast<std::size_t>(std::lround(filled * static_cast<double>(width)));
   return "[" + std::string(marks, '#') + std::string(width - marks, '.') + "]";
+}
+
+LeaveKey::LeaveKey() {
+  // In the background the terminal is another program's.
+  if (tcgetpgrp(STDIN_FILENO) != getpgrp() || tcgetattr(STDIN_FILENO, &before_) != 0) return;
+  termios changed = before_;
+  changed.c_cc[VQUIT] = 'q';
+  changed.c_lflag &= ~static_cast<tcflag_t>(ECHO);
+  isSet_ = tcsetattr(STDIN_FILENO, TCSANOW, &changed) == 0;
+}
+
+LeaveKey::~LeaveKey() {
+  if (isSet_) tcsetattr(STDIN_FILENO, TCSANOW, &before_);
 }
 
 Interruption::Interruption() {

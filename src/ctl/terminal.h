@@ -2,6 +2,8 @@
 #ifndef QUORLET_CTL_TERMINAL_H_
 #define QUORLET_CTL_TERMINAL_H_
 
+#include <termios.h>
+
 #include <chrono>
 #include <cstddef>
 #include <string>
@@ -27,7 +29,20 @@ std::string RightAligned(std::string_view text, std::size_t columns);
 // "[#####.....]" for a share of 0.5 and a width of 10; nothing but dots for what is no share.
 std::string Bar(double share, std::size_t width);
 
-// While it lives, SIGINT and SIGTERM end waits instead of the program.
+// While it lives, the terminal sends SIGQUIT for the key q, and shows no key.
+class LeaveKey {
+ public:
+  LeaveKey();
+  LeaveKey(const LeaveKey&) = delete;
+  LeaveKey& operator=(const LeaveKey&) = delete;
+  ~LeaveKey();
+
+ private:
+  termios before_ = {};
+  bool isSet_ = false;
+};
+
+// While it lives, SIGINT, SIGQUIT and SIGTERM end waits instead of the program.
 class Interruption {
  public:
   Interruption();
