@@ -8,6 +8,7 @@
 #include <cmath>
 #include <cstdio>
 #include <memory>
+#include <span>
 #include <vector>
 
 #include "ctl/json_value.h"
@@ -132,7 +133,7 @@ class Dump {
   void run(TLHistory* history, std::optional<std::int32_t> day) {
     const std::int32_t above = day ? *day - 1 : kFirstDay - 1;
     const std::int32_t upTo = day ? *day : kLastDay;
-    if (json_) out_.write("{\"scalars\":[");
+    if (json_) out_.write("{\"schema\":1,\"scalars\":[");
     if (history != nullptr) {
       history->scalarsForKeyPrefixMinDaysSince1970MaxDaysSince1970RowHandler(
           "", above, upTo,
@@ -194,15 +195,20 @@ class Dump {
   void openRow(std::string_view key, std::int32_t day) {
     buffer_ += isFirst_ ? "\n" : ",\n";
     isFirst_ = false;
-    buffer_ +=
-        "{\"day\":" + std::to_string(day) + ",\"key\":" + JsonText(key, JsonForm::kPlain) + ",";
+    buffer_ += "{\"day\":" + std::to_string(day) + ",\"key\":" + keyJson(key) + ",";
+  }
+
+  // A key that is not text stands as its bytes, so that different keys stay different.
+  static std::string keyJson(std::string_view key) {
+    if (IsValidUtf8(key)) return JsonText(key, JsonForm::kPlain);
+    const auto bytes = std::as_bytes(std::span(key));
+    return JsonText(Data(bytes.begin(), bytes.end()), JsonForm::kTagged);
   }
 
   void appendPair(const DistributionSample& sample, bool isFirstValue) {
     if (!isFirstValue) buffer_ += ',';
     buffer_ += '[' + std::to_string(sample.secondsInDay) + ',';
-    const std::string number = RealText(sample.value);
-    buffer_ += std::isfinite(sample.value) ? number : '"' + number + '"';
+    buffer_ += std::isfinite(sample.value) ? RealText(sample.value) : "null";
     buffer_ += ']';
   }
 
