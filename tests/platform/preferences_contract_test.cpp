@@ -4,6 +4,7 @@
 
 #include <array>
 #include <csignal>
+#include <filesystem>
 #include <thread>
 
 #include "fakes/fake_platform.h"
@@ -118,7 +119,10 @@ TEST_F(LinuxPreferencesTest, WhatCannotBeReadIsNeitherEmptyNorReplaced) {
   const std::string bytes = root.read(kFile);
   preferences = machine.startProcess();
   // A sanitizer that meets a type for the first time needs descriptors itself.
-  EXPECT_FALSE(ErrnoText(EMFILE).empty());
+  const std::string other = std::string(kDirectory) + "/other.plist";
+  std::filesystem::create_directory(root.path(other));
+  EXPECT_FALSE(preferences->isReadable("other"));
+  std::filesystem::remove(root.path(other));
   rlimit before{};
   getrlimit(RLIMIT_NOFILE, &before);
   const rlimit none{0, before.rlim_max};
