@@ -9,6 +9,7 @@
 
 #include "platform/linux/frame_buffer.h"
 #include "platform/linux/named_service.h"
+#include "platform/linux/paths.h"
 #include "platform/linux/services.h"
 #include "platform/linux/unix_socket.h"
 #include "values/property_list.h"

@@ -2,7 +2,6 @@
 
 #include <gtest/gtest.h>
 
-#include "fakes/fake_platform.h"
 
 namespace quorlet {
 namespace {
@@ -29,14 +28,6 @@ TEST(ListenerTest, OnlyNumbersMayBeMissing) {
   }
   EXPECT_TRUE(appInfoRecordFromMessage("x", records));
   EXPECT_EQ(records.size(), 1u) << "incomplete elements add nothing";
-}
-
-TEST(ListenerTest, WithoutAListenerOneQuietSliceIsWaitedOut) {
-  FakePlatform device;
-  device.namedService.canListen = false;
-  RunDriver driver(device.services);
-  Listener(device.services, driver).serve();
-  EXPECT_EQ(device.namedService.sliceSeconds, std::vector<double>{10.0});
 }
 
 }  // namespace

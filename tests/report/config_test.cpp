@@ -35,7 +35,8 @@ class ConfigTest : public testing::Test {
 };
 
 TEST_F(ConfigTest, ExactKeysComeBeforePrefixesAndLongPrefixesBeforeShortOnes) {
-  whitelist(Group("G", "ScalarKeys", {{"a.b.c", "sig_fig", "1"}}) +
+  whitelist(Group("G", "ScalarKeys", {{"a.b.c", "sig_fig", "1"}}) +  // replaces that of group F
+            Group("F", "ScalarKeys", {{"a.b.c", "sig_fig", "9"}}) +
             Group("H", "ScalarKeyPrefixes",
                   {{"a.", "sig_fig", "2"}, {"a.b.c.d", "sig_fig", "3"}, {"a.b", "sig_fig", "4"}}) +
             Group("I", "DistributionKeyPrefixes", {{"", "x", "9"}}));
@@ -47,12 +48,6 @@ TEST_F(ConfigTest, ExactKeysComeBeforePrefixesAndLongPrefixesBeforeShortOnes) {
   }
   EXPECT_TRUE(config.configOptionsForDistributionKey("anything")) << "an empty prefix matches all";
   EXPECT_EQ(device.log.at(LogLevel::kDebug).front(), "prefix match a. for a.x");
-}
-
-TEST_F(ConfigTest, LaterGroupsReplaceEarlierOnes) {
-  whitelist(Group("B", "ScalarKeys", {{"k", "sig_fig", "2"}}) +
-            Group("A", "ScalarKeys", {{"k", "sig_fig", "1"}}));
-  EXPECT_EQ(sigFig(load().configOptionsForScalarKey("k")), "2");
 }
 
 TEST_F(ConfigTest, TaskingSwitchesGroupsOff) {
