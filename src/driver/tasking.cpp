@@ -123,7 +123,8 @@ class TaskingUpdate {
     const auto stored = ownText(kTaskingID) ? own(kTaskingPayload) : std::nullopt;
     const Array* old = stored ? stored->asArray() : nullptr;
     const Array* payload = ArrayEntry(record, kTaskingPayload);
-    if (old != nullptr || payload != nullptr) {
+    // A run may also have been cut short with only its record left to remove.
+    if (old != nullptr || payload != nullptr || own(kTaskingInProgress)) {
       set(kTaskingInProgress, PropertyValue(record));
       platform_.preferences.DGWPreferencesSynchronize(kOwnDomain);
       const bool isWritten = writeDomains(old, payload);

@@ -86,13 +86,18 @@ TEST_F(TaskingTest, WithoutABuildATaskingNeverMatches) {
   EXPECT_EQ(update(), (Texts{"Tasking update (one -> one, (null) -> (null))", kPosted}));
 }
 
+struct Following {
+  std::optional<Array> second;
+  bool hasThird;
+};
+
 // What is durable after tasking "one", a run with tasking "two" that dies before its n-th change,
 // and another run, with tasking "three" when there is one. Somebody must hear of "two".
-FakePreferences::Disk AfterDeathBefore(int n, bool& died, bool hasThird) {
+FakePreferences::Disk AfterDeathBefore(int n, bool& died, const Following& following) {
   TaskedDevice tasked;
   tasked.schedule("one", Array{Entry("x", "a", "1"), Entry("y", "b", "1"), Entry(kOwn, "o", "1")});
   tasked.update();
-  tasked.schedule("two", Array{Entry("x", "c", "2"), Entry("aa", "a", "2"), Entry("y", "b", "2")});
+  tasked.schedule("two", following.second);
   FakePreferences& preferences = tasked.device.preferences;
   int left = n;
   const auto dieInTime = [&left] {
@@ -109,7 +114,7 @@ FakePreferences::Disk AfterDeathBefore(int n, bool& died, bool hasThird) {
   preferences.beforeChange = tasked.device.notifications.beforePosting = nullptr;
   preferences.crash();
   const std::size_t announced = tasked.device.notifications.posted.size();
-  if (hasThird) tasked.schedule("three", Array{Entry("z", "d", "3")});
+  if (following.hasThird) tasked.schedule("three", Array{Entry("z", "d", "3")});
   tasked.update();
   EXPECT_GE(announced + tasked.device.notifications.posted.size(), 1u)
       << "killed before change " << n;
@@ -120,11 +125,14 @@ FakePreferences::Disk AfterDeathBefore(int n, bool& died, bool hasThird) {
 }
 
 TEST_F(TaskingTest, ARunThatDiedIsBroughtToItsEndByTheNext) {
-  for (const bool hasThird : {false, true}) {
+  const Array two{Entry("x", "c", "2"), Entry("aa", "a", "2"), Entry("y", "b", "2")};
+  for (const Following& following :
+       {Following{two, false}, Following{two, true}, Following{std::nullopt, false},
+        Following{std::nullopt, true}}) {
     bool died = true;
-    const auto undisturbed = AfterDeathBefore(-1, died, hasThird);
+    const auto undisturbed = AfterDeathBefore(-1, died, following);
     for (int n = 0; died || n == 0; ++n) {
-      EXPECT_EQ(AfterDeathBefore(n, died, hasThird), undisturbed) << "killed before change " << n;
+      EXPECT_EQ(AfterDeathBefore(n, died, following), undisturbed) << "killed before change " << n;
       ASSERT_LT(n, 100);
     }
   }
