@@ -7,7 +7,7 @@
 #include <cstring>
 #include <vector>
 
-#include "channels/drvreport.h"
+#include "drvreport/drvreport.h"
 
 namespace quorlet::bench {
 namespace {

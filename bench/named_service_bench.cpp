@@ -7,11 +7,11 @@
 #include <filesystem>
 #include <thread>
 
-#include "platform/linux/frame_buffer.h"
-#include "platform/linux/named_service.h"
-#include "platform/linux/paths.h"
-#include "platform/linux/services.h"
-#include "platform/linux/unix_socket.h"
+#include "platform/linux/base/paths.h"
+#include "platform/linux/base/services.h"
+#include "platform/linux/service/frame_buffer.h"
+#include "platform/linux/service/services.h"
+#include "platform/linux/service/unix_socket.h"
 #include "values/property_list.h"
 
 namespace quorlet {

@@ -14,8 +14,8 @@
 #include <vector>
 
 #include "collectors/network_usage.h"
+#include "platform/linux/base/services.h"
 #include "platform/linux/linux_platform.h"
-#include "platform/linux/services.h"
 #include "platform/network_usage.h"
 
 namespace quorlet::bench {

@@ -6,7 +6,7 @@
 #include <string>
 #include <vector>
 
-#include "platform/linux/tally_ledger.h"
+#include "platform/linux/counters/tally_ledger.h"
 
 namespace quorlet::bench {
 

@@ -1,7 +1,7 @@
 // Any desktop file is one application or none, whatever its line ends and comments.
 #include "fakes/fake_system_log.h"
 #include "fuzz_support.h"
-#include "platform/linux/services.h"
+#include "platform/linux/device/services.h"
 
 namespace quorlet {
 namespace {

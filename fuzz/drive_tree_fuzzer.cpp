@@ -3,9 +3,9 @@
 
 #include "fakes/fake_system_log.h"
 #include "fuzz_support.h"
+#include "platform/linux/base/kernel_text.h"
 #include "platform/linux/drives/drive_figures.h"
 #include "platform/linux/drives/drive_reader.h"
-#include "platform/linux/kernel_text.h"
 
 namespace quorlet {
 namespace {

@@ -5,7 +5,7 @@
 
 #include "fakes/fake_platform.h"
 #include "fuzz_support.h"
-#include "platform/linux/driver_files.h"
+#include "platform/linux/registry/driver_files.h"
 #include "values/property_list.h"
 
 namespace quorlet {

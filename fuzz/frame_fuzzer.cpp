@@ -4,7 +4,7 @@
 #include <string>
 #include <vector>
 
-#include "platform/linux/frame_buffer.h"
+#include "platform/linux/service/frame_buffer.h"
 
 namespace {
 

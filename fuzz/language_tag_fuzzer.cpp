@@ -2,7 +2,7 @@
 #include <algorithm>
 
 #include "fuzz_support.h"
-#include "platform/linux/language_tag.h"
+#include "platform/linux/device/language_tag.h"
 
 namespace quorlet {
 namespace {

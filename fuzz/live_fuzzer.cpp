@@ -3,11 +3,11 @@
 #include <filesystem>
 #include <set>
 
-#include "channels/drvreport.h"
+#include "drvreport/drvreport.h"
 #include "fakes/fake_driver_registry.h"
 #include "fakes/fake_system_log.h"
 #include "fuzz_support.h"
-#include "platform/linux/kernel_text.h"
+#include "platform/linux/base/kernel_text.h"
 #include "platform/linux/live/live_source.h"
 #include "values/byte_reader.h"
 

@@ -4,9 +4,9 @@
 
 #include "fakes/fake_platform.h"
 #include "fuzz_support.h"
-#include "platform/linux/language_tag.h"
-#include "platform/linux/services.h"
-#include "platform/linux/shell_assignments.h"
+#include "platform/linux/base/shell_assignments.h"
+#include "platform/linux/device/language_tag.h"
+#include "platform/linux/device/services.h"
 #include "values/text.h"
 
 namespace quorlet {

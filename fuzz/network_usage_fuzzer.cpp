@@ -6,7 +6,7 @@
 #include "collectors/network_usage.h"
 #include "fakes/fake_platform.h"
 #include "fuzz_support.h"
-#include "platform/linux/network_usage.h"
+#include "platform/linux/network/network_usage.h"
 #include "values/property_list.h"
 
 namespace quorlet {

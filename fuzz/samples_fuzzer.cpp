@@ -7,7 +7,7 @@
 #include <string_view>
 #include <variant>
 
-#include "channels/drvreport.h"
+#include "drvreport/drvreport.h"
 #include "fakes/fake_driver_registry.h"
 #include "values/byte_reader.h"
 #include "values/property_list.h"

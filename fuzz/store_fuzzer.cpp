@@ -6,7 +6,7 @@
 
 #include "fakes/fake_platform.h"
 #include "fuzz_support.h"
-#include "platform/linux/counter_store.h"
+#include "platform/linux/counters/counter_store.h"
 
 namespace quorlet {
 namespace {

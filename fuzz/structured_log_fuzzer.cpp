@@ -5,7 +5,7 @@
 #include <algorithm>
 
 #include "fuzz_support.h"
-#include "platform/linux/structured_log.h"
+#include "platform/linux/logs/structured_log.h"
 
 namespace quorlet {
 namespace {

@@ -4,7 +4,7 @@
 #include <cstring>
 
 #include "fuzz_support.h"
-#include "platform/linux/tally_blocks.h"
+#include "platform/linux/counters/tally_blocks.h"
 
 namespace quorlet {
 namespace {

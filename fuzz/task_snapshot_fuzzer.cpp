@@ -2,7 +2,7 @@
 // takes.
 #include "fakes/fake_platform.h"
 #include "fuzz_support.h"
-#include "platform/linux/services.h"
+#include "platform/linux/device/services.h"
 #include "storage/vm_freezer.h"
 #include "values/byte_reader.h"
 
@@ -58,6 +58,7 @@ extern "C" int LLVMFuzzerTestOneInput(const std::uint8_t* data, std::size_t size
   CheckItems(*items);
   Expect(snapshot->CaptureTaskSnapshot(kTaskSnapshotTaggedItems) == items, "another one at once");
   platform.taskSnapshot.buffer = items;
-  Expect(!CopyVMFreezerNANDInfo(platform.services).empty(), "nothing can be read");
+  Expect(!CopyVMFreezerNANDInfo(platform.taskSnapshot, platform.standardError).empty(),
+         "nothing can be read");
   return 0;
 }

@@ -20,29 +20,7 @@ using Disk = FakePreferences::Disk;
 bool Run(const std::shared_ptr<Disk>& disk, int diesAt, std::vector<std::string>& posted) {
   FakePlatform platform;
   FakePreferences preferences(disk, &platform.log);
-  Platform services{platform.log,
-                    platform.clock,
-                    preferences,
-                    platform.counterStore,
-                    platform.diagnostics,
-                    platform.crashSupport,
-                    platform.supportLibrary,
-                    platform.deviceInfo,
-                    platform.osVersion,
-                    platform.kernelParameters,
-                    platform.environment,
-                    platform.queries,
-                    platform.applications,
-                    platform.locale,
-                    platform.passLock,
-                    platform.namedService,
-                    platform.notifications,
-                    platform.networkUsage,
-                    platform.semaphores,
-                    platform.drives,
-                    platform.driverRegistry,
-                    platform.taskSnapshot,
-                    platform.standardError};
+  Platform services = platform.services.with({.preferences = &preferences});
   int changes = 0;
   if (diesAt >= 0) {
     preferences.beforeChange = [&] {

@@ -30,7 +30,7 @@ void ReadTelemetry(FakePlatform& platform, std::span<const std::byte> bytes) {
       {"manufacturer-id", std::string(reinterpret_cast<const char*>(text.data()), text.size())},
       {"num-bus", Int64(channels)}};
   const auto list = reader.take(reader.remaining());
-  LogTelemetryList(platform.services, list, characteristics);
+  LogTelemetryList(platform.crashSupport, platform.standardError, list, characteristics);
   if (platform.crashSupport.entries.size() > list.size() / 4128) std::abort();
 }
 
@@ -53,7 +53,8 @@ void ReadOne(std::uint8_t which, std::span<const std::byte> bytes) {
       break;
     case 3:
       platform.taskSnapshot.buffer = Data(bytes.begin(), bytes.end());
-      if (CopyVMFreezerNANDInfo(platform.services).empty()) std::abort();
+      if (CopyVMFreezerNANDInfo(platform.taskSnapshot, platform.standardError).empty())
+        std::abort();
       break;
   }
 }

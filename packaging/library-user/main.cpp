@@ -1,6 +1,6 @@
 // Samples the channels of a root twice and shows the first difference.
-#include <channels/drvreport.h>
-#include <platform/linux/machine_registry.h>
+#include <drvreport/drvreport.h>
+#include <drvreport/machine_registry.h>
 
 #include <iostream>
 

@@ -73,6 +73,18 @@ std::uint16_t DrvReportChannelGetCategories(const Dictionary& channel) {
   return getChannelType(channel, type) == kKernelSuccess ? categoriesOfType(type) : 0xFFFF;
 }
 
+std::uint16_t DrvReportChannelGetElementCount(const Dictionary& channel) {
+  std::uint64_t type = 0;
+  return getChannelType(channel, type) == kKernelSuccess ? elementCountOfType(type)
+                                                         : std::uint16_t{0};
+}
+
+std::uint16_t DrvReportSampleGetElementCount(const Dictionary& sample) {
+  const Data* records = DataEntry(sample, kRawElementsKey);
+  const std::size_t count = records != nullptr ? records->size() / kRawElementSize : 0;
+  return static_cast<std::uint16_t>(std::min(count, kMaxElementCount));
+}
+
 const std::string* DrvReportChannelGetGroup(const Dictionary& channel) {
   return StringEntry(channel, kGroupNameKey);
 }

@@ -8,7 +8,8 @@
 #include <string>
 #include <string_view>
 
-#include "channels/drvreport.h"
+#include "drvreport/drvreport.h"
+#include "platform/report_records.h"
 
 namespace quorlet {
 
@@ -23,18 +24,6 @@ inline constexpr std::string_view kQueryOptsKey = "QueryOpts";
 inline constexpr std::string_view kChannelsKey = "DrvReportChannels";
 inline constexpr std::string_view kDriversKey = "DrvReportDrivers";
 inline constexpr std::string_view kGroupsKey = "DrvReportChannelGroups";
-
-// A raw element record: u64 driver ID, channel ID, type word, time stamp of the last update, and
-// four values; little-endian.
-inline constexpr std::size_t kRawElementSize = 64;
-inline constexpr std::size_t kRawElementChannelOffset = 8;
-inline constexpr std::size_t kRawElementTypeOffset = 16;
-inline constexpr std::size_t kRawElementTimeOffset = 24;
-inline constexpr std::size_t kRawElementValuesOffset = 32;
-
-constexpr std::uint8_t formatOfType(std::uint64_t type) { return type & 0xFF; }
-constexpr std::uint16_t categoriesOfType(std::uint64_t type) { return (type >> 16) & 0xFFFF; }
-constexpr std::uint16_t elementCountOfType(std::uint64_t type) { return (type >> 32) & 0xFFFF; }
 
 // kKernelError, and nothing written, when the channel has no type word that is a number.
 KernelReturn getChannelType(const Dictionary& channel, std::uint64_t& type);

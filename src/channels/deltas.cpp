@@ -8,6 +8,7 @@
 
 #include "channels/value_accessors.h"
 #include "channels/walk.h"
+#include "values/byte_writer.h"
 
 namespace quorlet {
 namespace {
@@ -46,9 +47,8 @@ class ResultRun {
   void set(std::size_t index, const ElementValues& values) {
     std::byte* slot = records_.data() + index * kRawElementSize + kRawElementValuesOffset;
     for (const std::int64_t value : values) {
-      const auto bits = static_cast<std::uint64_t>(value);
-      for (unsigned shift = 0; shift < 64; shift += 8)
-        *slot++ = static_cast<std::byte>(bits >> shift);
+      WriteLittle(static_cast<std::uint64_t>(value), std::span(slot, sizeof value));
+      slot += sizeof value;
     }
   }
 

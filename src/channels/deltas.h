@@ -4,7 +4,7 @@
 
 #include <optional>
 
-#include "channels/drvreport.h"
+#include "drvreport/drvreport.h"
 
 namespace quorlet {
 

@@ -9,9 +9,9 @@
 #include <cstdarg>
 #include <cstdio>
 
-#include "channels/drvreport.h"
 #include "channels/units.h"
 #include "channels/value_accessors.h"
+#include "drvreport/drvreport.h"
 #include "values/text.h"
 
 namespace quorlet {

@@ -7,6 +7,7 @@
 #include "channels/channel.h"
 #include "channels/walk.h"
 #include "values/byte_reader.h"
+#include "values/byte_writer.h"
 
 namespace quorlet {
 
@@ -40,29 +41,14 @@ class DrvReportSubscription {
 
 namespace {
 
-enum Method : std::uint32_t {
-  kDrvReportUserClientOpen = 0,
-  kDrvReportUserClientConfigureInterests = 2,
-  kDrvReportUserClientUpdateKernelBuffer = 3
-};
-
-constexpr std::size_t kInterestBytes = 24;
-constexpr std::size_t kInterestListHeaderBytes = 8;
 // So that the list stays below 2^31 bytes.
 constexpr std::size_t kMostInterests = 89'478'477;
 
-void AppendLittle(Data& data, std::uint64_t number, std::size_t width) {
-  for (std::size_t i = 0; i < width; ++i) {
-    data.push_back(static_cast<std::byte>((number >> (8 * i)) & 0xFF));
-  }
-}
-
-// u32 count, 4 bytes of 0, and for each channel u64 driver ID, channel ID and type word.
 std::optional<Data> createInterestList(const Dictionary& desired, std::size_t count) {
   if (count > kMostInterests) return std::nullopt;
-  Data list;
+  ByteWriter list;
   list.reserve(kInterestListHeaderBytes + count * kInterestBytes);
-  AppendLittle(list, count, kInterestListHeaderBytes);
+  list.u64(count);
   const int result = DrvReportIterate(desired, [&list](Dictionary& channel) {
     const std::int64_t driverID = DrvReportChannelGetDriverID(channel);
     const std::int64_t channelID = DrvReportChannelGetChannelID(channel);
@@ -71,13 +57,13 @@ std::optional<Data> createInterestList(const Dictionary& desired, std::size_t co
         getChannelType(channel, type) != kKernelSuccess) {
       return 1;
     }
-    AppendLittle(list, static_cast<std::uint64_t>(driverID), 8);
-    AppendLittle(list, static_cast<std::uint64_t>(channelID), 8);
-    AppendLittle(list, type, 8);
+    list.u64(static_cast<std::uint64_t>(driverID))
+        .u64(static_cast<std::uint64_t>(channelID))
+        .u64(type);
     return 0;
   });
   const bool isFilled = list.size() == kInterestListHeaderBytes + count * kInterestBytes;
-  return result == 0 && isFilled ? std::optional(list) : std::nullopt;
+  return result == 0 && isFilled ? std::optional(list.take()) : std::nullopt;
 }
 
 // The runs of a buffer, found by their IDs. What it finds is what a search from the start would:

@@ -11,7 +11,7 @@
 #include <optional>
 #include <string>
 
-#include "channels/drvreport.h"
+#include "drvreport/drvreport.h"
 
 namespace quorlet {
 

@@ -8,7 +8,7 @@
 #include <optional>
 
 #include "channels/channel.h"
-#include "channels/drvreport.h"
+#include "drvreport/drvreport.h"
 #include "values/byte_reader.h"
 
 namespace quorlet {

@@ -44,21 +44,20 @@ class PartnerSearch {
   // False when a candidate is malformed. Without a partner, `partner` is nullptr.
   bool find(const PropertyValue& channel, std::size_t index, const Dictionary*& partner) {
     partner = nullptr;
-    if (index >= partners_.size()) return true;
     const auto wanted = IdentityOf(channel);
-    auto candidate = IdentityOf(partners_[index]);
-    if (!wanted || !candidate) return false;
-    std::size_t found = index;
-    if (candidate != wanted) {
-      const std::size_t start = hint_.value_or(index + 1);
-      hint_ = start;
-      if (!isIndexed_) buildIndex();
-      found = firstFrom(start, places_[*wanted]);
-      if (firstFrom(start, malformed_) < found) return false;
-      if (found == kNowhere) return true;
-      hint_ = found + 1;
+    std::size_t found = kNowhere;
+    if (index < partners_.size()) {
+      const auto candidate = IdentityOf(partners_[index]);
+      if (!wanted || !candidate) return false;
+      if (candidate == wanted) {
+        found = index;
+      } else if (!findForward(*wanted, index, found)) {
+        return false;
+      }
     }
-    partner = partners_[found].asDictionary();
+    // One that the search has passed: channels were missing before it, or stood in another order.
+    if (found == kNowhere && wanted) found = firstFrom(0, places(*wanted));
+    if (found != kNowhere) partner = partners_[found].asDictionary();
     return true;
   }
 
@@ -71,12 +70,25 @@ class PartnerSearch {
     return found != places.end() ? *found : kNowhere;
   }
 
-  void buildIndex() {
-    isIndexed_ = true;
-    for (std::size_t i = 0; i < partners_.size(); ++i) {
-      const auto identity = IdentityOf(partners_[i]);
-      (identity ? places_[*identity] : malformed_).push_back(i);
+  // False when a malformed candidate comes first.
+  bool findForward(const Identity& wanted, std::size_t index, std::size_t& found) {
+    const std::size_t start = hint_.value_or(index + 1);
+    hint_ = start;
+    found = firstFrom(start, places(wanted));
+    if (firstFrom(start, malformed_) < found) return false;
+    if (found != kNowhere) hint_ = found + 1;
+    return true;
+  }
+
+  const Places& places(const Identity& wanted) {
+    if (!isIndexed_) {
+      isIndexed_ = true;
+      for (std::size_t i = 0; i < partners_.size(); ++i) {
+        const auto identity = IdentityOf(partners_[i]);
+        (identity ? places_[*identity] : malformed_).push_back(i);
+      }
     }
+    return places_[wanted];
   }
 
   const Array& partners_;
@@ -124,15 +136,18 @@ class Walk {
  public:
   explicit Walk(const WalkContext& context)
       : context_(context),
-        isPruning_(!context.iterate && context.prune),
-        isCloning_(!context.iterate && !context.prune && context.clone),
-        isComparing_(!context.iterate && !context.prune && !context.clone && context.compare) {}
+        mode_(context.iterate   ? Mode::kIterate
+              : context.prune   ? Mode::kPrune
+              : context.clone   ? Mode::kClone
+              : context.compare ? Mode::kCompare
+                                : Mode::kNone) {}
 
   // `aggregate` is a handle: pruning changes what the caller has.
   int run(Dictionary aggregate, const Dictionary* partner, std::optional<Dictionary>* out,
           int level) const {
-    if (level > kDeepestLevel || (isComparing_ && partner == nullptr)) return kDrvReportWalkFailed;
-    if (!isComparing_) partner = nullptr;
+    const bool isComparing = mode_ == Mode::kCompare;
+    if (level > kDeepestLevel || (isComparing && partner == nullptr)) return kDrvReportWalkFailed;
+    if (!isComparing) partner = nullptr;
     std::optional<Dictionary> made;
     if (isMaking()) made.emplace();
     int result = walkChannels(aggregate, partner, made);
@@ -148,7 +163,10 @@ class Walk {
   }
 
  private:
-  bool isMaking() const { return isCloning_ || isComparing_; }
+  enum class Mode : std::uint8_t { kNone, kIterate, kPrune, kClone, kCompare };
+
+  bool isMaking() const { return mode_ == Mode::kClone || mode_ == Mode::kCompare; }
+  bool isPruning() const { return mode_ == Mode::kPrune; }
 
   int walkChannels(Dictionary& aggregate, const Dictionary* partner,
                    std::optional<Dictionary>& made) const {
@@ -165,19 +183,21 @@ class Walk {
     PartnerSearch search(partners != nullptr ? *partners : none);
     std::vector<std::size_t> removed;
     int result = 0;
-    for (std::size_t i = 0; i < channels.size(); ++i) {
+    // Read once: a visitor may add to the array that it visits.
+    const std::size_t count = channels.size();
+    for (std::size_t i = 0; i < std::min(count, channels.size()); ++i) {
       const int one = visit(channels[i], i, search, newChannels);
       if ((one & kFailureBit) != 0) {
         result = one;
         break;
       }
       result |= one;
-      if (isPruning_ && one == kDrvReportLeaveOut) removed.push_back(i);
+      if (isPruning() && one == kDrvReportLeaveOut) removed.push_back(i);
     }
     Remove(removed, channels);
     if ((result & kFailureBit) != 0) return result;
     if (made) (*made)[kChannelsKey] = newChannels;
-    if (isPruning_ && channels.empty()) aggregate.remove(kChannelsKey);
+    if (isPruning() && channels.empty()) aggregate.remove(kChannelsKey);
     return result;
   }
 
@@ -185,17 +205,24 @@ class Walk {
             Array& newChannels) const {
     Dictionary* channel = value.asDictionary();
     if (channel == nullptr) return kDrvReportWalkFailed;
-    if (context_.iterate) return context_.iterate(*channel);
-    if (isPruning_) return context_.prune(*channel);
-    if (!isMaking()) return kDrvReportWalkFailed;
-    Dictionary newChannel = channel->shallowCopy();
+    Dictionary newChannel;
     int result = 0;
-    if (isCloning_) {
-      result = context_.clone(*channel, newChannel);
-    } else {
-      const Dictionary* partner = nullptr;
-      if (!search.find(value, index, partner)) return kDrvReportWalkFailed;
-      if (partner != nullptr) {
+    switch (mode_) {
+      case Mode::kNone:
+        return kDrvReportWalkFailed;
+      case Mode::kIterate:
+        return context_.iterate(*channel);
+      case Mode::kPrune:
+        return context_.prune(*channel);
+      case Mode::kClone:
+        newChannel = channel->shallowCopy();
+        result = context_.clone(*channel, newChannel);
+        break;
+      case Mode::kCompare: {
+        newChannel = channel->shallowCopy();
+        const Dictionary* partner = nullptr;
+        if (!search.find(value, index, partner)) return kDrvReportWalkFailed;
+        if (partner == nullptr) break;
         if (!TakeInvalidRecords(*partner, newChannel)) return kDrvReportWalkFailed;
         result = context_.compare(*partner, *channel, newChannel);
       }
@@ -226,19 +253,17 @@ class Walk {
       if ((one & kFailureBit) != 0) return one;
       result = result.value_or(0) | one;
       if (newSub) newEntries[name] = *newSub;
-      if (isPruning_ && sub->empty()) emptied.push_back(name);
+      if (isPruning() && sub->empty()) emptied.push_back(name);
     }
     if (!result) return kDrvReportWalkFailed;
     for (const std::string& name : emptied) entries.remove(name);
     if (made) (*made)[key] = newEntries;
-    if (isPruning_ && entries.empty()) aggregate.remove(key);
+    if (isPruning() && entries.empty()) aggregate.remove(key);
     return *result;
   }
 
   const WalkContext& context_;
-  const bool isPruning_;
-  const bool isCloning_;
-  const bool isComparing_;
+  const Mode mode_;
 };
 
 }  // namespace

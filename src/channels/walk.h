@@ -5,7 +5,7 @@
 #include <functional>
 #include <optional>
 
-#include "channels/drvreport.h"
+#include "drvreport/drvreport.h"
 
 namespace quorlet {
 

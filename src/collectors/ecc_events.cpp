@@ -42,8 +42,7 @@ Dictionary EntryFromRecord(const Record& record) {
 
 }  // namespace
 
-void logECCEvents(Platform& platform) {
-  KernelParameters& kernel = platform.kernelParameters;
+void logECCEvents(KernelParameters& kernel, CrashSupport& support, SystemLog& log) {
   // Events that an earlier pass in this process could not log are still there.
   kernel.returnTaken(kParameter);
   std::vector<Dictionary> entries;
@@ -55,14 +54,13 @@ void logECCEvents(Platform& platform) {
     const int error = kernel.sysctlbyname(kParameter, buffer, length);
     if (error == ENOENT || error == EBUSY) break;
     if (error != 0) {
-      platform.log.log("Unexpected errno (%d) reading ECC events from kernel", error);
+      log.log("Unexpected errno (%d) reading ECC events from kernel", error);
       break;
     }
     entries.push_back(EntryFromRecord(record));
   }
   if (entries.empty()) return;
   // Removed once they are durable: a kill between the two logs them twice, but loses none.
-  CrashSupport& support = platform.crashSupport;
   if (support.logEntries(kStructuredLogType, entries) && support.syncStructuredData()) {
     kernel.removeTaken(kParameter);
   }

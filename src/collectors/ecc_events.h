@@ -2,7 +2,9 @@
 #ifndef QUORLET_COLLECTORS_ECC_EVENTS_H_
 #define QUORLET_COLLECTORS_ECC_EVENTS_H_
 
-#include "platform/platform.h"
+#include "platform/crash_support.h"
+#include "platform/kernel_parameters.h"
+#include "platform/system_log.h"
 
 namespace quorlet {
 
@@ -10,7 +12,7 @@ namespace quorlet {
 // durable, takes them off the queue; the rest waits for the next pass, as do all of them when the
 // log cannot be written. One line in the system log when reading fails otherwise than for want of
 // an event.
-void logECCEvents(Platform& platform);
+void logECCEvents(KernelParameters& kernel, CrashSupport& support, SystemLog& log);
 
 }  // namespace quorlet
 

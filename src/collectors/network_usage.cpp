@@ -21,7 +21,7 @@
 #include <variant>
 #include <vector>
 
-#include "platform/run_step.h"
+#include "collectors/run_step.h"
 #include "values/digest.h"
 #include "values/property_list.h"
 

@@ -5,10 +5,10 @@
 #include <optional>
 #include <vector>
 
+#include "drvreport/property_value.h"
 #include "platform/counter_store.h"
 #include "platform/platform.h"
 #include "platform/preferences.h"
-#include "values/property_value.h"
 
 namespace quorlet {
 

@@ -1,12 +1,11 @@
 #include "collectors/reporting_channels.h"
 
-#include "channels/drvreport.h"
+#include "drvreport/drvreport.h"
+#include "platform/report_records.h"
 #include "values/text.h"
 
 namespace quorlet {
 namespace {
-
-constexpr std::uint64_t kDailyCategory = 0x100;
 
 int keepSimpleChannels(Dictionary& channel) {
   return DrvReportChannelGetFormat(channel) == kDrvReportFormatSimple ? 0 : kDrvReportLeaveOut;

@@ -2,8 +2,8 @@
 #ifndef QUORLET_COLLECTORS_REPORTING_CHANNELS_H_
 #define QUORLET_COLLECTORS_REPORTING_CHANNELS_H_
 
+#include "drvreport/driver_registry.h"
 #include "platform/counter_store.h"
-#include "platform/driver_registry.h"
 
 namespace quorlet {
 

@@ -14,14 +14,6 @@ namespace quorlet {
 namespace {
 
 constexpr std::int32_t kValuesPerRecord = 4;
-constexpr std::size_t kRecordBytes = 64;
-
-// As the type word has it; 0 when there is none.
-std::int32_t ElementCount(const Dictionary& channel) {
-  const Array* legend = ArrayEntry(channel, "LegendChannel");
-  const Number* type = legend != nullptr && legend->size() > 1 ? (*legend)[1].asNumber() : nullptr;
-  return type != nullptr ? static_cast<std::int32_t>((type->toInt64() >> 32) & 0xFFFF) : 0;
-}
 
 std::string Decimals(double number, int count) {
   std::array<char, 400> text{};  // the largest double has 309 digits
@@ -110,13 +102,8 @@ std::vector<Bucket> Buckets(Dictionary& sample) {
   return buckets;
 }
 
-std::size_t RecordCount(const Dictionary& sample) {
-  const Data* records = DataEntry(sample, "RawElements");
-  return std::min<std::size_t>(records != nullptr ? records->size() / kRecordBytes : 0, 0xFFFF);
-}
-
 std::int32_t ArrayValueCount(const Dictionary& sample) {
-  return static_cast<std::int32_t>(RecordCount(sample)) * kValuesPerRecord;
+  return DrvReportSampleGetElementCount(sample) * kValuesPerRecord;
 }
 
 Array DescribeStates(const std::vector<State>& states) {
@@ -160,6 +147,22 @@ std::vector<std::string> ArrayLines(Dictionary& sample, std::string_view prefix)
       line += value == kDrvReportInvalidValue ? " -" : " " + std::to_string(value);
     }
     lines.push_back(line + " " + Escape(unit) + " }");
+  }
+  return lines;
+}
+
+// Of a histogram that the library does not describe, since some buckets have no bounds.
+std::vector<std::string> BucketLines(Dictionary& sample, std::string_view prefix) {
+  std::vector<std::string> lines;
+  if (DrvReportChannelGetFormat(sample) != kDrvReportFormatHistogram) return lines;
+  const std::string unit = TextOr(DrvReportChannelGetUnitLabel(sample), "(null)");
+  const auto bound = [](const std::optional<std::int64_t>& value) {
+    return RightAligned(value ? std::to_string(*value) : "?", 12);
+  };
+  for (const Bucket& bucket : Buckets(sample)) {
+    const std::string range = bound(bucket.lower) + " - " + bound(bucket.upper) + " " + unit;
+    lines.push_back(std::string(prefix) + RightAligned(Escape(Title(sample)), 20) + "[" +
+                    Escape(range) + "] = { # " + std::to_string(bucket.hits) + " }");
   }
   return lines;
 }
@@ -217,6 +220,9 @@ std::vector<std::string> SimpleRow(Dictionary& sample, Dictionary& delta, double
                                    std::size_t columns) {
   const std::int64_t now = DrvReportSimpleGetIntegerValue(sample);
   const std::int64_t change = DrvReportSimpleGetIntegerValue(delta);
+  if (now == kDrvReportInvalidValue || change == kDrvReportInvalidValue) {
+    return {std::string(FitColumns(NoteLine(sample, "", "unreadable"), columns))};
+  }
   const std::string unit = Escape(TextOr(DrvReportChannelGetUnitLabel(sample), ""));
   const auto number = static_cast<double>(change);
   const std::string suffix = unit == "events" || unit.empty() ? "" : " " + unit;
@@ -250,7 +256,7 @@ Dictionary DescribeChannel(Dictionary& channel) {
       {"id", Hexadecimal(static_cast<std::uint64_t>(DrvReportChannelGetChannelID(channel)))},
       {"format", FormatName(DrvReportChannelGetFormat(channel))},
       {"categories", Int32(DrvReportChannelGetCategories(channel))},
-      {"elements", Int32(ElementCount(channel))}};
+      {"elements", Int32(DrvReportChannelGetElementCount(channel))}};
   const std::uint64_t unit = DrvReportChannelGetUnit(channel);
   if (unit != static_cast<std::uint64_t>(kDrvReportInvalidValue)) {
     described["unit"] = Hexadecimal(unit);
@@ -289,7 +295,9 @@ Dictionary DescribeValues(Dictionary& sample) {
       Array values;
       const std::int32_t count = ArrayValueCount(sample);
       for (std::int32_t i = 0; i < count; ++i) {
-        values.push_back(Int64(DrvReportArrayGetValueAtIndex(sample, i)));
+        const std::int64_t value = DrvReportArrayGetValueAtIndex(sample, i);
+        values.push_back(value == kDrvReportInvalidValue ? PropertyValue("unreadable")
+                                                         : Int64(value));
       }
       described["values"] = values;
       break;
@@ -304,16 +312,25 @@ std::vector<std::string> SampleLines(Dictionary& sample, std::string_view prefix
                                      std::size_t barWidth) {
   const std::uint8_t format = DrvReportChannelGetFormat(sample);
   if (format == kDrvReportFormatArray) return ArrayLines(sample, prefix);
-  const auto description = DrvReportSampleCopyDescription(sample, 0, prefix);
-  if (!description) {
-    return {std::string(prefix) + RightAligned(Escape(Title(sample)), 32) + " = { unreadable }"};
-  }
   std::vector<State> states;
-  if (format == kDrvReportFormatState && barWidth != 0) states = States(sample);
+  if (format == kDrvReportFormatState) states = States(sample);
+  const bool isReadable = format == kDrvReportFormatState ? !states.empty()
+                          : format == kDrvReportFormatSimple
+                              ? DrvReportSimpleGetIntegerValue(sample) != kDrvReportInvalidValue
+                              : true;
+  const auto description =
+      isReadable ? DrvReportSampleCopyDescription(sample, 0, prefix) : std::nullopt;
+  if (!description) {
+    auto lines = BucketLines(sample, prefix);
+    if (lines.empty()) lines.push_back(NoteLine(sample, prefix, "unreadable"));
+    return lines;
+  }
+  if (barWidth == 0) states.clear();
   std::vector<std::string> lines;
   // A name may hold line ends; it is in the line of each record.
   const auto ends = static_cast<std::size_t>(std::ranges::count(*description, '\n'));
-  const std::size_t endsOfRecord = ends / std::max<std::size_t>(RecordCount(sample), 1);
+  const std::size_t endsOfRecord =
+      ends / std::max<std::size_t>(DrvReportSampleGetElementCount(sample), 1);
   std::string_view rest = *description;
   while (!rest.empty()) {
     std::size_t end = rest.find('\n');
@@ -324,6 +341,25 @@ std::vector<std::string> SampleLines(Dictionary& sample, std::string_view prefix
     rest.remove_prefix(std::min(rest.size(), end + 1));
   }
   return lines;
+}
+
+std::string NoteLine(Dictionary& sample, std::string_view prefix, std::string_view note) {
+  return std::string(prefix) + RightAligned(Escape(Title(sample)), 32) + " = { " +
+         std::string(note) + " }";
+}
+
+bool HasRestarted(Dictionary& delta) {
+  switch (DrvReportChannelGetFormat(delta)) {
+    case kDrvReportFormatState:
+      return std::ranges::any_of(States(delta), [](const State& state) {
+        return state.transitions < 0 || state.residency < 0;
+      });
+    case kDrvReportFormatHistogram:
+      return std::ranges::any_of(Buckets(delta),
+                                 [](const Bucket& bucket) { return bucket.hits < 0; });
+    default:
+      return false;  // simple values may fall
+  }
 }
 
 std::string TableHeader(std::size_t columns) {

@@ -8,7 +8,7 @@
 #include <string_view>
 #include <vector>
 
-#include "channels/drvreport.h"
+#include "drvreport/drvreport.h"
 
 namespace quorlet {
 
@@ -27,6 +27,12 @@ Dictionary DescribeValues(Dictionary& sample);
 // record. With `barWidth` each state's line ends with its share as a bar.
 std::vector<std::string> SampleLines(Dictionary& sample, std::string_view prefix,
                                      std::size_t barWidth);
+
+// A line that says of a channel what cannot be said in numbers: "unreadable", "restarted".
+std::string NoteLine(Dictionary& sample, std::string_view prefix, std::string_view note);
+
+// Whether the counters of states or buckets have begun anew between the two samples.
+bool HasRestarted(Dictionary& delta);
 
 // Lines of a table that fit `columns`: what has changed in `seconds`, and what holds now. States
 // and buckets have their shares as bars.

@@ -6,13 +6,14 @@
 #include <map>
 #include <memory>
 
-#include "channels/drvreport.h"
 #include "ctl/channel_view.h"
 #include "ctl/json_value.h"
 #include "ctl/metrics_text.h"
 #include "ctl/options.h"
 #include "ctl/session.h"
 #include "ctl/terminal.h"
+#include "drvreport/drvreport.h"
+#include "values/digits.h"
 
 namespace quorlet {
 namespace {
@@ -30,9 +31,10 @@ struct Selection {
   std::optional<std::string> group;
   std::optional<std::string> subgroup;
   std::optional<std::uint64_t> unit;
+  std::optional<std::string> unitLabel;
   std::optional<std::uint64_t> id;
 
-  bool matches(const Dictionary& channel) const {
+  bool matches(Dictionary& channel) const {
     const auto is = [](const std::string* text, const std::optional<std::string>& wanted) {
       return !wanted || (text != nullptr && *text == *wanted);
     };
@@ -41,6 +43,7 @@ struct Selection {
            is(DrvReportChannelGetGroup(channel), group) &&
            is(DrvReportChannelGetSubGroup(channel), subgroup) &&
            (!unit || DrvReportChannelGetUnit(channel) == *unit) &&
+           is(unitLabel ? DrvReportChannelGetUnitLabel(channel) : nullptr, unitLabel) &&
            (!id || static_cast<std::uint64_t>(DrvReportChannelGetChannelID(channel)) == *id);
   }
 };
@@ -69,7 +72,7 @@ Dictionary Select(DriverRegistry& registry, const Selection& selection) {
   std::optional<ErrorValue> error;
   auto channels = DrvReportCopyAllChannels(registry, kDrvReportLogFailures, &error);
   if (!channels) Fail("cannot look for channels", error);
-  const int pruned = DrvReportPrune(*channels, [&](const Dictionary& channel) {
+  const int pruned = DrvReportPrune(*channels, [&](Dictionary& channel) {
     return selection.matches(channel) ? 0 : kDrvReportLeaveOut;
   });
   if ((pruned & 1) != 0) Fail("cannot look through the channels", error);
@@ -189,6 +192,7 @@ void Sample(Session& session, const ChannelsArguments& arguments) {
 struct Change {
   Dictionary now;
   Dictionary delta;
+  bool hasRestarted = false;
 };
 
 // Pair by pair: one that cannot be subtracted costs no other. What was not there before has not
@@ -204,7 +208,9 @@ std::vector<Change> Changes(const Moment& earlier, const Moment& later) {
     const auto partner = before.find(key(sample));
     if (partner == before.end()) continue;
     auto delta = DrvReportSampleCreateDelta(partner->second, sample);
-    if (delta) changes.push_back({sample, *std::move(delta)});
+    if (!delta) continue;
+    const bool hasRestarted = HasRestarted(*delta);
+    changes.push_back({sample, *std::move(delta), hasRestarted});
   }
   return changes;
 }
@@ -246,9 +252,14 @@ class Watch {
     } else {
       const std::string prefix = sampler_.timeText() + " ";
       for (Change& change : changes) {
-        for (const std::string& line : SampleLines(change.delta, prefix, 0)) out_.line(line);
+        for (const std::string& line : lines(change, prefix)) out_.line(line);
       }
     }
+  }
+
+  static std::vector<std::string> lines(Change& change, std::string_view prefix) {
+    if (change.hasRestarted) return {NoteLine(change.now, prefix, "restarted")};
+    return SampleLines(change.delta, prefix, 0);
   }
 
   void showJson(std::vector<Change>& changes, double seconds) {
@@ -256,7 +267,11 @@ class Watch {
     for (Change& change : changes) {
       Dictionary described = DescribeChannel(change.now);
       Merge(DescribeValues(change.now), described);
-      described["delta"] = DescribeValues(change.delta);
+      if (change.hasRestarted) {
+        described["restarted"] = true;
+      } else {
+        described["delta"] = DescribeValues(change.delta);
+      }
       channels.push_back(described);
     }
     out_.line(JsonText(
@@ -269,6 +284,10 @@ class Watch {
                                         std::size_t columns) {
     std::vector<std::string> rows = {TableHeader(columns)};
     for (Change& change : changes) {
+      if (change.hasRestarted) {
+        rows.emplace_back(FitColumns(NoteLine(change.now, "", "restarted"), columns));
+        continue;
+      }
       std::ranges::move(TableRows(change.now, change.delta, seconds, columns),
                         std::back_inserter(rows));
     }
@@ -311,11 +330,22 @@ class Watch {
 template <std::unsigned_integral T>
 std::optional<T> ParseCode(std::string_view text) {
   if (!text.starts_with("0x") && !text.starts_with("0X")) return ParseNumber<T>(text);
-  T code{};
-  const char* end = text.data() + text.size();
-  const auto [stopped, error] = std::from_chars(text.data() + 2, end, code, 16);
-  if (error != std::errc{} || stopped != end) return std::nullopt;
-  return code;
+  return ParseNumber<T>(text.substr(2), 16);
+}
+
+// What is meant as a number, and so no text.
+bool LooksLikeNumber(std::string_view text) {
+  return text.empty() || text.starts_with('-') || text.starts_with("0x") || text.starts_with("0X");
+}
+
+// A number, or up to eight characters, which are its bytes.
+std::optional<std::uint64_t> ParseID(const std::string& text) {
+  if (const auto code = ParseCode<std::uint64_t>(text)) return code;
+  const bool isText = text.size() <= 8 && PrintableAsciiPrefix(text) == text.size();
+  if (!isText || LooksLikeNumber(text)) return std::nullopt;
+  std::uint64_t id = 0;
+  for (const char c : text) id = id << 8 | static_cast<unsigned char>(c);
+  return id;
 }
 
 std::optional<std::uint8_t> ParseFormat(const std::string& text) {
@@ -345,10 +375,20 @@ void AddSelection(CLI::App& command, Selection& selection) {
   command.add_option("--group", selection.group, "Only channels of this group")->type_name("G");
   command.add_option("--subgroup", selection.subgroup, "Only channels of this subgroup")
       ->type_name("S");
-  AddParsed(command, "--unit", "U", "Only channels with this unit code", selection.unit,
-            ParseCode<std::uint64_t>);
-  AddParsed(command, "--id", "N", "Only channels with this ID", selection.id,
-            ParseCode<std::uint64_t>);
+  command
+      .add_option_function<std::string>(
+          "--unit",
+          [&selection](const std::string& text) {
+            selection.unit = ParseCode<std::uint64_t>(text);
+            if (selection.unit) return;
+            if (LooksLikeNumber(text)) throw CLI::ValidationError("--unit", "not a unit: " + text);
+            selection.unitLabel = text;
+          },
+          "Only channels with this unit: a label, such as ms, or a code")
+      ->type_name("U");
+  AddParsed(command, "--id", "N",
+            "Only channels with this ID: a number, or the text that it prints", selection.id,
+            ParseID);
 }
 
 constexpr char kSelectionNotes[] =

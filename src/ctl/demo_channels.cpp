@@ -4,6 +4,8 @@
 
 #include "ctl/demo_bytes.h"
 #include "ctl/demo_drivers.h"
+#include "platform/report_records.h"
+#include "values/byte_writer.h"
 
 namespace quorlet {
 namespace {
@@ -11,20 +13,16 @@ namespace {
 constexpr std::int64_t kHubId = 0x100;
 constexpr std::uint64_t kNetworkId = 0x1001;
 
-enum Format : std::uint64_t { kSimple = 1, kState = 2, kHistogram = 3 };
-enum Category : std::uint64_t { kDailyRecord = 0x100, kDiagnosis = 0x2 };
-
-constexpr std::int64_t kBytes = 0x0900'8200'0000'0000;
-constexpr std::int64_t kMicroseconds = 0x0100'0079'0000'0000;
+constexpr std::uint64_t kDiagnosisCategory = 0x2;
 
 // The four values of an element.
-using Values = std::array<std::uint64_t, 4>;
+using Values = std::array<std::uint64_t, kRawElementValues>;
 
 struct DemoChannel {
   std::uint64_t id;
   const char* name;
-  Format format;
-  Category category;
+  ReportFormat format;
+  std::uint64_t category;
   std::vector<Values> elements;
 };
 
@@ -37,17 +35,17 @@ constexpr std::uint64_t StateId(std::string_view name) {
 
 // Group by group: the legend has one unit for a group.
 std::vector<DemoChannel> Traffic() {
-  return {{1, "net0 received", kSimple, kDailyRecord, {{7'340'032}}},
-          {2, "net0 sent", kSimple, kDailyRecord, {{1'048'576}}},
-          {3, "net0 dropped", kSimple, kDailyRecord, {{4096}}}};
+  return {{1, "net0 received", ReportFormat::kSimple, kDailyCategory, {{7'340'032}}},
+          {2, "net0 sent", ReportFormat::kSimple, kDailyCategory, {{1'048'576}}},
+          {3, "net0 dropped", ReportFormat::kSimple, kDailyCategory, {{4096}}}};
 }
 
 // State, transitions into it, microseconds in it.
 std::vector<DemoChannel> Power() {
   return {{StateId("LINK"),
            "net0 link power",
-           kState,
-           kDiagnosis,
+           ReportFormat::kState,
+           kDiagnosisCategory,
            {{StateId("SLEEP"), 1204, 61'870'000'000},
             {StateId("IDLE"), 18'311, 17'480'250'000},
             {StateId("ACTIVE"), 17'107, 7'049'750'000}}}};
@@ -57,8 +55,8 @@ std::vector<DemoChannel> Power() {
 std::vector<DemoChannel> Packets() {
   return {{StateId("PKTSIZE"),
            "net0 packet size",
-           kHistogram,
-           kDiagnosis,
+           ReportFormat::kHistogram,
+           kDiagnosisCategory,
            {{0, 0, 0, 0},
             {0, 0, 0, 0},
             {3210, 42, 64, 179'760},
@@ -68,7 +66,7 @@ std::vector<DemoChannel> Packets() {
 }
 
 // Upper bounds 4, 16, ... 4096: one segment of powers of 4.
-Data PacketBounds() { return LittleEndian().u32(4).u32(1).u32(0).u32(6).data(); }
+Data PacketBounds() { return ByteWriter().u32(4).u32(1).u32(0).u32(6).data(); }
 
 class NetworkDriver {
  public:
@@ -76,10 +74,10 @@ class NetworkDriver {
     Array entries;
     for (const DemoChannel& channel : channels) {
       const std::uint64_t type =
-          channel.format | channel.category << 16 | channel.elements.size() << 32;
+          makeType(channel.format, channel.category, channel.elements.size());
       entries.push_back(Array{Int64(static_cast<std::int64_t>(channel.id)),
                               Int64(static_cast<std::int64_t>(type)), channel.name});
-      LittleEndian run;
+      ByteWriter run;
       std::uint64_t timeStamp = 0;
       for (const Values& values : channel.elements) {
         run.u64(kNetworkId).u64(channel.id).u64(type).u64(++timeStamp);
@@ -118,21 +116,21 @@ Dictionary DemoHub() {
 
 Dictionary DemoNetworkDriver() {
   NetworkDriver driver;
-  driver.add(
-      Dictionary{{"DrvReportGroupName", "Network"},
-                 {"DrvReportChannelInfo", Dictionary{{"DrvReportChannelUnit", Int64(kBytes)}}}},
-      Traffic());
+  driver.add(Dictionary{{"DrvReportGroupName", "Network"},
+                        {"DrvReportChannelInfo",
+                         Dictionary{{"DrvReportChannelUnit", Int64(std::int64_t{kBytes})}}}},
+             Traffic());
   driver.add(Dictionary{{"DrvReportGroupName", "Network"},
                         {"DrvReportSubGroupName", "Power"},
                         {"DrvReportChannelInfo",
-                         Dictionary{{"DrvReportChannelUnit", Int64(kMicroseconds)}}}},
+                         Dictionary{{"DrvReportChannelUnit", Int64(std::int64_t{kMicroseconds})}}}},
              Power());
-  driver.add(
-      Dictionary{{"DrvReportGroupName", "Network"},
-                 {"DrvReportSubGroupName", "Packets"},
-                 {"DrvReportChannelInfo", Dictionary{{"DrvReportChannelUnit", Int64(kBytes)},
-                                                     {"DrvReportChannelConfig", PacketBounds()}}}},
-      Packets());
+  driver.add(Dictionary{{"DrvReportGroupName", "Network"},
+                        {"DrvReportSubGroupName", "Packets"},
+                        {"DrvReportChannelInfo",
+                         Dictionary{{"DrvReportChannelUnit", Int64(std::int64_t{kBytes})},
+                                    {"DrvReportChannelConfig", PacketBounds()}}}},
+             Packets());
   return driver.description();
 }
 

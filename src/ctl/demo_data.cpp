@@ -90,13 +90,13 @@ std::string DesktopFile(std::string_view name) {
 std::string DemoTaskSnapshot() {
   enum Item : std::uint64_t { kBegin = 0x13, kEnd = 0x14, kIO = 0x901, kName = 0x909 };
   constexpr std::uint64_t kBufferEnd = 0xF19158ED;
-  LittleEndian items;
+  ByteWriter items;
   items.u32(kBegin).u32(4).u64(1).u32(1);
   items.u32(kBegin).u32(4).u64(2).u32(2);
   items.u32(kName).u32(16).u64(0).text("VM_swapout", 16);
   items.u32(kIO).u32(32).u64(0).u64(811).u64(26'574'848).u64(9402).u64(616'169'472);
   items.u32(kEnd).u32(0).u64(2).u32(kEnd).u32(0).u64(1).u32(kBufferEnd).u32(0).u64(0);
-  return items.bytes();
+  return FileOf(items);
 }
 
 struct DemoScalar {
@@ -147,11 +147,11 @@ std::vector<DemoFile> MakeDemoFiles(Date startOfToday) {
       {"/var/db/drivers/net0.plist", Document(DemoNetworkDriver())},
       {"/var/db/drivers/storage0.plist", Document(DemoStorageDriver())},
       {"/var/db/vigil/usage.plist", Document(UsageRecords(startOfToday))},
-      {"/var/db/kernel/kern.memorystatus_freeze_count", LittleEndian().u32(17).bytes()},
-      {"/var/db/kernel/kern.memorystatus_freeze_pageouts", LittleEndian().u64(52'311).bytes()},
+      {"/var/db/kernel/kern.memorystatus_freeze_count", FileOf(ByteWriter().u32(17))},
+      {"/var/db/kernel/kern.memorystatus_freeze_pageouts", FileOf(ByteWriter().u64(52'311))},
       {"/var/db/kernel/kern.memorystatus_freeze_budget_pages_remaining",
-       LittleEndian().u64(20'480).bytes()},
-      {"/var/db/kernel/kern.memorystatus_thaw_count", LittleEndian().u32(5).bytes()},
+       FileOf(ByteWriter().u64(20'480))},
+      {"/var/db/kernel/kern.memorystatus_thaw_count", FileOf(ByteWriter().u32(5))},
       {"/var/db/kernel/task-snapshot", DemoTaskSnapshot()},
       {"/etc/os-release", "NAME=\"Demo OS\"\nVERSION_ID=1.0\nBUILD_ID=1A1\n"},
       {"/etc/machine-id", "00000000000000000000000000000de0\n"},

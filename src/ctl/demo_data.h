@@ -6,8 +6,8 @@
 #include <string>
 #include <vector>
 
-#include "platform/linux/tally_ledger.h"
-#include "values/property_value.h"
+#include "drvreport/property_value.h"
+#include "platform/linux/counters/tally_ledger.h"
 
 namespace quorlet {
 

@@ -2,7 +2,7 @@
 #ifndef QUORLET_CTL_DEMO_DRIVERS_H_
 #define QUORLET_CTL_DEMO_DRIVERS_H_
 
-#include "values/property_value.h"
+#include "drvreport/property_value.h"
 
 namespace quorlet {
 

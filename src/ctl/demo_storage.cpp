@@ -3,22 +3,15 @@
 
 #include "ctl/demo_bytes.h"
 #include "ctl/demo_drivers.h"
+#include "platform/statistics_keys.h"
+#include "platform/storage_exports.h"
+#include "values/byte_writer.h"
 
 namespace quorlet {
 namespace {
 
 constexpr std::int64_t kStorageId = 0x200;
-constexpr std::int64_t kExportMethod = 8;
 constexpr std::uint64_t kChannels = 2;
-
-enum Selector : std::int64_t {
-  kBandStatistics = 11,
-  kStatistics = 13,
-  kDefectsList = 15,
-  kTelemetryList = 17,
-  kSnapshot = 22,
-  kSnapshotHeader = 145,
-};
 
 struct Statistic {
   std::uint64_t key;
@@ -29,49 +22,53 @@ struct Statistic {
 // the NAND has been written a little more than twice as much as the host wrote.
 const std::vector<Statistic>& Statistics() {
   static const std::vector<Statistic> statistics = {
-      {53, {0x20005}},                    // version of the export
-      {52, {2048}},                       // virtual blocks
-      {51, {16}},                         // blocks of a virtual block
-      {50, {4096}},                       // pages of a virtual block
-      {49, {16'384}},                     // bytes of a page
-      {129, {1365}},                      // pages of a virtual block in SLC mode
-      {4, {600'412'331}},                 // host writes, sectors
-      {7, {1'904'118'020}},               // host reads
-      {18, {1'311'002'752}},              // NAND writes
-      {19, {2'744'901'633}},              // NAND reads
-      {20, {82'004}},                     // erased bands
-      {84, {60'731}},                     // of the intermediate partition
-      {48, {187}},                        // free virtual blocks
-      {17, {412}},                        // wear-level moves
-      {12, {90'112}},                     // nodes free
-      {13, {131'072}},                    // nodes in all
-      {56, {1'735'689'600}},              // formatted on 2025-01-01
-      {28, {8120}},                       // sleeps
-      {45, {1466}},                       // most erasures of a high-endurance block
-      {265, {70'112, 8204, 310, 12, 1}},  // bands by reads before erasure
-      {85, {16}},                         // start of the intermediate partition
-      {86, {144}},                        // start of the user partition
-      {16, {402'118'772}},                // sectors moved by garbage collection
-      {37, {733'102}},                    // flushes
-      {190, {12'881}},                    // fences
-      {11, {4}},                          // unclean boots
-      {77, {9216}},                       // static data, MB
-      {115, {401'772'190, 120'331'804, 60'112'009, 18'196'328}},  // sectors by host flow
-      {124, {31, 640}},                                           // fewest erasures, by partition
-      {125, {52, 1466}},                                          // most erasures
-      {141, {7}},                                                 // memory chokes
-      {142, {12'345}},                                            // the longest one, us
-      {143, {40'877}},                                            // all of them, us
-      {269, {2, 0}},                                              // boot-block refreshes
-      {270, {1}},
-      {289, {0, 1, 0}},                             // failed reads while refreshing
-      {327, {0, 0, 3, 40, 612, 901, 388, 90, 14}},  // bands by highest temperature
+      {StatisticsIdOf("exportVersion"), {0x20005}},          // version of the export
+      {StatisticsIdOf("numVirtualBlocks"), {2048}},          // virtual blocks
+      {StatisticsIdOf("blocksPerVirtualBlock"), {16}},       // blocks of a virtual block
+      {StatisticsIdOf("pagesPerVirtualBlock"), {4096}},      // pages of a virtual block
+      {StatisticsIdOf("bytesPerPage"), {16'384}},            // bytes of a page
+      {StatisticsIdOf("pagesPerVirtualBlockSlc"), {1365}},   // pages of a virtual block in SLC mode
+      {StatisticsIdOf("hostWrites"), {600'412'331}},         // host writes, sectors
+      {StatisticsIdOf("hostReads"), {1'904'118'020}},        // host reads
+      {StatisticsIdOf("nandWrites"), {1'311'002'752}},       // NAND writes
+      {StatisticsIdOf("nandReads"), {2'744'901'633}},        // NAND reads
+      {StatisticsIdOf("bandErases"), {82'004}},              // erased bands
+      {StatisticsIdOf("intermediateBandErases"), {60'731}},  // of the intermediate partition
+      {StatisticsIdOf("numFreeVirtualBlocks"), {187}},       // free virtual blocks
+      {StatisticsIdOf("wearLevMoves"), {412}},               // wear-level moves
+      {StatisticsIdOf("IND_pool_free"), {90'112}},           // nodes free
+      {StatisticsIdOf("IND_pool_count"), {131'072}},         // nodes in all
+      {StatisticsIdOf("utilFormatTime"), {1'735'689'600}},   // formatted on 2025-01-01
+      {StatisticsIdOf("numSleepOps"), {8120}},               // sleeps
+      {StatisticsIdOf("maxHighEnduranceBlockErases"),
+       {1466}},  // most erasures of a high-endurance block
+      {StatisticsIdOf("readCountHisto"),
+       {70'112, 8204, 310, 12, 1}},                          // bands by reads before erasure
+      {StatisticsIdOf("intermediatePartitionStart"), {16}},  // start of the intermediate partition
+      {StatisticsIdOf("userPartitionStart"), {144}},         // start of the user partition
+      {StatisticsIdOf("gcWrites"), {402'118'772}},           // sectors moved by garbage collection
+      {StatisticsIdOf("numFlushes"), {733'102}},             // flushes
+      {StatisticsIdOf("numFences"), {12'881}},               // fences
+      {StatisticsIdOf("uncleanBoots"), {4}},                 // unclean boots
+      {StatisticsIdOf("staticSizeInMB"), {9216}},            // static data, MB
+      {StatisticsIdOf("secsPerHostFlow"),
+       {401'772'190, 120'331'804, 60'112'009, 18'196'328}},    // sectors by host flow
+      {StatisticsIdOf("coldestCycle"), {31, 640}},             // fewest erasures, by partition
+      {StatisticsIdOf("hottestCycle"), {52, 1466}},            // most erasures
+      {StatisticsIdOf("numMemChoke"), {7}},                    // memory chokes
+      {StatisticsIdOf("maxMemChokeDuration"), {12'345}},       // the longest one, us
+      {StatisticsIdOf("memChokeDuration"), {40'877}},          // all of them, us
+      {StatisticsIdOf("numBootBlockRefreshSuccess"), {2, 0}},  // boot-block refreshes
+      {StatisticsIdOf("numBootBlockRefreshFail"), {1}},
+      {StatisticsIdOf("mspBootBlockReadFail"), {0, 1, 0}},  // failed reads while refreshing
+      {StatisticsIdOf("bandsMaxTempHisto"),
+       {0, 0, 3, 40, 612, 901, 388, 90, 14}},  // bands by highest temperature
   };
   return statistics;
 }
 
 Data StatisticsExport() {
-  LittleEndian records;
+  ByteWriter records;
   for (const Statistic& statistic : Statistics()) {
     records.u32(statistic.key).u32(statistic.values.size());
     for (const std::uint64_t value : statistic.values) records.u64(value);
@@ -83,7 +80,7 @@ Data StatisticsExport() {
 Data BandStatistics() {
   constexpr std::uint64_t kEntries = 16;
   constexpr std::uint64_t kUnusedWords = 2;
-  LittleEndian list;
+  ByteWriter list;
   list.u32(kEntries).u32(kUnusedWords).u64(0).u64(0);
   for (std::uint64_t i = 0; i < kEntries; ++i) {
     list.u32(i).u32(i / 4 == 0 ? 0 : 1).u32(16'384 - 977 * i).u32(0).u32(0);
@@ -95,7 +92,7 @@ Data BandStatistics() {
 Data Telemetry(std::uint64_t list) {
   constexpr std::uint64_t kBlockWords = 1024;
   constexpr std::uint64_t kUsedWords = 128;
-  LittleEndian blocks;
+  ByteWriter blocks;
   for (std::uint64_t channel = 0; channel < kChannels; ++channel) {
     for (std::uint64_t word = 0; word < kBlockWords; ++word) {
       const std::uint64_t reads = 4000 / (word + 1) + 7 * channel + list;
@@ -111,7 +108,7 @@ Data Telemetry(std::uint64_t list) {
 
 Data Defects() {
   constexpr std::uint64_t kFactoryCount = 37;
-  LittleEndian list;
+  ByteWriter list;
   list.u32(0).u32(kFactoryCount).u32(2);
   // Bus and chip enable, CAU, block, cycle, reason, page, temperature
   list.u32(1 | 2 << 16).u32(0).u32(1207).u32(44).u32(3).u32(511).u32(38);
@@ -123,7 +120,7 @@ constexpr std::uint64_t kRecordBytes = 252;
 constexpr std::uint64_t kIntervals = 4;
 
 Data Snapshot() {
-  LittleEndian records;
+  ByteWriter records;
   for (std::uint64_t interval = 1; interval <= kIntervals; ++interval) {
     for (std::uint64_t word = 0; word < kRecordBytes / 4; ++word) {
       const bool isTime = word == 0;
@@ -154,7 +151,7 @@ Data SnapshotHeader() {
                                                {Field::kMilliseconds, 39, 4, " TH=%u.%02u"},
                                                {Field::kOperations, 14, 48, " R%s="},
                                                {Field::kOperations, 2, 48, " W%s="}};
-  LittleEndian header;
+  ByteWriter header;
   header.u32(0).u32(kVersion).u32(kRecordBytes).u32(kIntervals).u32(0).u32(0).u32(kFieldTable);
   header.u32(0).u32(0);
   header.text("Key: T time, E erased bands, HR/HW host reads/writes, TH hysteresis (ms)\n\n",
@@ -166,8 +163,8 @@ Data SnapshotHeader() {
   return header.data();
 }
 
-Dictionary Export(Selector selector, const Data& data, std::uint64_t listIndex = 0) {
-  return {{"Selector", Int64(selector)},
+Dictionary Export(std::uint32_t selector, const Data& data, std::uint64_t listIndex = 0) {
+  return {{"Selector", Int64(std::int64_t{selector})},
           {"ListIndex", Int64(static_cast<std::int64_t>(listIndex))},
           {"Data", data}};
 }
@@ -175,23 +172,25 @@ Dictionary Export(Selector selector, const Data& data, std::uint64_t listIndex =
 }  // namespace
 
 Dictionary DemoStorageDriver() {
-  Array exports{Export(kStatistics, StatisticsExport()), Export(kBandStatistics, BandStatistics())};
+  Array exports{Export(kStatisticsSelector, StatisticsExport()),
+                Export(kBandStatisticsSelector, BandStatistics())};
   for (std::uint64_t list = 0; list < 3; ++list) {
-    exports.push_back(Export(kTelemetryList, Telemetry(list), list));
+    exports.push_back(Export(kTelemetryListSelector, Telemetry(list), list));
   }
-  exports.push_back(Export(kDefectsList, Defects()));
-  exports.push_back(Export(kSnapshot, Snapshot()));
-  exports.push_back(Export(kSnapshotHeader, SnapshotHeader()));
+  exports.push_back(Export(kDefectsListSelector, Defects()));
+  exports.push_back(Export(kSnapshotSelector, Snapshot()));
+  exports.push_back(Export(kSnapshotHeaderSelector, SnapshotHeader()));
   const Dictionary characteristics{{"chip-id", "K3A"},
                                    {"manufacturer-id", "4582603A57FF"},
                                    {"num-bus", Int64(static_cast<std::int64_t>(kChannels))}};
   // Method 5: whether content should be deleted.
-  const Dictionary methods{{"5", Dictionary{{"Output", LittleEndian().u32(0).data()}}}};
+  const Dictionary methods{{"5", Dictionary{{"Output", ByteWriter().u32(0).data()}}}};
   return {{"EntryID", Int64(kStorageId)},
           {"EntryName", "storage0"},
-          {"ClassName", "FSPStorage"},
-          {"Properties", Dictionary{{"Device Characteristics", characteristics}}},
-          {"ExportMethods", Array{Int64(kExportMethod)}},
+          {"ClassName", std::string(kFlashStorageClass.name)},
+          {"Properties",
+           Dictionary{{std::string(kFlashStorageClass.characteristicsKey), characteristics}}},
+          {"ExportMethods", Array{Int64(std::int64_t{kFlashStorageClass.exportMethod})}},
           {"Exports", exports},
           {"Methods", methods}};
 }

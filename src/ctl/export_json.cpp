@@ -3,6 +3,7 @@
 #include <charconv>
 #include <cmath>
 
+#include "values/digits.h"
 #include "values/text.h"
 
 namespace quorlet {
@@ -15,15 +16,13 @@ void AppendDigits(std::string& json, T number) {
 }
 
 void AppendEscaped(std::string& json, char c) {
-  constexpr std::string_view kDigits = "0123456789abcdef";
   if (c == '"' || c == '\\') {
     (json += '\\') += c;
   } else if (c == '\n') {
     json += "\\n";
   } else {
     json += "\\u00";
-    json += kDigits[static_cast<unsigned char>(c) >> 4];
-    json += kDigits[static_cast<unsigned char>(c) & 15];
+    AppendHex(json, c);
   }
 }
 

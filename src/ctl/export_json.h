@@ -5,7 +5,7 @@
 #include <string>
 #include <string_view>
 
-#include "values/property_value.h"
+#include "drvreport/property_value.h"
 
 namespace quorlet {
 

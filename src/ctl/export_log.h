@@ -9,8 +9,8 @@
 #include <variant>
 #include <vector>
 
+#include "drvreport/property_value.h"
 #include "report/bucket_label.h"
-#include "values/property_value.h"
 
 namespace quorlet {
 

@@ -11,7 +11,7 @@
 #include <variant>
 #include <vector>
 
-#include "platform/linux/paths.h"
+#include "platform/linux/base/paths.h"
 
 namespace quorlet {
 namespace {

@@ -5,7 +5,7 @@
 #include <optional>
 #include <string>
 
-#include "platform/linux/files.h"
+#include "platform/linux/base/files.h"
 
 namespace quorlet {
 

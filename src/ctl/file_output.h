@@ -8,7 +8,7 @@
 #include <string_view>
 
 #include "ctl/output.h"
-#include "platform/linux/files.h"
+#include "platform/linux/base/files.h"
 
 namespace quorlet {
 

@@ -8,7 +8,7 @@
 #include "ctl/demo_data.h"
 #include "ctl/options.h"
 #include "ctl/session.h"
-#include "platform/linux/paths.h"
+#include "platform/linux/base/paths.h"
 
 namespace quorlet {
 namespace {

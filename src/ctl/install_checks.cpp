@@ -8,7 +8,7 @@
 #include <array>
 #include <cerrno>
 
-#include "platform/linux/paths.h"
+#include "platform/linux/base/paths.h"
 
 namespace quorlet {
 namespace {

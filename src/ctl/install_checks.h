@@ -6,7 +6,7 @@
 #include <string_view>
 #include <utility>
 
-#include "platform/linux/files.h"
+#include "platform/linux/base/files.h"
 
 namespace quorlet {
 

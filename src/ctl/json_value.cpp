@@ -7,7 +7,7 @@
 #include <vector>
 
 #include "ctl/options.h"
-#include "platform/linux/property_json.h"
+#include "platform/linux/base/property_json.h"
 #include "values/base64.h"
 #include "values/property_list.h"
 #include "values/text.h"

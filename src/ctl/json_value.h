@@ -6,7 +6,7 @@
 #include <string_view>
 #include <variant>
 
-#include "values/property_value.h"
+#include "drvreport/property_value.h"
 
 namespace quorlet {
 

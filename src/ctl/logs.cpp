@@ -20,8 +20,8 @@
 #include "ctl/options.h"
 #include "ctl/session.h"
 #include "ctl/terminal.h"
-#include "platform/linux/descriptor.h"
-#include "platform/linux/paths.h"
+#include "platform/linux/base/descriptor.h"
+#include "platform/linux/base/paths.h"
 #include "values/property_list.h"
 #include "values/text.h"
 

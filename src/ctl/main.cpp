@@ -10,7 +10,7 @@
 #include <cstdlib>
 
 #include "ctl/session.h"
-#include "platform/linux/descriptor.h"
+#include "platform/linux/base/descriptor.h"
 
 namespace quorlet {
 namespace {

@@ -7,8 +7,8 @@
 #include <system_error>
 
 #include "ctl/output.h"
-#include "platform/linux/files.h"
-#include "platform/linux/services.h"
+#include "platform/linux/base/files.h"
+#include "platform/linux/base/services.h"
 
 namespace quorlet {
 namespace {

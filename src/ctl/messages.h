@@ -10,7 +10,7 @@
 #include <string_view>
 #include <vector>
 
-#include "platform/linux/access.h"
+#include "platform/linux/base/access.h"
 #include "platform/system_log.h"
 
 namespace quorlet {

@@ -8,7 +8,7 @@
 #include <string_view>
 #include <vector>
 
-#include "channels/drvreport.h"
+#include "drvreport/drvreport.h"
 
 namespace quorlet {
 

@@ -2,14 +2,13 @@
 #ifndef QUORLET_CTL_OPTIONS_H_
 #define QUORLET_CTL_OPTIONS_H_
 
-#include <charconv>
-#include <concepts>
 #include <cstdint>
 #include <limits>
 #include <optional>
 #include <string>
 #include <string_view>
-#include <system_error>
+
+#include "values/digits.h"
 
 namespace CLI {
 class App;
@@ -22,18 +21,6 @@ namespace quorlet {
 inline constexpr std::int32_t kFirstDay = std::numeric_limits<std::int32_t>::min() + 1;
 inline constexpr std::int32_t kLastDay = std::numeric_limits<std::int32_t>::max();
 inline constexpr std::int32_t kLastSecond = 86399;
-
-// The whole text as a decimal number (a real: also "1e9", "inf", "nan"), or nothing when it is not
-// one or does not fit.
-template <typename T>
-requires std::integral<T> || std::same_as<T, double> std::optional<T> ParseNumber(
-    std::string_view text) {
-  T value{};
-  const char* end = text.data() + text.size();
-  const auto [stopped, error] = std::from_chars(text.data(), end, value);
-  if (error != std::errc{} || stopped != end) return std::nullopt;
-  return value;
-}
 
 // The number of the day that it is, in UTC.
 std::int32_t Today();

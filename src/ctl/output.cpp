@@ -2,9 +2,9 @@
 
 #include <array>
 #include <cerrno>
-#include <charconv>
 #include <cstdio>
 
+#include "values/digits.h"
 #include "values/text.h"
 
 namespace quorlet {
@@ -26,7 +26,6 @@ bool IsPlain(std::string_view sequence) {
 }
 
 void AppendEscaped(char byte, std::string& escaped) {
-  constexpr std::string_view kDigits = "0123456789abcdef";
   switch (byte) {
     case '\t':
       escaped += "\\t";
@@ -42,16 +41,8 @@ void AppendEscaped(char byte, std::string& escaped) {
       return;
     default:
       escaped += "\\x";
-      escaped += kDigits[static_cast<unsigned char>(byte) >> 4];
-      escaped += kDigits[static_cast<unsigned char>(byte) & 15];
+      AppendHex(escaped, byte);
   }
-}
-
-int HexDigit(char c) {
-  if (c >= '0' && c <= '9') return c - '0';
-  if (c >= 'a' && c <= 'f') return c - 'a' + 10;
-  if (c >= 'A' && c <= 'F') return c - 'A' + 10;
-  return -1;
 }
 
 }  // namespace
@@ -111,10 +102,9 @@ std::optional<std::string> Unescape(std::string_view text) {
         break;
       case 'x': {
         if (text.size() - i < 3) return std::nullopt;
-        const int high = HexDigit(text[i + 1]);
-        const int low = HexDigit(text[i + 2]);
-        if (high < 0 || low < 0) return std::nullopt;
-        bytes += static_cast<char>(high * 16 + low);
+        const auto byte = ParseNumber<std::uint8_t>(text.substr(i + 1, 2), 16);
+        if (!byte) return std::nullopt;
+        bytes += static_cast<char>(*byte);
         i += 2;
         break;
       }
@@ -125,11 +115,7 @@ std::optional<std::string> Unescape(std::string_view text) {
   return bytes;
 }
 
-std::string Hexadecimal(std::uint64_t number) {
-  std::array<char, 16> digits{};
-  const auto [end, error] = std::to_chars(digits.begin(), digits.end(), number, 16);
-  return "0x" + std::string(digits.begin(), end);
-}
+std::string Hexadecimal(std::uint64_t number) { return "0x" + HexNumber(number); }
 
 std::string Counted(std::size_t count, std::string_view noun) {
   std::string text = std::to_string(count) + " ";

@@ -5,7 +5,7 @@
 #include "ctl/json_value.h"
 #include "ctl/options.h"
 #include "ctl/session.h"
-#include "platform/linux/paths.h"
+#include "platform/linux/base/paths.h"
 #include "values/property_list.h"
 
 namespace quorlet {

@@ -18,7 +18,7 @@
 #include "ctl/record_whitelist.h"
 #include "ctl/statsd_line.h"
 #include "platform/counter_store.h"
-#include "platform/linux/tally_ledger.h"
+#include "platform/linux/counters/tally_ledger.h"
 
 namespace quorlet {
 

@@ -13,8 +13,8 @@
 #include <vector>
 
 #include "ctl/record_refusals.h"
-#include "platform/linux/files.h"
-#include "platform/linux/listening_socket.h"
+#include "platform/linux/base/files.h"
+#include "platform/linux/service/listening_socket.h"
 
 namespace quorlet {
 

@@ -33,7 +33,7 @@ RecordWhitelist RecordWhitelist::Load(const Root& root, Platform& platform) {
   }
   const bool isInternal = platform.queries.TLIsInternalDevice();
   const auto enabled = [&](const std::string& group) {
-    return IsGroupEnabled(group, isInternal, platform);
+    return IsGroupEnabled(group, isInternal, platform.preferences, platform.log);
   };
   // What it skips is the report's to tell.
   static_cast<void>(MergeWhitelist(*groups, enabled, whitelist.tables_));

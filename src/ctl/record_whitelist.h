@@ -6,7 +6,7 @@
 #include <string_view>
 #include <vector>
 
-#include "platform/linux/files.h"
+#include "platform/linux/base/files.h"
 #include "report/config.h"
 
 namespace quorlet {

@@ -10,7 +10,7 @@
 #include <vector>
 
 #include "ctl/messages.h"
-#include "platform/linux/files.h"
+#include "platform/linux/base/files.h"
 
 namespace quorlet {
 namespace {

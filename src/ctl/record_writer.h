@@ -8,8 +8,8 @@
 #include <thread>
 
 #include "ctl/record_book.h"
-#include "platform/linux/descriptor.h"
-#include "platform/linux/tally_ledger.h"
+#include "platform/linux/base/descriptor.h"
+#include "platform/linux/counters/tally_ledger.h"
 
 namespace quorlet {
 

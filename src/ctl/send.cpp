@@ -11,17 +11,17 @@
 #include "ctl/json_value.h"
 #include "ctl/options.h"
 #include "ctl/session.h"
-#include "platform/linux/frame_buffer.h"
-#include "platform/linux/named_service.h"
-#include "platform/linux/paths.h"
-#include "platform/linux/unix_socket.h"
+#include "platform/linux/base/paths.h"
+#include "platform/linux/service/frame_buffer.h"
+#include "platform/linux/service/services.h"
+#include "platform/linux/service/unix_socket.h"
+#include "values/digits.h"
 #include "values/property_list.h"
 
 namespace quorlet {
 namespace {
 
 constexpr char kServiceName[] = "nuvex.aggregated.quorlet";
-constexpr std::size_t kUuidBytes = 16;
 constexpr double kLongestWait = 86400;
 constexpr char kWaitHelp[] = "Seconds to wait for the service to appear (default: 0)";
 constexpr char kDayHelp[] = "Day number, YYYY-MM-DD, \"today\" or \"yesterday\"";
@@ -75,11 +75,9 @@ std::optional<Data> ParseUuid(std::string_view text) {
   if (digits.size() != 2 * kUuidBytes) return std::nullopt;
   Data uuid;
   for (std::size_t i = 0; i < digits.size(); i += 2) {
-    std::uint8_t byte = 0;
-    const char* end = digits.data() + i + 2;
-    const auto [at, error] = std::from_chars(digits.data() + i, end, byte, 16);
-    if (error != std::errc() || at != end) return std::nullopt;
-    uuid.push_back(std::byte{byte});
+    const auto byte = ParseNumber<std::uint8_t>(std::string_view(digits).substr(i, 2), 16);
+    if (!byte) return std::nullopt;
+    uuid.push_back(std::byte{*byte});
   }
   return uuid;
 }

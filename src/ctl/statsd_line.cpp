@@ -2,9 +2,9 @@
 
 #include <algorithm>
 #include <array>
-#include <charconv>
 #include <cmath>
-#include <system_error>
+
+#include "values/digits.h"
 
 namespace quorlet {
 namespace {
@@ -18,14 +18,7 @@ std::string_view TakeUntil(std::string_view& text, char end) {
   return taken;
 }
 
-template <typename T>
-bool ReadWhole(std::string_view text, T& value) {
-  const char* end = text.data() + text.size();
-  const auto [stopped, error] = std::from_chars(text.data(), end, value);
-  return error == std::errc() && stopped == end;
-}
-
-// A decimal number. from_chars takes no "+", and would take the "-" of "+-1".
+// A decimal number. ParseNumber takes no "+", and would take the "-" of "+-1".
 bool ReadNumber(std::string_view text, StatsdNumber& number) {
   number = {};
   number.isSigned = text.starts_with('+') || text.starts_with('-');
@@ -33,13 +26,10 @@ bool ReadNumber(std::string_view text, StatsdNumber& number) {
     text.remove_prefix(1);
     if (text.starts_with('-')) return false;
   }
-  std::int64_t whole = 0;
-  if (ReadWhole(text, whole)) {
-    number.whole = whole;
-    number.real = static_cast<double>(whole);
-    return true;
-  }
-  return ReadWhole(text, number.real) && std::isfinite(number.real);
+  number.whole = ParseNumber<std::int64_t>(text);
+  const auto real = number.whole ? static_cast<double>(*number.whole) : ParseNumber<double>(text);
+  number.real = real.value_or(0);
+  return real && std::isfinite(*real);
 }
 
 bool ReadNumbers(std::string_view text, std::vector<StatsdNumber>& numbers) {
@@ -69,10 +59,9 @@ bool ReadType(std::string_view type, StatsdKind& kind) {
 // What may follow the type, each after a "|". Only the rate, once, means something here.
 bool ReadField(std::string_view field, std::optional<double>& rate) {
   if (field.starts_with('@')) {
-    double value = 0;
-    if (rate || !ReadWhole(field.substr(1), value)) return false;
-    rate = value;
-    return value > 0 && value <= 1;
+    if (rate) return false;
+    rate = ParseNumber<double>(field.substr(1));
+    return rate && *rate > 0 && *rate <= 1;
   }
   constexpr std::array<std::string_view, 5> kLeftOut = {"#", "T", "c:", "e:", "card:"};
   return std::ranges::any_of(kLeftOut,

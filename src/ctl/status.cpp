@@ -17,8 +17,8 @@
 #include "ctl/whitelist.h"
 #include "driver/consent.h"
 #include "driver/run_driver.h"
-#include "platform/linux/paths.h"
-#include "platform/linux/structured_log.h"
+#include "platform/linux/base/paths.h"
+#include "platform/linux/logs/structured_log.h"
 #include "report/config.h"
 
 namespace quorlet {

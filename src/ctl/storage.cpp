@@ -88,7 +88,8 @@ void PrintInfo(Session& session, const StorageArguments& arguments) {
 
 void PrintVMFreezer(Session& session, const StorageArguments& arguments) {
   StorageServices services(session);
-  const Dictionary info = CopyVMFreezerNANDInfo(services.platform);
+  const Dictionary info =
+      CopyVMFreezerNANDInfo(services.platform.taskSnapshot, services.platform.standardError);
   if (info.contains(kNANDInfoVMFreezerErrorKey)) {
     throw Failure(session.messages.lastErrorOr("this system has no memory freezer that tells"));
   }

@@ -18,8 +18,8 @@
 #include "ctl/tally_lines.h"
 #include "ctl/tally_listen.h"
 #include "ctl/whitelist.h"
-#include "platform/linux/descriptor.h"
-#include "platform/linux/paths.h"
+#include "platform/linux/base/descriptor.h"
+#include "platform/linux/base/paths.h"
 
 namespace quorlet {
 namespace {

@@ -6,7 +6,7 @@
 #include <string>
 
 #include "ctl/messages.h"
-#include "platform/linux/tally_ledger.h"
+#include "platform/linux/counters/tally_ledger.h"
 
 namespace quorlet {
 

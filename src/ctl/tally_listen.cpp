@@ -24,8 +24,8 @@
 #include "ctl/record_writer.h"
 #include "ctl/session.h"
 #include "ctl/statsd_line.h"
-#include "platform/linux/paths.h"
-#include "platform/linux/services.h"
+#include "platform/linux/base/paths.h"
+#include "platform/linux/base/services.h"
 
 namespace quorlet {
 namespace {

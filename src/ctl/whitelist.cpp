@@ -139,7 +139,8 @@ void Check(Session& session, const CheckArguments& arguments) {
   Array groups;
   for (const auto& [name, value] : root) {
     Group group = CheckGroup(name, value);
-    group.isEnabled = IsGroupEnabled(name, isInternal, platform->services());
+    group.isEnabled = IsGroupEnabled(name, isInternal, platform->services().preferences,
+                                     platform->services().log);
     faults += group.faults.size();
     if (arguments.json) {
       groups.push_back(GroupJson(group));

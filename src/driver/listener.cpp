@@ -3,31 +3,19 @@
 #include <optional>
 #include <string>
 
+#include "values/digits.h"
+
 namespace quorlet {
 namespace {
 
 constexpr char kLoggingNotification[] = "nuvex.aggregated.quorlet.logging";
 constexpr double kSliceSeconds = 10.0;
-constexpr std::size_t kUuidBytes = 16;
 
 enum Operation : std::int32_t {
   OperationLoggingStatus = 0,
   OperationRunDay = 1,
   OperationAppInfo = 2
 };
-
-// "1B4E28BA-2FA1-11D2-883F-B9A761BDE3FB"
-std::string UuidText(const Data& uuid) {
-  constexpr std::string_view kDigits = "0123456789ABCDEF";
-  std::string text;
-  for (std::size_t i = 0; i < uuid.size(); ++i) {
-    if (i == 4 || i == 6 || i == 8 || i == 10) text += '-';
-    const auto byte = std::to_integer<std::size_t>(uuid[i]);
-    text += kDigits[byte >> 4];
-    text += kDigits[byte & 15];
-  }
-  return text;
-}
 
 // The field's 64 bits; 0 when it is missing or not an integer.
 std::int64_t IntegerField(const Dictionary& message, std::string_view key) {
@@ -53,7 +41,7 @@ bool appInfoRecordFromMessage(const PropertyValue& element, Array& records) {
                                {"version", *version},
                                {"teskID", Int64(IntegerField(*fields, "tesk_id"))},
                                {"arch", Int64(IntegerField(*fields, "arch"))},
-                               {"uuid", UuidText(*uuid)}});
+                               {"uuid", UuidText(std::span(*uuid).first<kUuidBytes>())}});
   return true;
 }
 

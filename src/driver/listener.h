@@ -13,9 +13,9 @@
 #include <cstdint>
 
 #include "driver/run_driver.h"
+#include "drvreport/property_value.h"
 #include "platform/named_service.h"
 #include "platform/platform.h"
-#include "values/property_value.h"
 
 namespace quorlet {
 

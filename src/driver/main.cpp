@@ -8,7 +8,7 @@
 
 #include "driver/listener.h"
 #include "driver/run_driver.h"
-#include "platform/linux/descriptor.h"
+#include "platform/linux/base/descriptor.h"
 #include "platform/linux/linux_platform.h"
 
 namespace {

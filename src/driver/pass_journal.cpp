@@ -10,8 +10,9 @@
 #include "driver/pass_journal.h"
 
 #include <algorithm>
-#include <charconv>
 #include <utility>
+
+#include "values/digits.h"
 
 namespace quorlet {
 namespace {
@@ -29,13 +30,6 @@ constexpr char kCorruptionsReported[] = "DatabaseCorruptionsReported";
 bool IsSet(const Dictionary& entry, std::string_view flag) {
   const PropertyValue* value = entry.find(flag);
   return value != nullptr && *value == PropertyValue(true);
-}
-
-std::optional<std::int32_t> DayOf(std::string_view name) {
-  std::int32_t day = 0;
-  const auto [end, error] = std::from_chars(name.data(), name.data() + name.size(), day);
-  return error == std::errc() && end == name.data() + name.size() ? std::optional(day)
-                                                                  : std::nullopt;
 }
 
 // What is left to know of an entry once its pass is finished.
@@ -80,7 +74,7 @@ std::optional<std::set<std::int32_t>> closedDays(CounterStore& store, std::int64
   std::set<std::int32_t> closed;
   if (!stored) return closed;
   for (const auto& [name, value] : *stored) {
-    const std::optional<std::int32_t> day = DayOf(name);
+    const std::optional<std::int32_t> day = ParseNumber<std::int32_t>(name);
     const Dictionary* entry = value.asDictionary();
     if (!day || entry == nullptr || !IsSet(*entry, "submission")) continue;
     if (IsSet(*entry, "finished") || (IsSet(*entry, "gated") && gateDay >= *day)) {
@@ -111,7 +105,7 @@ void PassJournal::readEntries(std::int64_t gateDay) {
   if (!isRead || !stored) return;
   const std::int32_t first = store.TLDaysSince1970() - kDaysKept;
   for (const auto& [name, value] : *stored) {
-    const std::optional<std::int32_t> day = DayOf(name);
+    const std::optional<std::int32_t> day = ParseNumber<std::int32_t>(name);
     const Dictionary* entry = value.asDictionary();
     if (!day || *day < first || entry == nullptr) continue;
     Dictionary kept = entry->shallowCopy();

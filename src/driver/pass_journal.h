@@ -11,9 +11,9 @@
 #include <vector>
 
 #include "collectors/platform_statistics.h"
+#include "drvreport/property_value.h"
 #include "platform/platform.h"
 #include "report/report.h"
-#include "values/property_value.h"
 
 namespace quorlet {
 

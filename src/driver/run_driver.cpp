@@ -5,10 +5,10 @@
 #include <string>
 
 #include "collectors/platform_statistics.h"
+#include "collectors/run_step.h"
 #include "driver/consent.h"
 #include "driver/pass_journal.h"
 #include "driver/tasking.h"
-#include "platform/run_step.h"
 #include "report/report.h"
 
 namespace quorlet {

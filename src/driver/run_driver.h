@@ -7,9 +7,9 @@
 #include <optional>
 #include <vector>
 
+#include "drvreport/property_value.h"
 #include "platform/platform.h"
 #include "report/report.h"
-#include "values/property_value.h"
 
 namespace quorlet {
 

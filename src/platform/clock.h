@@ -2,7 +2,7 @@
 #ifndef QUORLET_PLATFORM_CLOCK_H_
 #define QUORLET_PLATFORM_CLOCK_H_
 
-#include "values/property_value.h"
+#include "drvreport/property_value.h"
 
 namespace quorlet {
 

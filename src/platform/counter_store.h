@@ -17,7 +17,7 @@
 #include <utility>
 #include <vector>
 
-#include "values/property_value.h"
+#include "drvreport/property_value.h"
 
 namespace quorlet {
 

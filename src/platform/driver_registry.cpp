@@ -1,4 +1,4 @@
-#include "platform/driver_registry.h"
+#include "drvreport/driver_registry.h"
 
 namespace quorlet {
 

@@ -3,8 +3,9 @@
 #define QUORLET_PLATFORM_OS_VERSION_H_
 
 #include <optional>
+#include <string>
 
-#include "values/property_value.h"
+#include "drvreport/property_value.h"
 
 namespace quorlet {
 
@@ -16,6 +17,10 @@ class OSVersion {
   // nothing when the version cannot be read.
   virtual std::optional<Dictionary> CopySystemVersionDictionary() = 0;
 };
+
+// "ProductName ProductVersion (ProductBuildVersion)", without what is missing; "unknown" when
+// nothing is there.
+std::string OSVersionText(OSVersion& osVersion);
 
 }  // namespace quorlet
 

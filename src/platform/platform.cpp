@@ -6,7 +6,7 @@ Platform Platform::with(const Others& others) const {
   return {
       .log = log,
       .clock = clock,
-      .preferences = preferences,
+      .preferences = others.preferences != nullptr ? *others.preferences : preferences,
       .counterStore = others.counterStore != nullptr ? *others.counterStore : counterStore,
       .diagnostics = others.diagnostics != nullptr ? *others.diagnostics : diagnostics,
       .crashSupport = others.crashSupport != nullptr ? *others.crashSupport : crashSupport,

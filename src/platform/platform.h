@@ -2,13 +2,13 @@
 #ifndef QUORLET_PLATFORM_PLATFORM_H_
 #define QUORLET_PLATFORM_PLATFORM_H_
 
+#include "drvreport/driver_registry.h"
 #include "platform/applications.h"
 #include "platform/clock.h"
 #include "platform/counter_store.h"
 #include "platform/crash_support.h"
 #include "platform/device_info.h"
 #include "platform/diagnostics.h"
-#include "platform/driver_registry.h"
 #include "platform/drives.h"
 #include "platform/environment.h"
 #include "platform/environment_queries.h"
@@ -55,6 +55,7 @@ struct Platform {
   StandardError& standardError;
 
   struct Others {
+    Preferences* preferences = nullptr;
     CounterStore* counterStore = nullptr;
     Diagnostics* diagnostics = nullptr;
     CrashSupport* crashSupport = nullptr;

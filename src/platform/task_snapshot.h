@@ -5,7 +5,7 @@
 #include <cstdint>
 #include <optional>
 
-#include "values/property_value.h"
+#include "drvreport/property_value.h"
 
 namespace quorlet {
 

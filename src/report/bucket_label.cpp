@@ -1,10 +1,9 @@
 #include "report/bucket_label.h"
 
-#include <charconv>
 #include <cstdint>
 #include <limits>
-#include <system_error>
 
+#include "values/digits.h"
 #include "values/text.h"
 
 namespace quorlet {
@@ -12,23 +11,14 @@ namespace {
 
 constexpr std::string_view kSeparator = ", ";
 
-template <typename T>
-std::optional<T> WholeText(std::string_view text) {
-  T value{};
-  const char* const end = text.data() + text.size();
-  const auto [stopped, error] = std::from_chars(text.data(), end, value);
-  if (error != std::errc() || stopped != end) return std::nullopt;
-  return value;
-}
-
 }  // namespace
 
 std::optional<Number> ParseLoggedNumber(std::string_view text) {
-  if (const auto integer = WholeText<std::int64_t>(text)) {
+  if (const auto integer = ParseNumber<std::int64_t>(text)) {
     return Number::Signed(NumberKind::kInt64, *integer);
   }
-  if (const auto integer = WholeText<std::uint64_t>(text)) return Number::Unsigned(*integer);
-  if (const auto real = WholeText<double>(text)) return Number::Real(NumberKind::kDouble, *real);
+  if (const auto integer = ParseNumber<std::uint64_t>(text)) return Number::Unsigned(*integer);
+  if (const auto real = ParseNumber<double>(text)) return Number::Real(NumberKind::kDouble, *real);
   return std::nullopt;
 }
 

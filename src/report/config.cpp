@@ -74,12 +74,13 @@ std::vector<WhitelistFault> MergeWhitelist(const Dictionary& root,
   return faults;
 }
 
-bool IsGroupEnabled(const std::string& group, bool isInternalDevice, Platform& platform) {
+bool IsGroupEnabled(const std::string& group, bool isInternalDevice, Preferences& preferences,
+                    SystemLog& log) {
   if (group == kInternalTesting && !isInternalDevice) return false;
   bool found = false;
-  const bool value = platform.preferences.DGWPreferencesGetBoolValue(group, kTaskingDomain, found);
+  const bool value = preferences.DGWPreferencesGetBoolValue(group, kTaskingDomain, found);
   if (!value && !isInternalDevice && found) {
-    platform.log.log("keyGroup %@ is disabled by tasking", group);
+    log.log("keyGroup %@ is disabled by tasking", group);
     return false;
   }
   return true;
@@ -110,7 +111,7 @@ std::optional<TLConfig> TLConfig::init(Platform& platform, bool* isUnreadable) {
   }
 
   const auto enabled = [&](const std::string& group) {
-    return IsGroupEnabled(group, config._isInternalDevice, platform);
+    return IsGroupEnabled(group, config._isInternalDevice, platform.preferences, platform.log);
   };
   const auto faults = MergeWhitelist(*root, enabled,
                                      {config._scalarKeys, config._scalarPrefixes,

@@ -14,9 +14,9 @@
 #include <string_view>
 #include <vector>
 
+#include "drvreport/property_value.h"
 #include "platform/platform.h"
 #include "report/key_options.h"
-#include "values/property_value.h"
 
 namespace quorlet {
 
@@ -47,7 +47,8 @@ std::vector<WhitelistFault> MergeWhitelist(const Dictionary& root,
 
 // Whether a whitelist group counts on this device. A group that tasking has switched off is
 // logged; internal devices have all groups.
-bool IsGroupEnabled(const std::string& group, bool isInternalDevice, Platform& platform);
+bool IsGroupEnabled(const std::string& group, bool isInternalDevice, Preferences& preferences,
+                    SystemLog& log);
 
 // The entry of the whitelist that applies to a key.
 struct KeyMatch {

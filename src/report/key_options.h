@@ -9,7 +9,7 @@
 #include <string_view>
 #include <vector>
 
-#include "values/property_value.h"
+#include "drvreport/property_value.h"
 
 namespace quorlet {
 

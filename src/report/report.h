@@ -10,9 +10,9 @@
 #include <unordered_map>
 #include <vector>
 
+#include "drvreport/property_value.h"
 #include "platform/platform.h"
 #include "report/config.h"
-#include "values/property_value.h"
 
 namespace quorlet {
 

@@ -3,29 +3,26 @@
 #include <unistd.h>
 
 #include <algorithm>
-#include <bit>
-#include <cinttypes>
-#include <cstdio>
 #include <cstring>
 #include <string>
 
 #include "values/byte_reader.h"
+#include "values/digits.h"
 #include "values/text.h"
 
 namespace quorlet {
 namespace {
 
-constexpr std::uint16_t kSizeOnlyFlag = 1;
 constexpr std::uint32_t kConnectionType = 0;
 constexpr char kNoConnectionMessage[] = "Could not get connection to service\n";
 
-constexpr SelectorPair statsSelectors{13, 13};
-constexpr SelectorPair bandStatsSelector{11, 11};
-constexpr SelectorPair defectsListSelector{15, 15};
-constexpr SelectorPair telemetryListSelectors{17, 17};
-constexpr SelectorPair taskSchedulerSelectors{39, 39};
-constexpr SelectorPair snapshotSelectors{22, 22};
-constexpr SelectorPair snapshotHeaderSelectors{145, 145};
+constexpr SelectorPair statsSelectors{kStatisticsSelector, kStatisticsSelector};
+constexpr SelectorPair bandStatsSelector{kBandStatisticsSelector, kBandStatisticsSelector};
+constexpr SelectorPair defectsListSelector{kDefectsListSelector, kDefectsListSelector};
+constexpr SelectorPair telemetryListSelectors{kTelemetryListSelector, kTelemetryListSelector};
+constexpr SelectorPair taskSchedulerSelectors{kTaskSchedulerSelector, kTaskSchedulerSelector};
+constexpr SelectorPair snapshotSelectors{kSnapshotSelector, kSnapshotSelector};
+constexpr SelectorPair snapshotHeaderSelectors{kSnapshotHeaderSelector, kSnapshotHeaderSelector};
 // Two exports with one selector would be read as each other.
 static_assert([] {
   auto selectors = std::array{statsSelectors,         bandStatsSelector,      defectsListSelector,
@@ -36,13 +33,13 @@ static_assert([] {
 }());
 
 // What every class that is known has in common.
-constexpr StorageExporter MakeRow(std::string_view className, std::string_view characteristicsKey,
-                                  std::uint32_t contentAdviceMethod, std::uint32_t exportMethod) {
-  return {.className = className,
-          .characteristicsKey = characteristicsKey,
+constexpr StorageExporter MakeRow(const StorageClass& storageClass,
+                                  std::uint32_t contentAdviceMethod) {
+  return {.className = storageClass.name,
+          .characteristicsKey = storageClass.characteristicsKey,
           .contentAdviceMethod = contentAdviceMethod,
-          .queryMethod = exportMethod,
-          .fetchMethod = exportMethod,
+          .queryMethod = storageClass.exportMethod,
+          .fetchMethod = storageClass.exportMethod,
           .getStatsSelectors = FSPGetStatsSelectors,
           .getDefectsListSelectors = FSPGetDefectsListSelectors,
           .getTelemetryListSelectors = FSPGetTelemetryListSelectors,
@@ -54,15 +51,10 @@ constexpr StorageExporter MakeRow(std::string_view className, std::string_view c
           .releaseContext = FSPReleaseContext};
 }
 
-std::string Hexadecimal(std::uint32_t number) {
-  char text[9];
-  std::snprintf(text, sizeof text, "%" PRIx32, number);
-  return text;
-}
-
 // False after a message, or without one when the row has no statistics export or the parser does
 // not accept it.
-bool FetchAndParse(Platform& platform, ExporterConnection& connection, FSPParseContext& context) {
+bool FetchAndParse(const DriverServices& services, ExporterConnection& connection,
+                   FSPParseContext& context) {
   const StorageExporter& row = connection.row();
   const SelectorPair* selectors = nullptr;
   if (row.getStatsSelectors != nullptr) {
@@ -71,20 +63,20 @@ bool FetchAndParse(Platform& platform, ExporterConnection& connection, FSPParseC
   }
   std::uint32_t size = 0;
   if (const KernelReturn status = connection.querySize(selectors, 0, size); status != 0) {
-    platform.standardError.write(
+    services.standardError.write(
         FormatText("CallDriverStruct: %d", static_cast<std::int32_t>(status)));
     return false;
   }
   const auto buffer = ExportBuffer::Allocate(size);
   if (!buffer) {
-    platform.standardError.write(FormatText("Could not valloc %u bytes", size));
+    services.standardError.write(FormatText("Could not valloc %u bytes", size));
     return false;
   }
   std::size_t written = 0;
   if (connection.fetch(selectors, 0, buffer->bytes(), written) != 0) {
     const std::uint32_t selector = selectors != nullptr ? selectors->fetch : 0;
-    platform.standardError.write(
-        FormatText("Could not retrieve data from driver for selector %s\n", Hexadecimal(selector)));
+    services.standardError.write(
+        FormatText("Could not retrieve data from driver for selector %s\n", HexNumber(selector)));
     return false;
   }
   return row.parseBufferToCxt(context, buffer->bytes().first(written));
@@ -101,8 +93,8 @@ const SelectorPair* FSPGetSnapshotHeaderSelectors() { return &snapshotHeaderSele
 const SelectorPair* FSPGetBandStatsSelectors() { return &bandStatsSelector; }
 
 constexpr std::array<StorageExporter, 3> nand_exporters{
-    MakeRow("FSPStorage", "Device Characteristics", 5, 8),
-    MakeRow("NuvexEmbeddedNVMeController", "Controller Characteristics", kNoMethod, 9),
+    MakeRow(kFlashStorageClass, 5),
+    MakeRow(kNvmeStorageClass, kNoMethod),
     StorageExporter(),
 };
 
@@ -112,15 +104,6 @@ RegistryHandle findNandExporter(DriverRegistry& registry, const StorageExporter*
     if (const RegistryHandle service = registry.FindServiceByClass(row->className)) return service;
   }
   return 0;
-}
-
-static_assert(std::endian::native == std::endian::little);
-
-ExportRequest MakeExportRequest(std::uint32_t selector, std::uint16_t flags) {
-  ExportRequest request{};
-  std::memcpy(&request[0], &selector, sizeof selector);
-  std::memcpy(&request[4], &flags, sizeof flags);
-  return request;
 }
 
 std::optional<ExportBuffer> ExportBuffer::Allocate(std::size_t size) {
@@ -134,20 +117,20 @@ std::optional<ExportBuffer> ExportBuffer::Allocate(std::size_t size) {
   return ExportBuffer(memory, size);
 }
 
-ExporterConnection::ExporterConnection(Platform& platform, RegistryHandle service,
+ExporterConnection::ExporterConnection(const DriverServices& services, RegistryHandle service,
                                        const StorageExporter& row)
-    : platform_(platform), service_(service), row_(row) {
-  if (platform.driverRegistry.OpenDriverConnection(service, kConnectionType, connection_) != 0) {
+    : services_(services), service_(service), row_(row) {
+  if (services.driverRegistry.OpenDriverConnection(service, kConnectionType, connection_) != 0) {
     connection_ = 0;
   }
-  if (connection_ == 0) platform.standardError.write(kNoConnectionMessage);
+  if (connection_ == 0) services.standardError.write(kNoConnectionMessage);
 }
 
 ExporterConnection::~ExporterConnection() {
-  if (connection_ != 0 && platform_.driverRegistry.CloseDriverConnection(connection_) != 0) {
-    platform_.standardError.write(std::string(kConnectionNotClosed) + '\n');
+  if (connection_ != 0 && services_.driverRegistry.CloseDriverConnection(connection_) != 0) {
+    services_.standardError.write(std::string(kConnectionNotClosed) + '\n');
   }
-  platform_.driverRegistry.ReleaseHandle(service_);
+  services_.driverRegistry.ReleaseHandle(service_);
 }
 
 KernelReturn ExporterConnection::querySize(const SelectorPair* selectors, std::uint16_t flags,
@@ -177,23 +160,24 @@ KernelReturn ExporterConnection::call(std::uint32_t method, const std::uint32_t*
     input = request;
   }
   const KernelReturn status =
-      platform_.driverRegistry.CallDriverStruct(connection_, method, input, output, written);
+      services_.driverRegistry.CallDriverStruct(connection_, method, input, output, written);
   written = std::min(written, output.size());
   return status;
 }
 
-bool FetchAndParseStats(Platform& platform, const StorageExporter*& row, FSPParseContext& context) {
-  const RegistryHandle service = findNandExporter(platform.driverRegistry, row);
+bool FetchAndParseStats(const DriverServices& services, const StorageExporter*& row,
+                        FSPParseContext& context) {
+  const RegistryHandle service = findNandExporter(services.driverRegistry, row);
   if (service == 0) {
-    platform.standardError.write(kNoExporterMessage);
+    services.standardError.write(kNoExporterMessage);
     return false;
   }
-  ExporterConnection connection(platform, service, *row);
-  return connection && FetchAndParse(platform, connection, context);
+  ExporterConnection connection(services, service, *row);
+  return connection && FetchAndParse(services, connection, context);
 }
 
-bool NandRecommendsContentDeletion(Platform& platform) {
-  DriverRegistry& registry = platform.driverRegistry;
+bool NandRecommendsContentDeletion(const DriverServices& services) {
+  DriverRegistry& registry = services.driverRegistry;
   const StorageExporter* row = nullptr;
   const RegistryHandle service = findNandExporter(registry, row);
   if (row->contentAdviceMethod == kNoMethod) {
@@ -201,11 +185,11 @@ bool NandRecommendsContentDeletion(Platform& platform) {
     return false;
   }
   if (service == 0) {
-    platform.standardError.write(
+    services.standardError.write(
         "_load_nand_infoCould not get matching Devreg service for exporting classes\n");
     return false;
   }
-  const ExporterConnection connection(platform, service, *row);
+  const ExporterConnection connection(services, service, *row);
   if (!connection) return false;
   std::array<std::byte, sizeof(std::uint32_t)> answer{};
   std::size_t written = 0;
@@ -215,50 +199,50 @@ bool NandRecommendsContentDeletion(Platform& platform) {
          ByteReader(answer).little<std::uint32_t>() != 0;
 }
 
-RegistryHandle FNDConnect(Platform& platform, const StorageExporter*& row) {
-  DriverRegistry& registry = platform.driverRegistry;
+RegistryHandle FNDConnect(const DriverServices& services, const StorageExporter*& row) {
+  DriverRegistry& registry = services.driverRegistry;
   const RegistryHandle service = findNandExporter(registry, row);
   if (service == 0) {
-    platform.standardError.write("No class found");
+    services.standardError.write("No class found");
     return 0;
   }
   RegistryHandle connection = 0;
   const KernelReturn status = registry.OpenDriverConnection(service, kConnectionType, connection);
   registry.ReleaseHandle(service);
   if (status == kKernelSuccess) return connection;
-  platform.standardError.write(
+  services.standardError.write(
       FormatText("OpenDriverConnection failed for class '%s', result 0x%s\n", row->className,
-                 Hexadecimal(status)));
+                 HexNumber(status)));
   return 0;
 }
 
-void FNDDisconnect(Platform& platform, RegistryHandle connection) {
-  if (platform.driverRegistry.CloseDriverConnection(connection) != kKernelSuccess) {
-    platform.standardError.write("closing connection to service failed\n");
+void FNDDisconnect(const DriverServices& services, RegistryHandle connection) {
+  if (services.driverRegistry.CloseDriverConnection(connection) != kKernelSuccess) {
+    services.standardError.write("closing connection to service failed\n");
   }
 }
 
-bool openFSPConnection(Platform& platform, FSPConnection& connection) {
+bool openFSPConnection(const DriverServices& services, FSPConnection& connection) {
   connection = {};
-  connection.service = findNandExporter(platform.driverRegistry, connection.exporter);
+  connection.service = findNandExporter(services.driverRegistry, connection.exporter);
   if (connection.service == 0) {
-    platform.standardError.write("Can't get FSP Connection, no matching service!\n");
+    services.standardError.write("Can't get FSP Connection, no matching service!\n");
     return false;
   }
-  connection.connection = FNDConnect(platform, connection.exporter);
+  connection.connection = FNDConnect(services, connection.exporter);
   if (connection.connection != 0 &&
       connection.exporter->getStatsSelectors == FSPGetStatsSelectors) {
     return true;
   }
-  platform.standardError.write("Can't get FSP Connection!\n");
-  closeFSPConnection(platform, connection);
+  services.standardError.write("Can't get FSP Connection!\n");
+  closeFSPConnection(services, connection);
   return false;
 }
 
-void closeFSPConnection(Platform& platform, FSPConnection& connection) {
-  if (connection.connection != 0) FNDDisconnect(platform, connection.connection);
+void closeFSPConnection(const DriverServices& services, FSPConnection& connection) {
+  if (connection.connection != 0) FNDDisconnect(services, connection.connection);
   connection.connection = 0;
-  if (connection.service != 0) platform.driverRegistry.ReleaseHandle(connection.service);
+  if (connection.service != 0) services.driverRegistry.ReleaseHandle(connection.service);
   connection.service = 0;
 }
 

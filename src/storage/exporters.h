@@ -16,6 +16,7 @@
 #include <string_view>
 
 #include "platform/platform.h"
+#include "platform/storage_exports.h"
 #include "storage/statistics_parser.h"
 
 namespace quorlet {
@@ -71,17 +72,17 @@ inline constexpr std::string_view kConnectionNotClosed = "Could not close connec
 
 // --- One export ---------------------------------------------------------------------------------
 
-// The flags of an export request: bit 0 is the size query's own.
-constexpr std::uint16_t ExportFlags(bool requestFlag, std::uint8_t listIndex) {
-  return static_cast<std::uint16_t>((requestFlag ? 2U : 0U) | (unsigned{listIndex} << 2));
-}
-
-// The input block of the export methods: selector u32, flags u16, the rest zero; little-endian.
-using ExportRequest = std::array<std::byte, 24>;
-ExportRequest MakeExportRequest(std::uint32_t selector, std::uint16_t flags);
-
 // The largest export that is fetched; no controller has so much to tell.
 inline constexpr std::size_t kMaxExportBytes = std::size_t{64} << 20;
+
+// What it takes to ask a driver: the registry, and where failures are said.
+struct DriverServices {
+  // NOLINTNEXTLINE(google-explicit-constructor): a narrower view of the same services
+  DriverServices(const Platform& platform)
+      : driverRegistry(platform.driverRegistry), standardError(platform.standardError) {}
+  DriverRegistry& driverRegistry;
+  StandardError& standardError;
+};
 
 // Zeroed, page-aligned memory that a driver writes an export to.
 class ExportBuffer {
@@ -104,7 +105,8 @@ class ExporterConnection {
  public:
   // Takes over `service`, as findNandExporter found it with `row`. Without a connection, the object
   // is false and a message has been written.
-  ExporterConnection(Platform& platform, RegistryHandle service, const StorageExporter& row);
+  ExporterConnection(const DriverServices& services, RegistryHandle service,
+                     const StorageExporter& row);
   // Writes a message when the connection cannot be closed.
   ~ExporterConnection();
   ExporterConnection(const ExporterConnection&) = delete;
@@ -126,7 +128,7 @@ class ExporterConnection {
   KernelReturn call(std::uint32_t method, const std::uint32_t* selector, unsigned flags,
                     std::span<std::byte> output, std::size_t& written);
 
-  Platform& platform_;
+  const DriverServices services_;
   const RegistryHandle service_;
   const StorageExporter& row_;
   RegistryHandle connection_ = 0;
@@ -135,16 +137,17 @@ class ExporterConnection {
 // Fetches the statistics export and parses it. `row` becomes the exporter's row in any case; the
 // caller releases `context` with the row's releaseContext, when it has one, whether or not the
 // parse went well. True only when the parser accepted the export.
-bool FetchAndParseStats(Platform& platform, const StorageExporter*& row, FSPParseContext& context);
+bool FetchAndParseStats(const DriverServices& services, const StorageExporter*& row,
+                        FSPParseContext& context);
 
 // Whether the driver says that content should be deleted; false for a driver without an answer.
-bool NandRecommendsContentDeletion(Platform& platform);
+bool NandRecommendsContentDeletion(const DriverServices& services);
 
 // --- Connections that the caller keeps ----------------------------------------------------------
 
 // A connection to the exporter's driver for the caller to close with FNDDisconnect, or 0.
-RegistryHandle FNDConnect(Platform& platform, const StorageExporter*& row);
-void FNDDisconnect(Platform& platform, RegistryHandle connection);
+RegistryHandle FNDConnect(const DriverServices& services, const StorageExporter*& row);
+void FNDDisconnect(const DriverServices& services, RegistryHandle connection);
 
 struct FSPConnection {
   RegistryHandle service = 0;
@@ -154,9 +157,9 @@ struct FSPConnection {
 
 // Fills `connection`, for the caller to close with closeFSPConnection. False, with everything given
 // back, without an exporter that has the usual statistics export.
-bool openFSPConnection(Platform& platform, FSPConnection& connection);
+bool openFSPConnection(const DriverServices& services, FSPConnection& connection);
 // Gives back what there is.
-void closeFSPConnection(Platform& platform, FSPConnection& connection);
+void closeFSPConnection(const DriverServices& services, FSPConnection& connection);
 
 }  // namespace quorlet
 

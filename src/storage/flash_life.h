@@ -8,9 +8,9 @@
 #include <string>
 #include <string_view>
 
+#include "drvreport/property_value.h"
 #include "platform/counter_store.h"
 #include "platform/drives.h"
-#include "values/property_value.h"
 
 namespace quorlet {
 

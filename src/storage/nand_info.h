@@ -10,9 +10,9 @@
 #include <optional>
 #include <string_view>
 
+#include "drvreport/property_value.h"
 #include "platform/platform.h"
 #include "storage/statistics_parser.h"
-#include "values/property_value.h"
 
 namespace quorlet {
 

@@ -6,8 +6,8 @@
 #include <string>
 #include <string_view>
 
+#include "drvreport/property_value.h"
 #include "platform/platform.h"
-#include "values/property_value.h"
 
 namespace quorlet {
 

@@ -13,7 +13,6 @@
 
 #include <algorithm>
 #include <array>
-#include <charconv>
 #include <cstdint>
 #include <functional>
 #include <memory>
@@ -27,6 +26,7 @@
 #include "storage/status_log.h"
 #include "storage/telemetry.h"
 #include "values/byte_reader.h"
+#include "values/digits.h"
 #include "values/text.h"
 
 namespace quorlet {
@@ -39,11 +39,6 @@ constexpr float kThresholdLimit = 10.0F;
 
 constexpr char kNoDictionaryMessage[] = "failed to create dictionary";
 constexpr char kNotParsedMessage[] = "data cannot be parsed";
-
-std::string Hexadecimal(std::uint32_t value) {
-  char text[8];
-  return {text, std::to_chars(std::begin(text), std::end(text), value, 16).ptr};
-}
 
 // ---- Write amplification.
 
@@ -131,7 +126,8 @@ std::vector<List> ListsOf(Platform& platform, const StorageLogState& state,
     for (std::uint8_t index = 0; index < kTelemetryLists; ++index) {
       lists.push_back({row.getTelemetryListSelectors, index,
                        [&](std::span<const std::byte> buffer, std::size_t) {
-                         return LogTelemetryList(platform, buffer, characteristics);
+                         return LogTelemetryList(platform.crashSupport, platform.standardError,
+                                                 buffer, characteristics);
                        }});
     }
   } else {
@@ -158,7 +154,7 @@ bool CollectList(StandardError& errors, ExporterConnection& exporter, const List
   const KernelReturn status = exporter.querySize(selectors, flags, size);
   if (status != kKernelSuccess) {
     errors.write(FormatText("CallDriverStruct failed with status 0x%s on selector index %d\n",
-                            Hexadecimal(status), position));
+                            HexNumber(status), position));
     return true;
   }
   if (size == 0) return true;

@@ -185,9 +185,8 @@ char LowerCase(char c) { return c >= 'A' && c <= 'Z' ? static_cast<char>(c - 'A'
 
 }  // namespace
 
-bool LogTelemetryList(Platform& platform, std::span<const std::byte> buffer,
-                      const PropertyValue& characteristics) {
-  StandardError& errors = platform.standardError;
+bool LogTelemetryList(CrashSupport& crashSupport, StandardError& errors,
+                      std::span<const std::byte> buffer, const PropertyValue& characteristics) {
   const Dictionary* dictionary = characteristics.asDictionary();
   if (dictionary == nullptr) {
     errors.write("ERROR: Could not parse the Device Characteristics dictionary\n");
@@ -200,8 +199,8 @@ bool LogTelemetryList(Platform& platform, std::span<const std::byte> buffer,
     CountersRecord record{};
     device->parser(buffer.subspan(channel * kRawSize).first<kRawSize>(), record);
     const auto summary = summaries.subspan(channel * kSummarySize, kSummarySize);
-    platform.crashSupport.FSLogStructuredData(
-        kStructuredLogType, ChannelEntry(errors, summary, record, device->generation));
+    crashSupport.FSLogStructuredData(kStructuredLogType,
+                                     ChannelEntry(errors, summary, record, device->generation));
   }
   return true;
 }

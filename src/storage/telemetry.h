@@ -9,8 +9,9 @@
 #include <span>
 #include <string_view>
 
-#include "platform/platform.h"
-#include "values/property_value.h"
+#include "drvreport/property_value.h"
+#include "platform/crash_support.h"
+#include "platform/standard_error.h"
 
 namespace quorlet {
 
@@ -26,8 +27,8 @@ using RawCounters = std::span<const std::byte, kRawCounterWords * sizeof(std::ui
 // ("chip-id"), the NAND's maker ("manufacturer-id") and the number of channels ("num-bus"). False,
 // with a message on standard error and nothing logged, when one of them is missing or odd or the
 // buffer is too short for the channels.
-bool LogTelemetryList(Platform& platform, std::span<const std::byte> buffer,
-                      const PropertyValue& characteristics);
+bool LogTelemetryList(CrashSupport& crashSupport, StandardError& errors,
+                      std::span<const std::byte> buffer, const PropertyValue& characteristics);
 
 // Fill a record from one channel's raw counters; words that the layout lacks stay as they are.
 void parseCountersAlgoGenericK4(RawCounters raw, CountersRecord& record);

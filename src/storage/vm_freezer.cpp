@@ -121,13 +121,13 @@ bool getIOStatsWithThreadnameFromSnapItems(std::span<const std::byte> items,
   return false;
 }
 
-Dictionary CopyVMFreezerNANDInfo(Platform& platform) {
+Dictionary CopyVMFreezerNANDInfo(TaskSnapshot& taskSnapshot, StandardError& errors) {
   Dictionary info;
-  const auto snapshot = platform.taskSnapshot.CaptureTaskSnapshot(kTaskSnapshotTaggedItems);
+  const auto snapshot = taskSnapshot.CaptureTaskSnapshot(kTaskSnapshotTaggedItems);
   std::optional<IOStats> ioStats;
   if (snapshot && getIOStatsWithThreadnameFromSnapItems(*snapshot, kFreezerThread, ioStats)) {
     const std::uint64_t written = ioStats ? BytesWritten(*ioStats) : 0;
-    SetNumberValue(platform.standardError, info, kNANDInfoVMFreezerNumPhysicalWritesKey,
+    SetNumberValue(errors, info, kNANDInfoVMFreezerNumPhysicalWritesKey,
                    static_cast<std::int64_t>(written));
   } else {
     info[kNANDInfoVMFreezerErrorKey] = "1";

@@ -7,15 +7,16 @@
 #include <span>
 #include <string_view>
 
-#include "platform/platform.h"
-#include "values/property_value.h"
+#include "drvreport/property_value.h"
+#include "platform/standard_error.h"
+#include "platform/task_snapshot.h"
 
 namespace quorlet {
 
 // A new dictionary: "nuvex.NANDInfo.VMFreezer.NumPhysicalWrites" is the number of bytes that the
 // thread "VM_swapout" has written, 0 when the kernel has no statistics of it. When the snapshot
 // cannot be taken or lacks the thread, the two error keys of the freezer instead.
-Dictionary CopyVMFreezerNANDInfo(Platform& platform);
+Dictionary CopyVMFreezerNANDInfo(TaskSnapshot& taskSnapshot, StandardError& errors);
 
 // The payload of an I/O statistics item, in the snapshot's buffer.
 using IOStats = std::span<const std::byte>;

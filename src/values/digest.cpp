@@ -8,6 +8,8 @@
 #include <cstdint>
 #include <span>
 
+#include "values/digits.h"
+
 namespace quorlet {
 namespace {
 
@@ -20,12 +22,8 @@ std::string Hex(std::string_view bytes, void (*init)(Context*),
   init(&context);
   update(&context, bytes.size(), reinterpret_cast<const std::uint8_t*>(bytes.data()));
   finish(&context, digest.size(), digest.data());
-  constexpr std::string_view kDigits = "0123456789abcdef";
   std::string text;
-  for (const std::uint8_t byte : digest) {
-    text += kDigits[byte >> 4];
-    text += kDigits[byte & 15];
-  }
+  for (const std::uint8_t byte : digest) AppendHex(text, std::byte{byte});
   return text;
 }
 

@@ -10,7 +10,7 @@
 #include <string_view>
 #include <variant>
 
-#include "values/property_value.h"
+#include "drvreport/property_value.h"
 
 namespace quorlet {
 

@@ -3,13 +3,13 @@
 
 #include <algorithm>
 #include <array>
-#include <charconv>
 #include <chrono>
 #include <cstdint>
 #include <limits>
 #include <utility>
 
 #include "values/base64.h"
+#include "values/digits.h"
 #include "values/text.h"
 
 namespace quorlet {
@@ -58,13 +58,10 @@ std::optional<PropertyValue> IntegerFromText(std::string_view text) {
   if (negative || text.starts_with('+')) text.remove_prefix(1);
   const bool hexadecimal = text.starts_with("0x") || text.starts_with("0X");
   if (hexadecimal) text.remove_prefix(2);
-  std::uint64_t magnitude = 0;
-  const char* const end = text.data() + text.size();
-  const auto [stopped, error] = std::from_chars(text.data(), end, magnitude, hexadecimal ? 16 : 10);
-  if (error != std::errc() || stopped != end) return std::nullopt;
-  if (negative && magnitude > std::uint64_t{1} << 63) return std::nullopt;
-  if (!negative) return NumberFromBits(magnitude);
-  return Int64(static_cast<std::int64_t>(-magnitude));
+  const auto magnitude = ParseNumber<std::uint64_t>(text, hexadecimal ? 16 : 10);
+  if (!magnitude || (negative && *magnitude > std::uint64_t{1} << 63)) return std::nullopt;
+  if (!negative) return NumberFromBits(*magnitude);
+  return Int64(static_cast<std::int64_t>(-*magnitude));
 }
 
 std::optional<PropertyValue> RealFromText(std::string_view text) {
@@ -77,9 +74,9 @@ std::optional<PropertyValue> RealFromText(std::string_view text) {
     value = std::numeric_limits<double>::infinity();
   } else {
     if (text.empty() || !(IsDigit(text[0]) || text[0] == '.')) return std::nullopt;
-    const char* const end = text.data() + text.size();
-    const auto [stopped, error] = std::from_chars(text.data(), end, value);
-    if (error != std::errc() || stopped != end) return std::nullopt;
+    const auto number = ParseNumber<double>(text);
+    if (!number) return std::nullopt;
+    value = *number;
   }
   return Double(negative ? -value : value);
 }
@@ -122,12 +119,10 @@ std::optional<std::string> XmlReference(std::string_view name) {
   name.remove_prefix(1);
   const bool hexadecimal = name.starts_with('x');
   if (hexadecimal) name.remove_prefix(1);
-  std::uint32_t code = 0;
-  const char* const end = name.data() + name.size();
-  const auto [stopped, error] = std::from_chars(name.data(), end, code, hexadecimal ? 16 : 10);
-  if (error != std::errc() || stopped != end || !IsXmlCharacter(code)) return std::nullopt;
+  const auto code = ParseNumber<std::uint32_t>(name, hexadecimal ? 16 : 10);
+  if (!code || !IsXmlCharacter(*code)) return std::nullopt;
   std::string out;
-  AppendUtf8(out, code);
+  AppendUtf8(out, *code);
   return out;
 }
 

@@ -1,5 +1,5 @@
 // The value tree: numbers that compare exactly, shared containers, and the text that "%@" prints.
-#include "values/property_value.h"
+#include "drvreport/property_value.h"
 
 #include <algorithm>
 #include <charconv>
@@ -7,6 +7,7 @@
 #include <initializer_list>
 #include <limits>
 
+#include "values/digits.h"
 #include "values/text.h"
 
 namespace quorlet {
@@ -33,12 +34,6 @@ constexpr std::size_t kMaxDescribedDepth = 256;
 constexpr std::size_t kMaxDescribedBytes = 24;
 
 void AppendIndent(std::string& out, std::size_t depth) { out.append(depth * 4, ' '); }
-
-void AppendHex(std::string& out, std::byte byte) {
-  constexpr std::string_view kDigits = "0123456789abcdef";
-  out += kDigits[std::to_integer<std::size_t>(byte >> 4)];
-  out += kDigits[std::to_integer<std::size_t>(byte & std::byte{0x0F})];
-}
 
 std::string Describe(const Number& number) {
   if (!number.isReal()) {

@@ -3,9 +3,10 @@
 
 #include <algorithm>
 #include <array>
-#include <charconv>
 #include <chrono>
 #include <cmath>
+
+#include "values/digits.h"
 
 namespace quorlet {
 namespace {
@@ -127,10 +128,7 @@ void AppendUtf8(std::string& out, std::uint32_t c) {
 std::optional<std::int32_t> ParseDate(std::string_view text) {
   if (text.size() != 10 || text[4] != '-' || text[7] != '-') return std::nullopt;
   const auto number = [&](std::size_t at, std::size_t size) -> std::optional<unsigned> {
-    unsigned value = 0;
-    const char* const end = text.data() + at + size;
-    const auto [stopped, error] = std::from_chars(text.data() + at, end, value);
-    return error == std::errc() && stopped == end ? std::optional(value) : std::nullopt;
+    return ParseNumber<unsigned>(text.substr(at, size));
   };
   const auto year = number(0, 4);
   const auto month = number(5, 2);

@@ -11,7 +11,7 @@
 #include <string_view>
 #include <type_traits>
 
-#include "values/property_value.h"
+#include "drvreport/property_value.h"
 
 namespace quorlet {
 

@@ -1,7 +1,7 @@
 // The library's one public header comes first: it must need nothing before it.
 #include <gtest/gtest.h>
 
-#include "channels/drvreport.h"
+#include "drvreport/drvreport.h"
 #include "fakes/fake_driver_registry.h"
 
 namespace quorlet {
@@ -142,6 +142,9 @@ TEST_F(Discovery, ChannelsThatTheCallerDescribesAndMerges) {
   Dictionary flat = DrvReportCreateAggregate(0);
   EXPECT_EQ(DrvReportMergeChannels(&flat, &aggregate), 0);
   EXPECT_EQ(shown(flat), "6 ");
+  const Dictionary sharing = flat.shallowCopy();
+  EXPECT_EQ(DrvReportMergeChannels(&flat, &sharing), 0);
+  EXPECT_EQ(shown(flat), "6 6 ") << "what it adds is not merged again";
   EXPECT_EQ(DrvReportMergeChannels(&flat, &flat, &error), 0x111);
   EXPECT_EQ(error->reason, "bad argument");
   flat["DrvReportChannels"] = "x";

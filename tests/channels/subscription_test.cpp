@@ -1,23 +1,19 @@
 #include <gtest/gtest.h>
 
-#include "channels/drvreport.h"
 #include "channels/sample_makers.h"
+#include "drvreport/drvreport.h"
 #include "fakes/fake_driver_registry.h"
 
 namespace quorlet {
 namespace {
 
 // A run of `count` records that claims `claimed` elements.
-Data RunOf(std::int64_t driver, std::int64_t channel, std::size_t count, std::size_t claimed) {
-  Data data;
+Data RunOf(std::uint64_t driver, std::uint64_t channel, std::size_t count, std::size_t claimed) {
+  ByteWriter run;
   for (std::size_t i = 0; i < count; ++i) {
-    const auto type = static_cast<std::int64_t>(claimed << 32 | 1);
-    for (const std::int64_t word : {driver, channel, type, std::int64_t{9}, std::int64_t{100},
-                                    std::int64_t{0}, std::int64_t{0}, std::int64_t{0}}) {
-      AppendWord(data, word);
-    }
+    run.u64(driver).u64(channel).u64(claimed << 32 | 1).u64(9).u64(100).u64(0).u64(0).u64(0);
   }
-  return data;
+  return run.take();
 }
 Data Joined(std::initializer_list<Data> parts) {
   Data all;
@@ -122,11 +118,9 @@ struct Subscription : testing::Test {
 TEST_F(Subscription, TellsTheHubAndSamplesWhatItDelivers) {
   const Dictionary desired = Channels({1, 2}, 0x100000001);
   EXPECT_EQ(subscribe(&desired), "");
-  Data list;
-  for (const std::int64_t word : {2l, 7l, 1l, 0x100000001l, 7l, 2l, 0x100000001l}) {
-    AppendWord(list, word);
-  }
-  EXPECT_EQ(interests, list);
+  constexpr std::uint64_t kType = 0x100000001;
+  EXPECT_EQ(interests,
+            ByteWriter().u64(2).u64(7).u64(1).u64(kType).u64(7).u64(2).u64(kType).data());
   EXPECT_EQ(registry.mapped, std::multiset<std::uint32_t>{0x42});
   auto samples = DrvReportCreateSamples(subscription.get(), &subscribed);
   subscription.reset();

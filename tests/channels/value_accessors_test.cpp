@@ -59,14 +59,14 @@ TEST(ValueAccessorsTest, BucketBounds) {
         {4, {{1, 0, 5}}, {}},
         {4, {{1, 1, 2}}, {}},
         {4, {}, {}}}) {
-    Data config;
+    ByteWriter config;
     for (const auto& [base, mode, buckets] : segments) {
-      AppendWord(config, mode << 32 | base);
-      AppendWord(config, buckets << 32 | 9);
+      config.u32(static_cast<std::uint64_t>(base)).u32(static_cast<std::uint64_t>(mode));
+      config.u32(9).u32(static_cast<std::uint64_t>(buckets));
     }
-    config.resize(config.size() + 15);  // a part that is no segment
+    config.text("", 15);  // a part that is no segment
     Dictionary channel = Sample(3, {}, elements);
-    channel["DrvReportChannelInfo"] = Dictionary{{"DrvReportChannelConfig", config}};
+    channel["DrvReportChannelInfo"] = Dictionary{{"DrvReportChannelConfig", config.data()}};
     Bounds read;
     std::int64_t lower = 0, upper = 0, previous = 0;
     int i = 0;

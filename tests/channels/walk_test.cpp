@@ -148,8 +148,9 @@ std::optional<std::string> Compared(const Dictionary& first, const Dictionary& s
 TEST(Walk, ComparingPairsChannelsByTheirIDs) {
   EXPECT_EQ(Compared(Samples({1, 2, 3}), Samples({1, 2, 3})), "1/1 2/2 3/3 = 1 2 3");
   EXPECT_EQ(Compared(Samples({1, 9, 2, 3}), Samples({1, 2, 3})), "1/1 2/2 3/3 = 1 2 3");
-  EXPECT_EQ(Compared(Samples({1, 3}), Samples({1, 2, 3})), "1/1 = 1 2 3") << "plain copies";
-  EXPECT_EQ(Compared(Samples({2, 1, 4}), Samples({1, 2})), "1/1 = 1 2") << "looked for forwards";
+  EXPECT_EQ(Compared(Samples({1, 3}), Samples({1, 2, 3})), "1/1 3/3 = 1 2 3") << "one is new";
+  EXPECT_EQ(Compared(Samples({1, 3, 5}), Samples({1, 2, 3, 5})), "1/1 3/3 5/5 = 1 2 3 5");
+  EXPECT_EQ(Compared(Samples({2, 1, 4}), Samples({1, 2})), "1/1 2/2 = 1 2") << "another order";
   EXPECT_EQ(Compared(Samples({9, 8, 1, 1, 3}), Samples({1, 1, 3})), "1/1 1/1 3/3 = 1 1 3");
   EXPECT_EQ(Compared(Samples({}), Samples({1})), "= 1");
   EXPECT_EQ(Compared(Dictionary(), Samples({1})), std::nullopt);

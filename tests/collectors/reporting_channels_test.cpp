@@ -10,15 +10,9 @@ namespace {
 constexpr std::uint64_t kDaily = 0x1000000;  // category 0x100 in a type word
 
 Data Record(std::uint64_t channel, std::int64_t value) {
-  Data record;
-  for (const std::uint64_t word :
-       {std::uint64_t{16}, channel, kDaily | 1 | std::uint64_t{1} << 32}) {
-    AppendWord(record, static_cast<std::int64_t>(word));
-  }
-  AppendWord(record, 5);
-  AppendWord(record, value);
-  record.resize(64);
-  return record;
+  ByteWriter record;
+  record.u64(16).u64(channel).u64(kDaily | 1 | std::uint64_t{1} << 32);
+  return record.u64(5).u64(static_cast<std::uint64_t>(value)).text("", 24).take();
 }
 
 // What a pass stores under "nuvex.drvreport.", for a driver with these channels and this hub.

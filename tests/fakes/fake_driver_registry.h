@@ -10,7 +10,7 @@
 #include <string>
 #include <vector>
 
-#include "platform/driver_registry.h"
+#include "drvreport/driver_registry.h"
 
 namespace quorlet {
 

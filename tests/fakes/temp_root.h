@@ -13,7 +13,7 @@
 #include <system_error>
 #include <vector>
 
-#include "platform/linux/files.h"
+#include "platform/linux/base/files.h"
 
 namespace quorlet {
 

@@ -10,8 +10,8 @@
 
 #include "fakes/fake_platform.h"
 #include "fakes/temp_root.h"
-#include "platform/linux/counter_store.h"
-#include "platform/linux/tally_ledger.h"
+#include "platform/linux/counters/counter_store.h"
+#include "platform/linux/counters/tally_ledger.h"
 
 namespace quorlet {
 namespace {

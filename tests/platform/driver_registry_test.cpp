@@ -4,8 +4,8 @@
 #include "fakes/fake_driver_registry.h"
 #include "fakes/fake_system_log.h"
 #include "fakes/temp_root.h"
-#include "platform/linux/driver_files.h"
-#include "platform/linux/services.h"
+#include "platform/linux/registry/driver_files.h"
+#include "platform/linux/registry/services.h"
 #include "values/byte_reader.h"
 #include "values/property_list.h"
 

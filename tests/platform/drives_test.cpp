@@ -20,7 +20,7 @@
 #include "platform/linux/drives/drive_exports.h"
 #include "platform/linux/drives/drive_figures.h"
 #include "platform/linux/drives/drives_publisher.h"
-#include "platform/linux/services.h"
+#include "platform/linux/registry/services.h"
 #include "storage/nand_info.h"
 #include "values/byte_reader.h"
 

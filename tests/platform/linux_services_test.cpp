@@ -7,8 +7,10 @@
 
 #include "fakes/fake_platform.h"
 #include "fakes/temp_root.h"
-#include "platform/linux/descriptor.h"
-#include "platform/linux/services.h"
+#include "platform/linux/base/descriptor.h"
+#include "platform/linux/base/services.h"
+#include "platform/linux/device/services.h"
+#include "platform/linux/logs/services.h"
 #include "platform/sync_recorder.h"
 
 namespace quorlet {

@@ -8,7 +8,7 @@
 
 #include "fakes/fake_system_log.h"
 #include "fakes/temp_root.h"
-#include "platform/linux/kernel_text.h"
+#include "platform/linux/base/kernel_text.h"
 #include "platform/linux/live/live_source.h"
 #include "values/byte_reader.h"
 

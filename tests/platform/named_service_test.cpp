@@ -1,5 +1,3 @@
-#include "platform/linux/named_service.h"
-
 #include <gtest/gtest.h>
 #include <sys/resource.h>
 #include <sys/socket.h>
@@ -12,10 +10,11 @@
 
 #include "fakes/fake_system_log.h"
 #include "fakes/temp_root.h"
-#include "platform/linux/frame_buffer.h"
-#include "platform/linux/listening_socket.h"
-#include "platform/linux/paths.h"
-#include "platform/linux/unix_socket.h"
+#include "platform/linux/base/paths.h"
+#include "platform/linux/service/frame_buffer.h"
+#include "platform/linux/service/listening_socket.h"
+#include "platform/linux/service/services.h"
+#include "platform/linux/service/unix_socket.h"
 #include "values/property_list.h"
 
 namespace quorlet {

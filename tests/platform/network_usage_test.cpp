@@ -1,5 +1,5 @@
 // The network-usage service over files below a root, and the semaphores that its callers wait on.
-#include "platform/linux/network_usage.h"
+#include "platform/linux/network/network_usage.h"
 
 #include <gtest/gtest.h>
 
@@ -9,7 +9,7 @@
 
 #include "fakes/fake_system_log.h"
 #include "fakes/temp_root.h"
-#include "platform/linux/semaphores.h"
+#include "platform/linux/base/semaphores.h"
 
 namespace quorlet {
 namespace {

@@ -9,7 +9,7 @@
 
 #include "fakes/fake_platform.h"
 #include "fakes/temp_root.h"
-#include "platform/linux/services.h"
+#include "platform/linux/state/services.h"
 #include "values/property_list.h"
 
 namespace quorlet {

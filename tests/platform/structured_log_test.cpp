@@ -11,7 +11,7 @@
 
 #include "fakes/fake_platform.h"
 #include "fakes/temp_root.h"
-#include "platform/linux/services.h"
+#include "platform/linux/logs/services.h"
 #include "platform/sync_recorder.h"
 
 namespace quorlet {

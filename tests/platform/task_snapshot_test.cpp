@@ -5,7 +5,8 @@
 
 #include "fakes/fake_platform.h"
 #include "fakes/temp_root.h"
-#include "platform/linux/services.h"
+#include "platform/linux/device/services.h"
+#include "platform/linux/logs/services.h"
 #include "values/byte_reader.h"
 
 namespace quorlet {

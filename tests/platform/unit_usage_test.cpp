@@ -1,6 +1,6 @@
 // The usage of the machine's services: kinds of network from recorded trees, and a service manager
 // that answers well, badly or not at all.
-#include "platform/linux/unit_usage.h"
+#include "platform/linux/network/unit_usage.h"
 
 #include <gtest/gtest.h>
 #include <sys/socket.h>
@@ -9,8 +9,8 @@
 #include <future>
 
 #include "fakes/temp_root.h"
-#include "platform/linux/descriptor.h"
-#include "platform/linux/network_links.h"
+#include "platform/linux/base/descriptor.h"
+#include "platform/linux/network/network_links.h"
 
 namespace quorlet {
 namespace {

@@ -94,7 +94,9 @@ TEST_F(ChannelsCommandTest, SelectionsNarrowEachOtherDown) {
       {{"--format", "0x2"}, {"0x2"}},
       {{"--subgroup", "Radio", "--format", "state"}, {"0x2"}},
       {{"--unit", "72058113728970752"}, {"0x2", "0x3", "0x696f2e736f6d6500"}},
+      {{"--unit", "us"}, {"0x2", "0x3", "0x696f2e736f6d6500"}},
       {{"--id", "0X2"}, {"0x2"}},
+      {{"--id", "x"}, {}},
       {{"--group", "Radio"}, {}},
   };
   for (const auto& [options, expected] : cases) {

@@ -5,7 +5,7 @@
 #include <list>
 #include <tuple>
 
-#include "platform/linux/unix_socket.h"
+#include "platform/linux/service/unix_socket.h"
 #include "program/program_device.h"
 
 namespace quorlet {

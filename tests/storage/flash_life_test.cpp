@@ -2,8 +2,8 @@
 
 #include <gtest/gtest.h>
 
+#include "collectors/flash_wear.h"
 #include "fakes/fake_platform.h"
-#include "storage/flash_record.h"
 
 namespace quorlet {
 namespace {
@@ -33,7 +33,7 @@ struct Recorder {
     device.clock.seconds = reading.day * 86400.0 + 60;
     device.counterStore.TLClientCheckpoint();
     CounterBatch counters(device.counterStore);
-    RecordFlash(device.services, counters);
+    RecordFlash(device.drives, device.counterStore, counters);
     EXPECT_TRUE(counters.commit());
   }
   // "days, bytes a day, percent a day, amplification, days left", "?" for what is not known.
@@ -121,7 +121,7 @@ TEST(FlashLifeTest, WhatIsRememberedOutlivesTheStoresDaysAndItsDamage) {
   }
   recorder.device.drives.drives = drives;
   CounterBatch counters(recorder.device.counterStore);
-  RecordFlash(recorder.device.services, counters);
+  RecordFlash(recorder.device.drives, recorder.device.counterStore, counters);
   EXPECT_TRUE(counters.commit());
   EXPECT_EQ(recorder.device.counterStore.notes[kFlashNote].size(), 64u);
 }

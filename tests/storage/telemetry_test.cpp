@@ -21,7 +21,7 @@ bool LogList(FakePlatform& device, const PropertyValue& characteristics, std::si
   std::iota(words.begin() + 1024, words.begin() + 2048, 10000);
   std::iota(words.begin() + 2048, words.end(), 30000);
   const auto list = std::as_bytes(std::span(words)).first(length);
-  return LogTelemetryList(device.services, list, characteristics);
+  return LogTelemetryList(device.crashSupport, device.standardError, list, characteristics);
 }
 
 TEST(Telemetry, WordMapsByDevice) {

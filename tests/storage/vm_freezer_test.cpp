@@ -26,7 +26,7 @@ std::int64_t Found(const std::optional<std::string>& bytes) {
     const auto snapshot = std::as_bytes(std::span(*bytes));
     platform.taskSnapshot.buffer = Data(snapshot.begin(), snapshot.end());
   }
-  const Dictionary info = CopyVMFreezerNANDInfo(platform.services);
+  const Dictionary info = CopyVMFreezerNANDInfo(platform.taskSnapshot, platform.standardError);
   const std::string prefix = "nuvex.NANDInfo.VMFreezer.";
   const Dictionary error{
       {prefix + "Error", "1"},

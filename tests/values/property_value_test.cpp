@@ -1,4 +1,4 @@
-#include "values/property_value.h"
+#include "drvreport/property_value.h"
 
 #include <gtest/gtest.h>
 

@@ -5,16 +5,20 @@
 #include <utility>
 #include <vector>
 
-#include "platform/linux/counter_store.h"
-#include "platform/linux/driver_files.h"
+#include "platform/linux/base/semaphores.h"
+#include "platform/linux/base/services.h"
+#include "platform/linux/counters/counter_store.h"
+#include "platform/linux/device/services.h"
 #include "platform/linux/drives/drive_exports.h"
 #include "platform/linux/drives/drive_reader.h"
 #include "platform/linux/drives/drives_publisher.h"
 #include "platform/linux/live/live_source.h"
-#include "platform/linux/named_service.h"
-#include "platform/linux/network_usage.h"
-#include "platform/linux/semaphores.h"
-#include "platform/linux/services.h"
+#include "platform/linux/logs/services.h"
+#include "platform/linux/network/network_usage.h"
+#include "platform/linux/registry/driver_files.h"
+#include "platform/linux/registry/services.h"
+#include "platform/linux/service/services.h"
+#include "platform/linux/state/services.h"
 
 namespace quorlet {
 namespace {

@@ -4,9 +4,9 @@
 
 #include <memory>
 
-#include "platform/linux/access.h"
-#include "platform/linux/files.h"
-#include "platform/linux/tally_ledger.h"
+#include "platform/linux/base/access.h"
+#include "platform/linux/base/files.h"
+#include "platform/linux/counters/tally_ledger.h"
 #include "platform/platform.h"
 
 namespace quorlet {

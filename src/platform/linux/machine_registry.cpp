@@ -1,11 +1,11 @@
-#include "platform/linux/machine_registry.h"
+#include "drvreport/machine_registry.h"
 
 #include <utility>
 #include <vector>
 
-#include "platform/linux/driver_files.h"
 #include "platform/linux/live/live_source.h"
-#include "platform/linux/services.h"
+#include "platform/linux/registry/driver_files.h"
+#include "platform/linux/registry/services.h"
 
 namespace quorlet {
 namespace {

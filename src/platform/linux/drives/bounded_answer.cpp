@@ -15,7 +15,7 @@
 #include <span>
 #include <utility>
 
-#include "platform/linux/descriptor.h"
+#include "platform/linux/base/descriptor.h"
 
 namespace quorlet {
 namespace {

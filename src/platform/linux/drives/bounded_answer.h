@@ -14,7 +14,7 @@
 #include <span>
 #include <string>
 
-#include "values/property_value.h"
+#include "drvreport/property_value.h"
 
 namespace quorlet {
 

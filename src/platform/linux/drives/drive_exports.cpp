@@ -7,32 +7,21 @@
 #include <utility>
 #include <vector>
 
+#include "platform/linux/base/kernel_text.h"
 #include "platform/linux/drives/bounded_answer.h"
 #include "platform/linux/drives/drive_statistics.h"
-#include "platform/linux/kernel_text.h"
-#include "values/byte_reader.h"
+#include "platform/storage_exports.h"
 
 namespace quorlet {
 namespace {
 
 constexpr char kBlockDevices[] = "/sys/block";
 constexpr std::uint64_t kFirstEntryID = 0x4E00'0000'0000'0000;
-constexpr std::uint32_t kStatisticsSelector = 13;
-constexpr unsigned kSizeOnly = 1;
 constexpr std::chrono::seconds kLimit{2};
 using Deadline = std::chrono::steady_clock::time_point;
 
-// What the known classes of storage drivers have of their own.
-struct ExportClass {
-  std::string_view name;
-  std::string_view characteristicsKey;
-  std::uint32_t exportMethod;
-};
-constexpr ExportClass kNvmeClass{"NuvexEmbeddedNVMeController", "Controller Characteristics", 9};
-constexpr ExportClass kOtherClass{"FSPStorage", "Device Characteristics", 8};
-
-const ExportClass& ClassOf(const FoundDrive& drive) {
-  return drive.kind == DriveKind::kNvme ? kNvmeClass : kOtherClass;
+const StorageClass& ClassOf(const FoundDrive& drive) {
+  return drive.kind == DriveKind::kNvme ? kNvmeStorageClass : kFlashStorageClass;
 }
 
 class ExportDriver : public EntryDriver {
@@ -48,10 +37,9 @@ class ExportDriver : public EntryDriver {
 
   KernelReturn call(std::uint32_t method, DriverCall& call) override {
     if (!hasMethod(method)) return kKernelUnsupported;
-    ByteReader request(call.structInput);
-    const auto selector = request.little<std::uint32_t>();
-    const auto flags = request.little<std::uint16_t>();
-    if (!request.ok()) return kKernelBadArgument;
+    const auto request = ReadExportRequest(call.structInput);
+    if (!request) return kKernelBadArgument;
+    const auto& [selector, flags] = *request;
     if (selector == kStatisticsSelector && !isRead_) {
       isRead_ = true;
       statistics_ = readStatistics();
@@ -59,11 +47,9 @@ class ExportDriver : public EntryDriver {
     static const Data kNothing;
     const Data& data = selector == kStatisticsSelector ? statistics_ : kNothing;
     if (selector == kStatisticsSelector && data.empty()) return kKernelError;
-    if ((flags & kSizeOnly) == 0) return answer(data, call);
+    if ((flags & kSizeOnlyFlag) == 0) return answer(data, call);
     std::array<std::byte, 4> size{};
-    for (std::size_t i = 0; i < size.size(); ++i) {
-      size[i] = static_cast<std::byte>((data.size() >> (8 * i)) & 0xFF);
-    }
+    WriteLittle(data.size(), size);
     return call.structOutput.size() < size.size() ? kKernelBadArgument : answer(size, call);
   }
 
@@ -141,7 +127,7 @@ class DriveExports : public EntrySource {
     // One driver for each drive and all its connections: it asks the drive once.
     auto& driver = drivers_[drive->place + "\n" + drive->name];
     if (driver == nullptr) driver = std::make_shared<ExportDriver>(*drive, reader_);
-    const ExportClass& exportClass = ClassOf(*drive);
+    const StorageClass& exportClass = ClassOf(*drive);
     RegistryEntry entry;
     entry.id = EntryID(*drive);
     entry.name = drive->name;
@@ -149,7 +135,7 @@ class DriveExports : public EntrySource {
     entry.properties[exportClass.characteristicsKey] = characteristics(*drive);
     entry.properties[kTellsOnlyWhatItHas] = true;
     entry.driver = driver;
-    entry.standsInFor = {std::string(kOtherClass.name), std::string(kNvmeClass.name)};
+    entry.standsInFor = {std::string(kFlashStorageClass.name), std::string(kNvmeStorageClass.name)};
     return {std::move(entry)};
   }
 

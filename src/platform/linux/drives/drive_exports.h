@@ -6,7 +6,7 @@
 #include <memory>
 
 #include "platform/linux/drives/drive_reader.h"
-#include "platform/linux/registry_entry.h"
+#include "platform/linux/registry/registry_entry.h"
 
 namespace quorlet {
 

@@ -2,11 +2,11 @@
 
 #include <algorithm>
 #include <array>
-#include <charconv>
 #include <limits>
 
 #include "platform/linux/drives/nvme_pages.h"
 #include "values/byte_reader.h"
+#include "values/digits.h"
 
 namespace quorlet {
 namespace {
@@ -121,11 +121,7 @@ void AddNvmeDatacenter(std::span<const std::byte> page, DriveFigures& figures) {
 
 std::optional<std::uint32_t> ParseHexadecimal(std::string_view text) {
   if (text.starts_with("0x") || text.starts_with("0X")) text.remove_prefix(2);
-  std::uint32_t number = 0;
-  const char* const end = text.data() + text.size();
-  const auto [stopped, error] = std::from_chars(text.data(), end, number, 16);
-  if (text.size() > 8 || error != std::errc() || stopped != end) return std::nullopt;
-  return number;
+  return text.size() > 8 ? std::nullopt : ParseNumber<std::uint32_t>(text, 16);
 }
 
 std::optional<std::int64_t> LifeTimeUsed(std::string_view code) {

@@ -5,7 +5,7 @@
 #include <algorithm>
 #include <map>
 
-#include "platform/linux/kernel_text.h"
+#include "platform/linux/base/kernel_text.h"
 
 namespace quorlet {
 namespace {

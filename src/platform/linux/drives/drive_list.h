@@ -7,7 +7,7 @@
 #include <vector>
 
 #include "platform/drives.h"
-#include "platform/linux/kernel_text.h"
+#include "platform/linux/base/kernel_text.h"
 
 namespace quorlet {
 

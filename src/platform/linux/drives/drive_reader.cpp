@@ -2,9 +2,9 @@
 
 #include <array>
 
+#include "platform/linux/base/kernel_text.h"
 #include "platform/linux/drives/bounded_answer.h"
 #include "platform/linux/drives/drive_figures.h"
-#include "platform/linux/kernel_text.h"
 
 namespace quorlet {
 namespace {

@@ -11,9 +11,9 @@
 #include <vector>
 
 #include "platform/drives.h"
+#include "platform/linux/base/files.h"
 #include "platform/linux/drives/drive_list.h"
 #include "platform/linux/drives/nvme_pages.h"
-#include "platform/linux/files.h"
 
 namespace quorlet {
 

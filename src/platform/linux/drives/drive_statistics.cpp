@@ -6,31 +6,12 @@
 #include <limits>
 
 #include "platform/linux/drives/nvme_pages.h"
+#include "platform/statistics_keys.h"
 #include "values/byte_reader.h"
+#include "values/byte_writer.h"
 
 namespace quorlet {
 namespace {
-
-enum Key : std::uint32_t {
-  kHostWriteXacts = 2,
-  kHostReadXacts = 3,
-  kHostWrites = 4,
-  kHostReads = 7,
-  kValidLbas = 8,
-  kBoots = 10,
-  kUncleanBoots = 11,
-  kNandWrites = 18,
-  kNandReads = 19,
-  kPowerOnHours = 34,
-  kSmartCritWarnings = 36,
-  kNumFlushes = 37,
-  kNumUnmap = 38,
-  kNumUnmapSec = 39,
-  kExportVersion = 53,
-  kCmdqFlushMicroseconds = 59,
-  kCmdqUnmapMicroseconds = 60,
-  kUeccReads = 172,
-};
 
 // The lowest version whose dictionary is complete.
 constexpr std::uint64_t kVersion = 0x20002;
@@ -59,35 +40,31 @@ std::uint64_t TakeCounter(ByteReader& page) {
 
 class Export {
  public:
-  void add(Key key, std::uint64_t value) {
-    put((std::uint64_t{1} << 32) | key);
-    put(value);
+  void add(std::uint16_t key, std::uint64_t value) {
+    bytes_.u64((std::uint64_t{1} << 32) | key).u64(value);
   }
-  Data take() { return std::move(bytes_); }
+  Data take() { return bytes_.take(); }
 
  private:
-  void put(std::uint64_t word) {
-    for (int i = 0; i < 8; ++i) bytes_.push_back(static_cast<std::byte>((word >> (8 * i)) & 0xFF));
-  }
-  Data bytes_;
+  ByteWriter bytes_;
 };
 
 void AddHealthPage(std::span<const std::byte> bytes, Export& out) {
   ByteReader page(bytes);
-  out.add(kSmartCritWarnings, page.little<std::uint8_t>());
+  out.add(StatisticsIdOf("smartCritWarnings"), page.little<std::uint8_t>());
   page.seek(kDataUnitsRead);
-  for (const Key key : {kHostReads, kHostWrites}) {
+  for (const std::uint16_t key : {StatisticsIdOf("hostReads"), StatisticsIdOf("hostWrites")}) {
     // 0 also stands for a figure that the drive does not report.
     const std::uint64_t units = TakeCounter(page);
     if (units != 0) out.add(key, SaturatingProduct(units, kSectorsPerDataUnit));
   }
-  out.add(kHostReadXacts, TakeCounter(page));
-  out.add(kHostWriteXacts, TakeCounter(page));
+  out.add(StatisticsIdOf("hostReadXacts"), TakeCounter(page));
+  out.add(StatisticsIdOf("hostWriteXacts"), TakeCounter(page));
   (void)TakeCounter(page);  // controller busy time
-  out.add(kBoots, TakeCounter(page));
-  out.add(kPowerOnHours, TakeCounter(page));
-  out.add(kUncleanBoots, TakeCounter(page));
-  out.add(kUeccReads, TakeCounter(page));
+  out.add(StatisticsIdOf("boots"), TakeCounter(page));
+  out.add(StatisticsIdOf("powerOnHours"), TakeCounter(page));
+  out.add(StatisticsIdOf("uncleanBoots"), TakeCounter(page));
+  out.add(StatisticsIdOf("ueccReads"), TakeCounter(page));
 }
 
 }  // namespace
@@ -116,22 +93,25 @@ bool AddBlockCounters(std::string_view line, BlockCounters& counters) {
 
 Data EncodeDriveStatistics(const DriveFacts& facts) {
   Export out;
-  out.add(kExportVersion, kVersion);
+  out.add(StatisticsIdOf("exportVersion"), kVersion);
   if (facts.healthPage.size() == kNvmePageBytes) AddHealthPage(facts.healthPage, out);
-  const std::pair<Key, DriveFigure> media[] = {{kNandWrites, DriveFigure::kMediaBytesWritten},
-                                               {kNandReads, DriveFigure::kMediaBytesRead}};
+  const std::pair<std::uint16_t, DriveFigure> media[] = {
+      {StatisticsIdOf("nandWrites"), DriveFigure::kMediaBytesWritten},
+      {StatisticsIdOf("nandReads"), DriveFigure::kMediaBytesRead}};
   for (const auto& [key, figure] : media) {
     if (const auto bytes = facts.figures[figure]) {
       out.add(key, static_cast<std::uint64_t>(*bytes) / kSectorBytes);
     }
   }
-  if (facts.usedBytes) out.add(kValidLbas, *facts.usedBytes / kSectorBytes);
+  if (facts.usedBytes) out.add(StatisticsIdOf("validLbas"), *facts.usedBytes / kSectorBytes);
   if (facts.counters) {
-    out.add(kNumFlushes, facts.counters->flushes);
-    out.add(kCmdqFlushMicroseconds, SaturatingProduct(facts.counters->flushMilliseconds, 1000));
-    out.add(kNumUnmap, facts.counters->discards);
-    out.add(kNumUnmapSec, facts.counters->discardedSectors / (kSectorBytes / 512));
-    out.add(kCmdqUnmapMicroseconds, SaturatingProduct(facts.counters->discardMilliseconds, 1000));
+    out.add(StatisticsIdOf("numFlushes"), facts.counters->flushes);
+    out.add(StatisticsIdOf("cmdq_flush_us"),
+            SaturatingProduct(facts.counters->flushMilliseconds, 1000));
+    out.add(StatisticsIdOf("numUnmap"), facts.counters->discards);
+    out.add(StatisticsIdOf("numUnmapSec"), facts.counters->discardedSectors / (kSectorBytes / 512));
+    out.add(StatisticsIdOf("cmdq_unmap_us"),
+            SaturatingProduct(facts.counters->discardMilliseconds, 1000));
   }
   return out.take();
 }

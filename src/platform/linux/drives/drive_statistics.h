@@ -11,8 +11,8 @@
 #include <span>
 #include <string_view>
 
+#include "drvreport/property_value.h"
 #include "platform/drives.h"
-#include "values/property_value.h"
 
 namespace quorlet {
 

@@ -2,7 +2,7 @@
 
 #include <utility>
 
-#include "platform/linux/kernel_text.h"
+#include "platform/linux/base/kernel_text.h"
 
 namespace quorlet {
 namespace {
@@ -59,7 +59,7 @@ class DrivesPublisher : public LivePublisher {
       legend.add({.group = kGroup, .subgroup = found.place, .unit = kMilliseconds},
                  {.id = channelID(found, kPower),
                   .name = channelName(found, kPower),
-                  .format = LiveFormat::kState,
+                  .format = ReportFormat::kState,
                   .elements = 2});
     }
     return legend;

@@ -7,8 +7,8 @@
 #include <functional>
 #include <string>
 
+#include "drvreport/property_value.h"
 #include "platform/drives.h"
-#include "values/property_value.h"
 
 namespace quorlet {
 

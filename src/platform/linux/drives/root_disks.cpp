@@ -6,8 +6,8 @@
 #include <algorithm>
 #include <optional>
 
+#include "platform/linux/base/kernel_text.h"
 #include "platform/linux/drives/drive_list.h"
-#include "platform/linux/kernel_text.h"
 
 namespace quorlet {
 namespace {

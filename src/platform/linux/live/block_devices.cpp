@@ -11,7 +11,7 @@
 #include <set>
 #include <variant>
 
-#include "platform/linux/kernel_text.h"
+#include "platform/linux/base/kernel_text.h"
 #include "platform/linux/live/publishers.h"
 #include "platform/linux/live/running_totals.h"
 

@@ -13,7 +13,7 @@
 #include <cerrno>
 #include <variant>
 
-#include "platform/linux/kernel_text.h"
+#include "platform/linux/base/kernel_text.h"
 #include "platform/linux/live/publishers.h"
 #include "platform/linux/live/running_totals.h"
 
@@ -93,7 +93,7 @@ class CpuFrequencyPublisher : public LivePublisher {
       legend.add({.group = "CPU Frequency", .subgroup = "", .unit = kMilliseconds},
                  {.id = cpu.id,
                   .name = title + " frequency",
-                  .format = LiveFormat::kState,
+                  .format = ReportFormat::kState,
                   .elements = states});
       cpus_.push_back(cpu);
     }

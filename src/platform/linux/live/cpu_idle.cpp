@@ -8,7 +8,7 @@
 #include <algorithm>
 #include <array>
 
-#include "platform/linux/kernel_text.h"
+#include "platform/linux/base/kernel_text.h"
 #include "platform/linux/live/publishers.h"
 #include "platform/linux/live/running_totals.h"
 
@@ -81,7 +81,7 @@ class CpuIdlePublisher : public LivePublisher {
       legend.add({.group = "CPU Idle", .subgroup = "", .unit = kMicroseconds},
                  {.id = cpu.id,
                   .name = "CPU" + std::to_string(number) + " idle",
-                  .format = LiveFormat::kState,
+                  .format = ReportFormat::kState,
                   .elements = cpu.states.size() + (hasActivity_ ? 1 : 0)});
       cpus_.push_back(std::move(cpu));
     }

@@ -2,7 +2,7 @@
 // Most kernels let only root read it.
 //
 // Zones are numbered ("intel-rapl:0:1"); their names ("package-0", below it "core") are stable.
-#include "platform/linux/kernel_text.h"
+#include "platform/linux/base/kernel_text.h"
 #include "platform/linux/live/publishers.h"
 #include "platform/linux/live/running_totals.h"
 

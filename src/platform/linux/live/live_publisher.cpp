@@ -3,27 +3,16 @@
 namespace quorlet {
 namespace {
 
-constexpr std::size_t kRecordBytes = 64;
 constexpr std::uint64_t kLiveCategory = 0x0001;
-constexpr std::uint64_t kDailyCategory = 0x0100;
-
-void AppendLittle(std::uint64_t number, std::vector<std::byte>& bytes) {
-  for (int i = 0; i < 8; ++i) {
-    bytes.push_back(static_cast<std::byte>(number & 0xFF));
-    number >>= 8;
-  }
-}
-
 std::uint64_t TypeWord(const LiveChannel& channel) {
   const std::uint64_t categories = kLiveCategory | (channel.isDaily ? kDailyCategory : 0);
-  return static_cast<std::uint64_t>(channel.format) | categories << 16 |
-         static_cast<std::uint64_t>(channel.elements) << 32;
+  return makeType(channel.format, categories, channel.elements);
 }
 
 }  // namespace
 
 void LiveLegend::add(const LiveGroup& group, const LiveChannel& channel) {
-  if (channel.elements == 0 || channel.elements > 0xFFFF) return;
+  if (channel.elements == 0 || channel.elements > kMaxElementCount) return;
   const std::uint64_t type = TypeWord(channel);
   if (!types_.try_emplace(channel.id, type).second) return;
   const auto [channels, isNew] =
@@ -48,14 +37,13 @@ std::uint64_t LiveLegend::typeOf(std::uint64_t id) const {
 
 void LiveRuns::add(std::uint64_t id, std::span<const LiveValues> records) {
   const std::uint64_t type = legend_->typeOf(id);
-  if (records.empty() || type >> 32 != records.size()) return;
-  if (!places_.try_emplace(id, Place{bytes_.size(), records.size() * kRecordBytes}).second) return;
-  const bool isStamped = (type & 0xFF) != static_cast<std::uint64_t>(LiveFormat::kState);
+  if (records.empty() || elementCountOfType(type) != records.size()) return;
+  if (!places_.try_emplace(id, Place{bytes_.size(), records.size() * kRawElementSize}).second)
+    return;
+  const bool isStamped = formatOfType(type) != static_cast<std::uint8_t>(ReportFormat::kState);
   for (const LiveValues& values : records) {
-    for (const std::uint64_t word : {driverID_, id, type, isStamped ? now_ : 0}) {
-      AppendLittle(word, bytes_);
-    }
-    for (const std::int64_t value : values) AppendLittle(static_cast<std::uint64_t>(value), bytes_);
+    bytes_.u64(driverID_).u64(id).u64(type).u64(isStamped ? now_ : 0);
+    for (const std::int64_t value : values) bytes_.u64(static_cast<std::uint64_t>(value));
   }
 }
 
@@ -67,7 +55,7 @@ void LiveRuns::addSimple(std::uint64_t id, std::int64_t value) {
 std::span<const std::byte> LiveRuns::find(std::uint64_t id) const {
   const auto found = places_.find(id);
   if (found == places_.end()) return {};
-  return std::span(bytes_).subspan(found->second.offset, found->second.length);
+  return std::span(bytes_.data()).subspan(found->second.offset, found->second.length);
 }
 
 }  // namespace quorlet

@@ -12,20 +12,11 @@
 #include <tuple>
 #include <vector>
 
-#include "values/property_value.h"
+#include "drvreport/property_value.h"
+#include "platform/report_records.h"
+#include "values/byte_writer.h"
 
 namespace quorlet {
-
-// Unit codes of the channels.
-inline constexpr std::uint64_t kNanoseconds = 0x0100'0076'0000'0000;
-inline constexpr std::uint64_t kMicroseconds = 0x0100'0079'0000'0000;
-inline constexpr std::uint64_t kMilliseconds = 0x0100'007C'0000'0000;
-inline constexpr std::uint64_t kMicrojoules = 0x0300'0079'0000'0000;
-inline constexpr std::uint64_t kBytes = 0x0900'8200'0000'0000;
-inline constexpr std::uint64_t kMillidegrees = 0x0A00'007C'0000'0000;
-inline constexpr std::uint64_t kEvents = 0x6400'0000'0000'0000;
-
-enum class LiveFormat : std::uint8_t { kSimple = 1, kState = 2, kHistogram = 3 };
 
 // Which channels of a legend belong together; their names must be clean.
 struct LiveGroup {
@@ -38,7 +29,7 @@ struct LiveGroup {
 struct LiveChannel {
   std::uint64_t id = 0;
   std::string name;
-  LiveFormat format = LiveFormat::kSimple;
+  ReportFormat format = ReportFormat::kSimple;
   std::size_t elements = 1;
   bool isDaily = false;  // belongs into the daily record
 };
@@ -62,7 +53,7 @@ class LiveLegend {
 
 // One record's values: the integer of a simple channel; a state's ID, transitions and residency; a
 // bucket's hits, minimum, maximum and sum.
-using LiveValues = std::array<std::int64_t, 4>;
+using LiveValues = std::array<std::int64_t, kRawElementValues>;
 
 // What a driver's channels report at one moment.
 class LiveRuns {
@@ -86,7 +77,7 @@ class LiveRuns {
   std::uint64_t driverID_;
   const LiveLegend* legend_;
   std::uint64_t now_;
-  std::vector<std::byte> bytes_;
+  ByteWriter bytes_;
   std::map<std::uint64_t, Place> places_;
 };
 

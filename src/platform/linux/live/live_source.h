@@ -5,9 +5,9 @@
 
 #include <memory>
 
-#include "platform/linux/kernel_text.h"
+#include "platform/linux/base/kernel_text.h"
 #include "platform/linux/live/live_publisher.h"
-#include "platform/linux/registry_entry.h"
+#include "platform/linux/registry/registry_entry.h"
 
 namespace quorlet {
 

@@ -3,7 +3,7 @@
 // one simple channel a line, the total in microseconds.
 #include <array>
 
-#include "platform/linux/kernel_text.h"
+#include "platform/linux/base/kernel_text.h"
 #include "platform/linux/live/publishers.h"
 #include "platform/linux/live/running_totals.h"
 

@@ -5,7 +5,7 @@
 
 #include <memory>
 
-#include "platform/linux/kernel_text.h"
+#include "platform/linux/base/kernel_text.h"
 #include "platform/linux/live/live_publisher.h"
 
 namespace quorlet {

@@ -8,7 +8,7 @@
 #include <algorithm>
 #include <array>
 
-#include "platform/linux/kernel_text.h"
+#include "platform/linux/base/kernel_text.h"
 #include "platform/linux/live/publishers.h"
 
 namespace quorlet {
@@ -82,7 +82,7 @@ class RunQueuePublisher : public LivePublisher {
                   .bucketConfig = BucketConfig()},
                  {.id = kChannel,
                   .name = "run queue wait",
-                  .format = LiveFormat::kHistogram,
+                  .format = ReportFormat::kHistogram,
                   .elements = kBuckets});
     }
     return legend;

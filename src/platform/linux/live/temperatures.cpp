@@ -5,7 +5,7 @@
 // drivetemp, whose question a disk may have to spin up for.
 #include <algorithm>
 
-#include "platform/linux/kernel_text.h"
+#include "platform/linux/base/kernel_text.h"
 #include "platform/linux/live/publishers.h"
 
 namespace quorlet {
@@ -24,9 +24,10 @@ struct Sensor {
   std::uint64_t id = 0;
   std::string directory;
   std::string file;      // in the directory
-  std::string kindFile;  // that says what the directory is
-  std::string kind;
-  std::string link;
+  std::string kindFile;  // that says what the directory is, if it is there
+  std::optional<std::string> kind;
+  std::string device;  // the directory of the class
+  std::string link;    // where it points
 };
 
 // A device without power management of its own is as awake as the one that it sits in.
@@ -54,7 +55,7 @@ class TemperaturesPublisher : public LivePublisher {
       const std::string device = LinkTarget(directory + "/device");
       const std::string place = CleanName(device.substr(device.rfind('/') + 1));
       add(legend, CleanName(*kind) + (place.empty() ? "" : " " + place), CleanName(*kind),
-          {0, directory, "temp", "type", *kind, LinkTarget(directory)});
+          {0, directory, "temp", "type", kind, directory, LinkTarget(directory)});
     }
     const std::string monitors = root_.kernelPath(kMonitors);
     for (const auto& [number, name] : NumberedNames(root_, monitors, "hwmon")) {
@@ -66,9 +67,9 @@ class TemperaturesPublisher : public LivePublisher {
   void read(LiveRuns& runs) override {
     for (const Sensor& sensor : sensors_) {
       const bool isSame =
-          LinkTarget(sensor.directory) == sensor.link &&
+          LinkTarget(sensor.device) == sensor.link &&
           ReadKernelText(JoinPath(sensor.directory, sensor.kindFile)) == sensor.kind;
-      if (!isSame || IsAsleep(sensor.directory)) continue;
+      if (!isSame || IsAsleep(sensor.device)) continue;
       const auto temperature = ReadInteger(JoinPath(sensor.directory, sensor.file));
       if (temperature && *temperature >= kLowest && *temperature <= kHighest) {
         runs.addSimple(sensor.id, *temperature);
@@ -78,20 +79,34 @@ class TemperaturesPublisher : public LivePublisher {
 
  private:
   void addMonitor(LiveLegend& legend, const std::string& directory) {
+    // A driver may have its files with the device, and need not give the chip a name.
+    for (const char* place : {"", "/device"}) {
+      if (addSensors(legend, directory, directory + place)) return;
+    }
+  }
+
+  // False where there are none.
+  bool addSensors(LiveLegend& legend, const std::string& monitor, const std::string& directory) {
+    std::vector<std::string> inputs = root_.names(directory);
+    std::erase_if(inputs, [](const std::string& file) {
+      return !file.starts_with("temp") || !file.ends_with(kInput) ||
+             !NumberBehind("temp", file.substr(0, file.size() - kInput.size()));
+    });
+    if (inputs.empty()) return false;
     const auto kind = ReadKernelText(directory + "/name");
-    if (!kind || *kind == "drivetemp") return;
-    const std::string link = LinkTarget(directory);
+    if (kind == "drivetemp") return true;
+    const std::string link = LinkTarget(monitor);
     const std::string place = DevicePlace(link);
-    const std::string stable = CleanName(*kind) + (place.empty() ? "" : " " + place);
-    for (const std::string& file : root_.names(directory)) {
-      if (!file.starts_with("temp") || !file.ends_with(kInput)) continue;
+    const std::string chip = kind ? CleanName(*kind) : "hwmon";
+    const std::string stable = chip + (place.empty() ? "" : " " + place);
+    for (const std::string& file : inputs) {
       const std::string sensor = file.substr(0, file.size() - kInput.size());
-      if (!NumberBehind("temp", sensor)) continue;
       const auto label = ReadKernelText(JoinPath(directory, sensor) + "_label");
       const std::string shown = label && !label->empty() ? *label : sensor;
-      add(legend, stable, CleanName(*kind) + " " + CleanName(shown),
-          {HashedID(sensor), directory, file, "name", *kind, link});
+      add(legend, stable, chip + " " + CleanName(shown),
+          {HashedID(sensor), directory, file, "name", kind, monitor, link});
     }
+    return true;
   }
 
   // Two devices may say the same of themselves; their order tells them apart.

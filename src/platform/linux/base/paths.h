@@ -1,0 +1,25 @@
+// Where what we write lies below the root.
+#ifndef QUORLET_PLATFORM_LINUX_BASE_PATHS_H_
+#define QUORLET_PLATFORM_LINUX_BASE_PATHS_H_
+
+#include <cstdint>
+
+namespace quorlet {
+
+inline constexpr char kPreferencesDirectory[] = "/var/mobile/Library/Preferences";
+// Logs for submission, in pending/ and outbox/.
+inline constexpr char kSpoolDirectory[] = "/var/mobile/Library/Logs/Diagwell";
+inline constexpr std::uint64_t kSpoolQuotaBytes = std::uint64_t{64} << 20;  // of both together
+inline constexpr char kStructuredLogDirectory[] = "/var/mobile/Library/Logs/FaultScribe";
+inline constexpr char kSupportLogDirectory[] = "/var/mobile/Library/Logs/Carewell";
+inline constexpr char kSystemLogDirectory[] = "/var/log";
+// Sockets and locks.
+inline constexpr char kServiceDirectory[] = "/run/quorlet";
+
+// Below the data home.
+inline constexpr char kCounterStoreDirectory[] = "/Library/TallyLedger";
+inline constexpr char kCounterStorePath[] = "/Library/TallyLedger/TLDataStore.sqlitedb";
+
+}  // namespace quorlet
+
+#endif  // QUORLET_PLATFORM_LINUX_BASE_PATHS_H_
