@@ -374,6 +374,11 @@ class FakeDrives : public Drives {
 
 // The services, bundled. The clock starts at noon of day 20000.
 struct FakePlatform {
+  FakePlatform();
+  ~FakePlatform();
+  FakePlatform(const FakePlatform&) = delete;
+  FakePlatform& operator=(const FakePlatform&) = delete;
+
   FakeSystemLog log;
   FakeClock clock;
   FakePreferences preferences;
