@@ -216,6 +216,15 @@ std::string BarRow(std::size_t columns, std::string_view title, std::string_view
   return std::string(FitColumns(start + (room == 0 ? "" : Bar(share, room)), columns));
 }
 
+// What one of a unit of time is in seconds.
+std::optional<double> SecondsOf(std::string_view unit) {
+  constexpr std::pair<std::string_view, double> kUnits[] = {
+      {"ns", 1e-9}, {"us", 1e-6}, {"ms", 1e-3}, {"s", 1}};
+  const auto* const found =
+      std::ranges::find(kUnits, unit, &std::pair<std::string_view, double>::first);
+  return found != std::end(kUnits) ? std::optional(found->second) : std::nullopt;
+}
+
 std::vector<std::string> SimpleRow(Dictionary& sample, Dictionary& delta, double seconds,
                                    std::size_t columns) {
   const std::int64_t now = DrvReportSimpleGetIntegerValue(sample);
@@ -226,10 +235,13 @@ std::vector<std::string> SimpleRow(Dictionary& sample, Dictionary& delta, double
   const std::string unit = Escape(TextOr(DrvReportChannelGetUnitLabel(sample), ""));
   const auto number = static_cast<double>(change);
   const std::string suffix = unit == "events" || unit.empty() ? "" : " " + unit;
+  // Time that passed in a state, say, is a share of the time that went by.
+  const auto second = SecondsOf(unit);
+  const std::string rate =
+      second ? Percent(number * *second / seconds) : Amount(number / seconds, unit) + "/s";
   return {Row(columns, Escape(Title(sample)),
               Escape(TextOr(DrvReportChannelGetSubGroup(sample), "")),
-              unit == "B" ? Amount(number, unit) : std::to_string(change) + suffix,
-              Amount(number / seconds, unit) + "/s",
+              unit == "B" ? Amount(number, unit) : std::to_string(change) + suffix, rate,
               unit == "B" ? Amount(static_cast<double>(now), unit) : std::to_string(now) + suffix)};
 }
 
@@ -271,6 +283,17 @@ Dictionary DescribeChannel(Dictionary& channel) {
     if (text != nullptr) described[key] = *text;
   }
   return described;
+}
+
+std::vector<std::string> ListRow(Dictionary& channel) {
+  std::string group = TextOr(DrvReportChannelGetGroup(channel), "");
+  if (const std::string* sub = DrvReportChannelGetSubGroup(channel)) group += " / " + *sub;
+  return {Escape(Title(channel)),
+          Escape(group),
+          FormatName(DrvReportChannelGetFormat(channel)),
+          Escape(TextOr(DrvReportChannelGetUnitLabel(channel), "")),
+          std::to_string(DrvReportChannelGetElementCount(channel)),
+          Escape(TextOr(DrvReportChannelGetDriverName(channel), ""))};
 }
 
 Dictionary DescribeValues(Dictionary& sample) {

@@ -19,6 +19,9 @@ std::string FormatName(std::uint8_t format);
 // numbers of 64 bits.
 Dictionary DescribeChannel(Dictionary& channel);
 
+// The same for a table: name, group and subgroup, format, unit, elements, driver; escaped.
+std::vector<std::string> ListRow(Dictionary& channel);
+
 // What a sample (or a delta) holds, for JSON: "value", "values", "states" or "buckets"; empty when
 // it cannot be read.
 Dictionary DescribeValues(Dictionary& sample);

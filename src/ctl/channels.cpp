@@ -152,6 +152,17 @@ void List(Session& session, const ChannelsArguments& arguments) {
   if (channels.empty() && !session.messages.errors().empty()) {
     throw Failure(session.messages.lastErrorOr(""));
   }
+  if (!arguments.json && IsTerminal()) {
+    std::vector<std::vector<std::string>> rows = {
+        {"CHANNEL", "GROUP", "FORMAT", "UNIT", "ELEMENTS", "DRIVER"}};
+    for (Dictionary& channel : InOrder(channels)) rows.push_back(ListRow(channel));
+    if (rows.size() == 1) return;
+    for (const std::string& line :
+         TableLines(rows, {false, false, false, false, true, false}, GetTerminalSize().columns)) {
+      session.out.line(line);
+    }
+    return;
+  }
   std::optional<JsonChannels> json;
   if (arguments.json) json.emplace(session.out);
   for (Dictionary& channel : InOrder(channels)) {

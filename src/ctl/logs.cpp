@@ -146,6 +146,18 @@ void List(Session& session, const LogsArguments& arguments) {
     session.out.line(JsonText(list, JsonForm::kPlain));
     return;
   }
+  if (IsTerminal()) {
+    std::vector<std::vector<std::string>> rows;
+    for (const StoredLog& log : logs) {
+      rows.push_back({std::string(log.stage), Escape(log.created), std::to_string(log.size),
+                      log.type.empty() ? "?" : Escape(log.type), Escape(log.name)});
+    }
+    for (const std::string& line :
+         TableLines(rows, {false, false, true, true, false}, GetTerminalSize().columns)) {
+      session.out.line(line);
+    }
+    return;
+  }
   for (const StoredLog& log : logs) {
     const std::string size = std::to_string(log.size);
     std::string line = log.stage == kStages[0] ? "pending  " : "outbox   ";

@@ -117,7 +117,7 @@ std::optional<std::string> Unescape(std::string_view text) {
 
 std::string Hexadecimal(std::uint64_t number) { return "0x" + HexNumber(number); }
 
-std::string Counted(std::size_t count, std::string_view noun) {
+std::string Counted(std::uint64_t count, std::string_view noun) {
   std::string text = std::to_string(count) + " ";
   if (count == 1) return text.append(noun);
   if (noun.ends_with("ry")) return text.append(noun.substr(0, noun.size() - 1)).append("ies");

@@ -38,7 +38,7 @@ std::optional<std::string> Unescape(std::string_view text);
 std::string Hexadecimal(std::uint64_t number);
 
 // "1 key", "2 keys"
-std::string Counted(std::size_t count, std::string_view noun);
+std::string Counted(std::uint64_t count, std::string_view noun);
 
 }  // namespace quorlet
 

@@ -15,11 +15,11 @@ constexpr uid_t kRootUser = 0;
 constexpr std::size_t kMostRemembered = 20'000;
 constexpr double kBeyond64Bits = 9223372036854775808.0;
 
-template <typename Wide>
-std::int64_t Saturated(Wide value) {
-  constexpr Wide kLowest = std::numeric_limits<std::int64_t>::min();
-  constexpr Wide kHighest = std::numeric_limits<std::int64_t>::max();
-  return static_cast<std::int64_t>(std::clamp(value, kLowest, kHighest));
+// A whole number of at most 2^63.
+WideInteger Whole(double whole) {
+  if (whole < kBeyond64Bits) return static_cast<std::int64_t>(whole);
+  WideInteger largest = std::numeric_limits<std::int64_t>::max();
+  return largest += 1;
 }
 
 bool IsReserved(std::string_view key) {
@@ -34,27 +34,27 @@ void RecordBook::Sum::add(const StatsdNumber& number, double rate) {
   } else {
     const double real = std::clamp(number.real / rate, -kBeyond64Bits, kBeyond64Bits);
     const double part = std::trunc(real);
-    whole += static_cast<Wide>(part);
+    whole += Whole(part);
     fraction += real - part;
   }
   if (fraction == 0) return;
   // Carries, then gives both parts one sign, which is what rounding goes by.
   const double carried = std::trunc(fraction);
-  whole += static_cast<Wide>(carried);
+  whole += Whole(carried);
   fraction -= carried;
-  if (whole > 0 && fraction < 0) {
-    --whole;
+  if (whole.isPositive() && fraction < 0) {
+    whole -= 1;
     fraction += 1;
-  } else if (whole < 0 && fraction > 0) {
-    ++whole;
+  } else if (whole.isNegative() && fraction > 0) {
+    whole += 1;
     fraction -= 1;
   }
 }
 
 // Half away from zero.
-RecordBook::Wide RecordBook::Sum::rounded() const {
-  if (fraction >= 0.5) return whole + 1;
-  return fraction <= -0.5 ? whole - 1 : whole;
+WideInteger RecordBook::Sum::rounded() const {
+  WideInteger nearest = whole;
+  return nearest += fraction >= 0.5 ? 1 : fraction <= -0.5 ? -1 : 0;
 }
 
 bool RecordBook::enterDay(std::int32_t day, TallyLedger& ledger) {
@@ -148,7 +148,7 @@ std::optional<Refusal> RecordBook::add(const StatsdLine& line, Sender sender, st
   for (const StatsdNumber& number : line.numbers) {
     if (line.kind == StatsdKind::kGauge && !number.isSigned) {
       entry.sum = {};
-      entry.written = 0;
+      entry.written = {};
       entry.isSet = true;
     }
     entry.sum.add(number, line.kind == StatsdKind::kCounter ? line.rate : 1);
@@ -161,9 +161,11 @@ void RecordBook::closeDay() {
   for (Entries::value_type* item : changed_) {
     auto& [key, entry] = *item;
     if (entry.hasScalar) {
-      const Wide rounded = entry.sum.rounded();
+      const WideInteger rounded = entry.sum.rounded();
+      WideInteger growth = rounded;
+      growth -= entry.written;
       const auto kind = entry.isSet ? ScalarChange::Kind::kSet : ScalarChange::Kind::kAdd;
-      closed_.scalars.push_back({kind, key, Saturated(rounded - entry.written), *day_});
+      closed_.scalars.push_back({kind, key, growth.saturated(), *day_});
       entry.written = rounded;
     }
     if (!entry.values.empty()) {

@@ -17,6 +17,7 @@
 #include "ctl/record_refusals.h"
 #include "ctl/record_whitelist.h"
 #include "ctl/statsd_line.h"
+#include "ctl/wide_integer.h"
 #include "platform/counter_store.h"
 #include "platform/linux/counters/tally_ledger.h"
 
@@ -79,17 +80,16 @@ class RecordBook {
   RecordBatch take();
 
  private:
-  __extension__ using Wide = __int128;  // no sum of 64-bit numbers that could be sent leaves it
   // A sum, exact in its whole part; both parts have one sign or are 0.
   struct Sum {
-    Wide whole = 0;
+    WideInteger whole;
     double fraction = 0;
     void add(const StatsdNumber& number, double rate);
-    Wide rounded() const;
+    WideInteger rounded() const;
   };
   struct Entry {
-    Sum sum;           // of everything since the listener started, or the gauge was set
-    Wide written = 0;  // of it
+    Sum sum;              // of everything since the listener started, or the gauge was set
+    WideInteger written;  // of it
     bool isSet = false;
     bool hasScalar = false;  // to be written
     bool isListed = false;   // in changed_

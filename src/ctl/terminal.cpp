@@ -75,6 +75,40 @@ std::string RightAligned(std::string_view text, std::size_t columns) {
   return std::string(columns - Columns(fit), ' ').append(fit);
 }
 
+std::vector<std::string> TableLines(const std::vector<std::vector<std::string>>& rows,
+                                    const std::vector<bool>& toTheRight, std::size_t columns) {
+  constexpr std::string_view kGap = "  ";
+  constexpr std::size_t kNarrowest = 8;
+  std::vector<std::size_t> widths(toTheRight.size());
+  for (const auto& row : rows) {
+    for (std::size_t i = 0; i < widths.size(); ++i) {
+      widths[i] = std::max(widths[i], Columns(row[i]));
+    }
+  }
+  std::size_t total = (widths.size() - 1) * kGap.size();
+  for (const std::size_t width : widths) total += width;
+  while (total > columns) {
+    std::size_t* widest = nullptr;
+    for (std::size_t i = 0; i < widths.size(); ++i) {
+      if (!toTheRight[i] && (widest == nullptr || widths[i] > *widest)) widest = &widths[i];
+    }
+    if (widest == nullptr || *widest <= kNarrowest) break;
+    --*widest;
+    --total;
+  }
+  std::vector<std::string> lines;
+  for (const auto& row : rows) {
+    std::string line;
+    for (std::size_t i = 0; i < widths.size(); ++i) {
+      if (i != 0) line += kGap;
+      line += toTheRight[i] ? RightAligned(row[i], widths[i]) : LeftAligned(row[i], widths[i]);
+    }
+    line.erase(line.find_last_not_of(' ') + 1);
+    lines.push_back(std::move(line));
+  }
+  return lines;
+}
+
 std::string Bar(double share, std::size_t width) {
   const double filled = std::isfinite(share) ? std::clamp(share, 0.0, 1.0) : 0.0;
   const auto marks = static_cast<std::size_t>(std::lround(filled * static_cast<double>(width)));
@@ -114,7 +148,7 @@ bool Interruption::waitUntil(std::chrono::steady_clock::time_point end) {
     if (left <= left.zero()) break;
     const auto seconds = std::chrono::floor<std::chrono::seconds>(left);
     timespec timeout = {};
-    timeout.tv_sec = seconds.count();
+    timeout.tv_sec = static_cast<time_t>(seconds.count());
     timeout.tv_nsec = static_cast<long>(
         std::chrono::duration_cast<std::chrono::nanoseconds>(left - seconds).count());
     isStopped = sigtimedwait(&signals, nullptr, &timeout) > 0;

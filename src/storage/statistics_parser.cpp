@@ -90,7 +90,7 @@ bool FSPParseBufferToCxt(FSPParseContext& context, std::span<const std::byte> bu
   for (std::size_t position = 0; position < words.size();) {
     const std::uint64_t header = words[position++];
     const auto id = static_cast<std::uint32_t>(header);
-    const std::size_t count = header >> 32;
+    const auto count = static_cast<std::uint32_t>(header >> 32);
     if (id > kHighestKeyId || count > words.size() - position) {
       context.exportVersion = 0;
       return false;

@@ -249,7 +249,7 @@ bool LogValidityList(Platform& platform, const StorageLogState& state,
   DumpNANDInfo(platform, values);
 
   std::array<Array, kLists> lists;
-  reader.skip(8 * words);
+  reader.skip(static_cast<std::size_t>(8 * words));
   for (std::uint64_t i = 0; i < entries; ++i) {
     ByteReader entry(reader.take(kEntrySize));
     entry.skip(4);

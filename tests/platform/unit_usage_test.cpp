@@ -36,6 +36,15 @@ std::string Number(char serial, const std::string& bytes) {
          "\0\0\0\10\1g\0\1v\0\0\1t\0\0\0\0\0\0"s + bytes;
 }
 
+// An error as the reply to call 1.
+std::string Failure(const std::string& name) {
+  const std::string field = "\4\1s\0"s + static_cast<char>(name.size()) + "\0\0\0"s + name + "\0"s;
+  const std::string fields = "\5\1u\0\1\0\0\0"s + field;
+  const std::string padding((8 - fields.size() % 8) % 8, '\0');
+  return "l\3\0\1\0\0\0\0M\0\0\0"s + static_cast<char>(fields.size()) + "\0\0\0"s + fields +
+         padding;
+}
+
 class UnitUsage : public testing::Test {
  protected:
   void has(const std::string& name, const std::string& type, const std::string& received,
@@ -95,6 +104,8 @@ TEST_F(UnitUsage, CountedServicesBecomeRecordsAndABadManagerGivesNone) {
                               {"wifiOutBytes", Int64(INT64_MAX)},
                               {"wwanInBytes", Int64(0)},
                               {"wwanOutBytes", Int64(0)}}}));
+  EXPECT_EQ(usage("OK 1\r\n" + Failure("org.freedesktop.DBus.Error.ServiceUnknown")), Array());
+  EXPECT_EQ(usage("OK 1\r\n" + Failure("org.freedesktop.DBus.Error.NoReply")), std::nullopt);
   for (std::size_t length = 1; length < body.size(); ++length) {
     EXPECT_EQ(usage("OK 1\r\n" + List(body.substr(0, length)) + rest), std::nullopt);
   }

@@ -72,7 +72,7 @@ std::optional<std::uint64_t> Counter(std::string_view text, std::string_view lab
 // A thread whose counters cannot be read, or are not all there, has no item of them: 0 would claim
 // that it has done nothing.
 std::optional<Data> IOCounters(const std::string& path) {
-  const auto text = ReadProcessFile(path);
+  const auto text = ReadKernelText(path);
   if (!text) return std::nullopt;
   ByteWriter counters;
   for (const std::string_view label : kCounters) {

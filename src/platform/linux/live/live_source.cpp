@@ -85,7 +85,7 @@ class LiveChannels : public EntrySource {
   std::span<const std::byte> elements(std::uint64_t driverID, std::uint64_t channelID) override {
     const std::uint64_t index = driverID - kFirstEntryID;
     if (!isRefreshed_ || index >= drivers_.size()) return {};
-    return drivers_[index].elements(driverID, channelID);
+    return drivers_[static_cast<std::size_t>(index)].elements(driverID, channelID);
   }
 
  private:

@@ -121,6 +121,7 @@ std::optional<std::vector<std::string>> BusConnection::call(std::span<const BusC
       const std::uint32_t index = parsed->replySerial - firstSerial;
       // Signals come unasked.
       if (parsed->replySerial == 0 || index >= count || replies[index]) continue;
+      if (!parsed->error.empty()) failure_ = parsed->error;
       replies[index] = parsed->signature == signature ? parsed->body : "";
       --missing;
     }

@@ -31,6 +31,8 @@ class BusConnection {
   // not answer all of them in time, or broke the protocol: the connection is of no use then.
   [[nodiscard]] std::optional<std::vector<std::string>> call(std::span<const BusCall> calls,
                                                              std::string_view signature);
+  // The error's name of the last call that failed with one; empty before.
+  const std::string& failure() const { return failure_; }
 
  private:
   bool waitFor(short event) const;
@@ -43,6 +45,7 @@ class BusConnection {
   Descriptor socket_;
   std::string received_;  // what has come and is not used yet
   std::uint32_t lastSerial_ = 0;
+  std::string failure_;
 };
 
 }  // namespace quorlet

@@ -10,6 +10,7 @@ enum Field : std::uint8_t {
   kPath = 1,
   kInterface = 2,
   kMember = 3,
+  kErrorName = 4,
   kReplySerial = 5,
   kDestination = 6,
   kSignature = 8,
@@ -114,7 +115,8 @@ std::optional<BusMessage> ParseBusMessage(std::string_view bytes) {
       const auto value = reader.signature();
       if (code == kSignature) message.signature = value;
     } else if (fieldType == "s" || fieldType == "o") {
-      reader.text();
+      const auto value = reader.text();
+      if (code == kErrorName) message.error = value;
     } else {
       return std::nullopt;  // the protocol has no field of another type
     }

@@ -64,7 +64,8 @@ class BusReader {
 // What a whole message says; a view into its bytes.
 struct BusMessage {
   std::uint32_t replySerial = 0;  // of the call that it ends; 0 when it is no reply
-  std::string_view signature;     // a call that failed has no signature and no body
+  std::string_view error;         // of a call that failed, which has no signature and no body
+  std::string_view signature;
   std::string_view body;
 };
 

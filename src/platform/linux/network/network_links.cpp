@@ -5,10 +5,10 @@
 #include <string>
 #include <string_view>
 
+#include "platform/linux/base/kernel_text.h"
+
 namespace quorlet {
 namespace {
-
-constexpr std::size_t kMaxAttributeBytes = 4096;
 
 // The numbers of <linux/if_arp.h> that "type" holds.
 constexpr std::string_view kTypePpp = "512";
@@ -37,13 +37,9 @@ class Interface {
 
  private:
   bool has(const char* name) const { return access((directory_ + "/" + name).c_str(), F_OK) == 0; }
-  // The text without the line break at its end; empty when it cannot be read.
+  // Empty when it cannot be read.
   std::string attribute(const char* name) const {
-    auto bytes = ReadWholeFile(directory_ + "/" + name, kMaxAttributeBytes);
-    if (std::holds_alternative<int>(bytes)) return "";
-    auto& text = std::get<std::string>(bytes);
-    if (text.ends_with('\n')) text.pop_back();
-    return std::move(text);
+    return ReadKernelText(directory_ + "/" + name).value_or("");
   }
 
   const std::string directory_;

@@ -91,13 +91,17 @@ bool ReadProperty(BusConnection& connection, std::vector<Unit>& units, std::stri
   return true;
 }
 
+constexpr std::string_view kNoManager = "org.freedesktop.DBus.Error.ServiceUnknown";
+
 std::optional<std::vector<Unit>> ReadUnits(BusConnection& connection) {
   const BusCall list[] = {
       {kManager, "/org/freedesktop/systemd1", "org.freedesktop.systemd1.Manager", "ListUnits", {}}};
   const auto reply = connection.call(list, "a(ssssssouso)");
   if (!reply) return std::nullopt;
-  // Without a list the bus has no manager on it.
-  auto units = reply->front().empty() ? std::vector<Unit>() : ParseUnits(reply->front());
+  // A bus without a manager has no services. Any other error is no answer: taken for an empty list,
+  // it would wipe the counts that the next one is compared with.
+  if (reply->front().empty() && connection.failure() == kNoManager) return std::vector<Unit>();
+  auto units = ParseUnits(reply->front());
   if (!units ||
       !ReadProperty(connection, *units, kServiceInterface, "IPIngressBytes", &Unit::inBytes)) {
     return std::nullopt;
