@@ -22,6 +22,7 @@ struct Identity {
   std::int64_t driverID = 0;
   std::int64_t channelID = 0;
   std::uint64_t type = 0;
+  // NOLINTNEXTLINE(modernize-use-nullptr): a 0 that nobody wrote
   auto operator<=>(const Identity&) const = default;
 };
 

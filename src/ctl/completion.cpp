@@ -1,5 +1,6 @@
 // quorletctl completion: completions for shells, made from the commands themselves.
 #include <CLI/CLI.hpp>
+#include <algorithm>
 #include <memory>
 #include <string>
 #include <vector>
@@ -24,14 +25,20 @@ std::vector<CLI::App*> Subcommands(CLI::App& app) {
   return app.get_subcommands([](CLI::App*) { return true; });
 }
 
+// Shells have one line for it.
+std::string OneLine(std::string text) {
+  std::ranges::replace(text, '\n', ' ');
+  return text;
+}
+
 void Collect(CLI::App& app, const std::string& path, std::vector<Candidate>& candidates) {
   for (CLI::App* command : Subcommands(app)) {
-    candidates.push_back({path, command->get_name(), command->get_description()});
+    candidates.push_back({path, command->get_name(), OneLine(command->get_description())});
   }
   for (const CLI::Option* option : app.get_options()) {
     for (const std::string& name : option->get_lnames()) {
-      candidates.push_back(
-          {path, "--" + name, option->get_description(), option->get_items_expected_max() > 0});
+      candidates.push_back({path, "--" + name, OneLine(option->get_description()),
+                            option->get_items_expected_max() > 0});
     }
   }
   for (CLI::App* command : Subcommands(app)) {
