@@ -104,9 +104,9 @@ const std::string* DrvReportChannelGetChannelName(Dictionary& channel);
 // below, "DrvReportDrivers" and "DrvReportChannelGroups": dictionaries from names to aggregates
 // without options. The order of channels matters to samples and deltas, which keep it.
 //
-// A driver takes part when its entry has the property "DrvReportLegendPublic". In a legend, what
-// comes after a group that is none is not read, nor what comes after an entry that is no array in
-// its group. An entry without an ID and a type word fails the driver.
+// A driver takes part when its entry has the property "DrvReportLegendPublic". Reading a legend
+// stops at the first group that is not a dictionary, and reading a group at the first entry that is
+// not an array. An entry without an ID and a type word fails the driver.
 
 inline constexpr std::uint32_t kDrvReportByDriver = 1;  // files channels under their driver
 inline constexpr std::uint32_t kDrvReportByGroup = 2;   // and under their group and subgroup

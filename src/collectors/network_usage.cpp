@@ -22,13 +22,13 @@
 #include <vector>
 
 #include "collectors/run_step.h"
+#include "platform/names.h"
 #include "values/digest.h"
 #include "values/property_list.h"
 
 namespace quorlet {
 namespace {
 
-constexpr char kDomain[] = "nuvex.diagwell.quorlet";
 constexpr char kBaseline[] = "netUsageBaseline";
 constexpr char kNote[] = "network-usage-baseline";
 constexpr std::chrono::seconds kReplyLimit{10};
@@ -38,7 +38,7 @@ constexpr std::array<std::string_view, 4> kFields{"wifiInBytes", "wifiOutBytes",
                                                   "wwanOutBytes"};
 constexpr std::string_view kFieldSuffix = "Bytes";
 
-// A longer name is no name of a process.
+// No process has a longer name.
 constexpr std::size_t kLongestName = 1024;
 // A baseline that is larger than a document may be could not be stored, and the next run would add
 // everything again. The rest is left to the domain's other keys.
@@ -46,9 +46,9 @@ constexpr std::size_t kBaselineBytes = kMaxPropertyListBytes - std::size_t{1024}
 
 struct UsageRecord {
   std::string_view name;
-  std::string row;  // the name as the stored baseline can tell it
+  std::string row;  // the name as it reads back from the stored baseline
   std::string_view prefix;
-  Date since;  // as the stored baseline can tell it
+  Date since;  // as it reads back from the stored baseline
   std::array<Number, kFields.size()> counts;
 };
 
@@ -210,9 +210,10 @@ UsageComparison Compare(const Array& records, const Dictionary& baseline, Platfo
 
 // Nothing when what the counts are to be compared with cannot be read: they are there next time.
 std::optional<UsageGrowth> CompareWithBaseline(const Array& records, Platform& platform) {
-  const auto stored = platform.preferences.DGWPreferencesGetValue(kBaseline, kDomain);
+  const auto stored = platform.preferences.DGWPreferencesGetValue(kBaseline, kCollectorsDomain);
   std::optional<Dictionary> noted;
-  if (!platform.preferences.isReadable(kDomain) || !platform.counterStore.readNote(kNote, noted)) {
+  if (!platform.preferences.isReadable(kCollectorsDomain) ||
+      !platform.counterStore.readNote(kNote, noted)) {
     platform.log.error("Network usage is not counted now: its baseline cannot be read");
     return std::nullopt;
   }
@@ -283,8 +284,8 @@ std::optional<Result> AskForUsage(Platform& platform,
 }  // namespace
 
 bool storeBaseline(const Dictionary& baseline, Preferences& preferences) {
-  preferences.DGWPreferencesSetValue(kBaseline, baseline, kDomain);
-  return preferences.DGWPreferencesSynchronize(kDomain);
+  preferences.DGWPreferencesSetValue(kBaseline, baseline, kCollectorsDomain);
+  return preferences.DGWPreferencesSynchronize(kCollectorsDomain);
 }
 
 StoreNote forgottenBaseline() { return {kNote, std::nullopt}; }

@@ -13,6 +13,7 @@
 #include "ctl/session.h"
 #include "ctl/terminal.h"
 #include "drvreport/drvreport.h"
+#include "platform/linux/base/paths.h"
 #include "values/digits.h"
 
 namespace quorlet {
@@ -56,8 +57,6 @@ struct ChannelsArguments {
   std::optional<std::uint64_t> count;
 };
 using Arguments = std::shared_ptr<ChannelsArguments>;
-
-constexpr char kDriversDirectory[] = "/var/db/drivers";
 
 [[noreturn]] void Fail(std::string_view what, const std::optional<ErrorValue>& error) {
   std::string text(what);

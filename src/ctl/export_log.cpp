@@ -7,6 +7,7 @@
 #include <tuple>
 
 #include "ctl/json_value.h"
+#include "platform/names.h"
 #include "values/property_list.h"
 #include "values/property_list_scalars.h"
 #include "values/text.h"
@@ -15,7 +16,6 @@ namespace quorlet {
 namespace {
 
 constexpr std::size_t kMaxHeaderBytes = 1 << 20;
-constexpr std::string_view kStatusLogType = "165";
 constexpr std::string_view kNoTasking = "(no tasking id)";
 // Lists of any length, also of one element.
 constexpr std::string_view kListKey = "ValidityList[";

@@ -9,6 +9,7 @@
 #include <cerrno>
 
 #include "platform/linux/base/paths.h"
+#include "platform/names.h"
 
 namespace quorlet {
 namespace {
@@ -90,7 +91,7 @@ Finding CheckPermissions(const Root& root) {
 }
 
 Finding CheckService(const Root& root) {
-  const std::string service = SocketState(root, "nuvex.aggregated.quorlet", kServiceUnit);
+  const std::string service = SocketState(root, kServiceName, kServiceUnit);
   const std::string record = SocketState(root, "statsd", kRecordUnit);
   const std::string both = "named service " + (service.empty() ? "not there" : service) +
                            ", recording socket " + (record.empty() ? "not there" : record);

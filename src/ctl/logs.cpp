@@ -22,6 +22,7 @@
 #include "ctl/terminal.h"
 #include "platform/linux/base/descriptor.h"
 #include "platform/linux/base/paths.h"
+#include "platform/names.h"
 #include "values/property_list.h"
 #include "values/text.h"
 
@@ -34,8 +35,6 @@ constexpr std::array<std::string_view, 2> kStages = {"pending", "outbox"};
 constexpr std::size_t kMaxLogBytes = 64 << 20;
 constexpr std::size_t kMaxHeaderBytes = 1 << 20;
 constexpr std::string_view kLatest = "latest";
-// The log of a day; a pass writes others beside it.
-constexpr std::string_view kAggregatedType = "193";
 
 struct LogsArguments {
   std::string file;
@@ -229,7 +228,7 @@ std::string PathOfLog(const std::string& name) {
   const std::vector<StoredLog> logs = FindLogs();
   if (logs.empty()) throw Failure("there is no log yet");
   const auto last =
-      std::ranges::find(logs.rbegin(), logs.rend(), kAggregatedType, &StoredLog::type);
+      std::ranges::find(logs.rbegin(), logs.rend(), kAggregatedLogType, &StoredLog::type);
   return PathOfNamedLog(last != logs.rend() ? last->name : logs.back().name);
 }
 

@@ -15,13 +15,13 @@
 #include "platform/linux/service/frame_buffer.h"
 #include "platform/linux/service/services.h"
 #include "platform/linux/service/unix_socket.h"
+#include "platform/names.h"
 #include "values/digits.h"
 #include "values/property_list.h"
 
 namespace quorlet {
 namespace {
 
-constexpr char kServiceName[] = "nuvex.aggregated.quorlet";
 constexpr double kLongestWait = 86400;
 constexpr char kWaitHelp[] = "Seconds to wait for the service to appear (default: 0)";
 constexpr char kDayHelp[] = "Day number, YYYY-MM-DD, \"today\" or \"yesterday\"";

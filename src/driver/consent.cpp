@@ -4,12 +4,11 @@
 #include <utility>
 
 #include "collectors/network_usage.h"
+#include "platform/names.h"
 
 namespace quorlet {
 namespace {
 
-constexpr char kDomain[] = "nuvex.diagwell";
-constexpr char kEnabled[] = "SubmissionEnabled";
 // {"drop", "baseline"}: which drop is due, and the network usage that is to be counted from. There
 // from the consent until the drop is made.
 constexpr char kDropDue[] = "CounterDropDue";
@@ -18,7 +17,7 @@ constexpr char kDropDue[] = "CounterDropDue";
 constexpr char kNote[] = "consent";
 
 bool Synchronize(Preferences& preferences) {
-  return preferences.DGWPreferencesSynchronize(kDomain);
+  return preferences.DGWPreferencesSynchronize(kConsentDomain);
 }
 
 bool DropCounters(CounterStore& store, const std::string& drop) {
@@ -35,7 +34,7 @@ bool DropCounters(CounterStore& store, const std::string& drop) {
 }  // namespace
 
 Consent consentOf(Preferences& preferences) {
-  const auto value = preferences.DGWPreferencesGetValue(kEnabled, kDomain);
+  const auto value = preferences.DGWPreferencesGetValue(kSubmissionEnabled, kConsentDomain);
   if (!value) return Consent::kOff;
   if (*value == PropertyValue(true)) return Consent::kOn;
   return *value == PropertyValue(false) ? Consent::kOff : Consent::kInvalid;
@@ -43,7 +42,7 @@ Consent consentOf(Preferences& preferences) {
 
 bool finishDueDrop(Platform& platform) {
   Preferences& preferences = platform.preferences;
-  const auto stored = preferences.DGWPreferencesGetValue(kDropDue, kDomain);
+  const auto stored = preferences.DGWPreferencesGetValue(kDropDue, kConsentDomain);
   const Dictionary* due = stored ? stored->asDictionary() : nullptr;
   if (due == nullptr) return true;
   const std::string* drop = StringEntry(*due, "drop");
@@ -54,14 +53,14 @@ bool finishDueDrop(Platform& platform) {
         "What was counted without consent cannot be dropped yet; it is not reported");
     return false;
   }
-  preferences.DGWPreferencesSetValue(kDropDue, std::nullopt, kDomain);
+  preferences.DGWPreferencesSetValue(kDropDue, std::nullopt, kConsentDomain);
   return Synchronize(preferences);
 }
 
 bool giveConsent(Platform& platform, bool keepCounters) {
   Preferences& preferences = platform.preferences;
   if (consentOf(preferences) == Consent::kOn) return finishDueDrop(platform);
-  const auto before = preferences.DGWPreferencesGetValue(kEnabled, kDomain);
+  const auto before = preferences.DGWPreferencesGetValue(kSubmissionEnabled, kConsentDomain);
   std::optional<PropertyValue> due;
   if (!keepCounters) {
     const std::optional<Dictionary> baseline = askForBaseline(platform);
@@ -71,12 +70,12 @@ bool giveConsent(Platform& platform, bool keepCounters) {
     }
     due = Dictionary{{"drop", platform.crashSupport.GetIncidentID()}, {"baseline", *baseline}};
   }
-  preferences.DGWPreferencesSetValue(kEnabled, PropertyValue(true), kDomain);
-  preferences.DGWPreferencesSetValue(kDropDue, due, kDomain);
+  preferences.DGWPreferencesSetValue(kSubmissionEnabled, PropertyValue(true), kConsentDomain);
+  preferences.DGWPreferencesSetValue(kDropDue, due, kConsentDomain);
   if (!Synchronize(preferences)) {
     // Not to be written later, when nobody expects it any more.
-    preferences.DGWPreferencesSetValue(kEnabled, before, kDomain);
-    preferences.DGWPreferencesSetValue(kDropDue, std::nullopt, kDomain);
+    preferences.DGWPreferencesSetValue(kSubmissionEnabled, before, kConsentDomain);
+    preferences.DGWPreferencesSetValue(kDropDue, std::nullopt, kConsentDomain);
     return false;
   }
   return finishDueDrop(platform);
@@ -84,8 +83,8 @@ bool giveConsent(Platform& platform, bool keepCounters) {
 
 bool withdrawConsent(Platform& platform) {
   Preferences& preferences = platform.preferences;
-  preferences.DGWPreferencesSetValue(kEnabled, std::nullopt, kDomain);
-  preferences.DGWPreferencesSetValue(kDropDue, std::nullopt, kDomain);
+  preferences.DGWPreferencesSetValue(kSubmissionEnabled, std::nullopt, kConsentDomain);
+  preferences.DGWPreferencesSetValue(kDropDue, std::nullopt, kConsentDomain);
   return Synchronize(preferences) && platform.diagnostics.removeAllLogs();
 }
 

@@ -15,11 +15,10 @@
 #include "driver/run_driver.h"
 #include "drvreport/property_value.h"
 #include "platform/named_service.h"
+#include "platform/names.h"
 #include "platform/platform.h"
 
 namespace quorlet {
-
-inline constexpr std::string_view kServiceName = "nuvex.aggregated.quorlet";
 
 class Listener {
  public:

@@ -12,6 +12,7 @@
 #include <algorithm>
 #include <utility>
 
+#include "platform/names.h"
 #include "values/digits.h"
 
 namespace quorlet {
@@ -19,9 +20,7 @@ namespace {
 
 constexpr char kNote[] = "passes";
 constexpr std::int32_t kDaysKept = 31;  // as long as their counters, and yesterday's pass
-constexpr std::string_view kAggregatedLog = "log-aggregated";
 constexpr std::string_view kPreviousOSVersion = "previous_os_version";
-constexpr char kOwnDomain[] = "nuvex.aggregated.quorlet";
 constexpr char kCountDomain[] = "nuvex.aggregated";
 constexpr char kCorruptionCount[] = "DatabaseCorruptionCount";
 // {"pass", "count"}: what an unfinished pass took off the count above, written together with it.
@@ -140,7 +139,7 @@ void PassJournal::takeOver() {
 
 // The preference is there while a pass is unfinished, or its log lost.
 void PassJournal::takeOverOSVersion() {
-  const auto stored = platform_.preferences.DGWPreferencesGetValue(kOSVersionBefore, kOwnDomain);
+  const auto stored = platform_.preferences.DGWPreferencesGetValue(kOSVersionBefore, kPassDomain);
   const Dictionary* before = stored ? stored->asDictionary() : nullptr;
   const std::string* version = before != nullptr ? StringEntry(*before, "version") : nullptr;
   if (version == nullptr) return;
@@ -182,7 +181,7 @@ bool PassJournal::keepsLeftLog() {
   if (!isRepeated_ || !hasSpooledLog(entry())) return false;
   const Dictionary* told = DictionaryEntry(entry(), "corruptionsTold");
   std::int64_t corruptions = 0;
-  for (const std::string& name : LogsNamed(entry(), kAggregatedLog)) {
+  for (const std::string& name : LogsNamed(entry(), kAggregatedLogName)) {
     if (told == nullptr || !platform_.diagnostics.hasLog(name)) continue;
     corruptions = IntegerEntry(*told, name).value_or(0);
   }
@@ -198,7 +197,7 @@ bool PassJournal::keepsLeftLog() {
 
 bool PassJournal::hasSpooledLog(const Dictionary& entry) {
   return IsSet(entry, "published") ||
-         std::ranges::any_of(LogsNamed(entry, kAggregatedLog), [this](const std::string& name) {
+         std::ranges::any_of(LogsNamed(entry, kAggregatedLogName), [this](const std::string& name) {
            return platform_.diagnostics.hasLog(name);
          });
 }
@@ -219,7 +218,7 @@ std::optional<Array> PassJournal::takeAppInfo(const std::optional<Array>& given)
 std::vector<std::string> PassJournal::logsToReplace(std::string_view name) {
   std::vector<std::string> fileNames;
   for (const auto& [day, value] : entries_) {
-    const bool isMeant = day == entryName_ ? isRepeated_ : name != kAggregatedLog;
+    const bool isMeant = day == entryName_ ? isRepeated_ : name != kAggregatedLogName;
     if (!isMeant) continue;
     const auto logs = LogsNamed(*value.asDictionary(), name);
     fileNames.insert(fileNames.end(), logs.begin(), logs.end());
@@ -231,7 +230,7 @@ void PassJournal::noteLog(std::string_view name, const std::string& fileName) {
   std::vector<std::string> logs = LogsNamed(entry(), name);
   logs.push_back(fileName);
   SetLogs(entry(), name, logs);
-  if (name == kAggregatedLog) {
+  if (name == kAggregatedLogName) {
     if (osVersionBefore_) entry()["osVersionBefore"] = *osVersionBefore_;
     const Dictionary* stored = DictionaryEntry(entry(), "corruptionsTold");
     Dictionary told = stored != nullptr ? stored->shallowCopy() : Dictionary();
@@ -242,7 +241,7 @@ void PassJournal::noteLog(std::string_view name, const std::string& fileName) {
 }
 
 bool PassJournal::NotingDiagnostics::writeLog(const LogRequest& request, const LogWriter& writer) {
-  const bool isAggregated = request.name == kAggregatedLog;
+  const bool isAggregated = request.name == kAggregatedLogName;
   LogRequest noted = request;
   if (isAggregated && journal_.osVersionBefore_) {
     noted.metadata = request.metadata ? request.metadata->shallowCopy() : Dictionary();
@@ -302,10 +301,10 @@ void PassJournal::settle(ReportOutcome outcome) {
         kCountDomain);
     preferences.DGWPreferencesSynchronize(kCountDomain);
   }
-  if (!preferences.DGWPreferencesGetValue(kOSVersionBefore, kOwnDomain)) return;
-  preferences.DGWPreferencesSetValue(kOSVersionBefore, std::nullopt, kOwnDomain);
+  if (!preferences.DGWPreferencesGetValue(kOSVersionBefore, kPassDomain)) return;
+  preferences.DGWPreferencesSetValue(kOSVersionBefore, std::nullopt, kPassDomain);
   // The gate is written to the same domain.
-  if (!isGated_) preferences.DGWPreferencesSynchronize(kOwnDomain);
+  if (!isGated_) preferences.DGWPreferencesSynchronize(kPassDomain);
 }
 
 void PassJournal::end() {

@@ -9,13 +9,11 @@
 #include "driver/consent.h"
 #include "driver/pass_journal.h"
 #include "driver/tasking.h"
+#include "platform/names.h"
 #include "report/report.h"
 
 namespace quorlet {
 namespace {
-
-constexpr char kDomain[] = "nuvex.aggregated.quorlet";
-constexpr char kLastDay[] = "LastCrashLogSerializationDateInDaysSince1970";
 
 // A gate that is further ahead than this was recorded while the clock was wrong.
 constexpr std::int32_t kFarAhead = 30;
@@ -53,14 +51,15 @@ void RunDriver::runDailyTasksIfNewDay(const std::optional<Array>& appInfo) {
   PassJournal journal(platform_, yesterday, /*isGated=*/true, *last);
   runSequence(yesterday, appInfo, journal);
   Preferences& preferences = platform_.preferences;
-  preferences.DGWPreferencesSetValue(kLastDay, Int32(yesterday), kDomain);
-  preferences.DGWPreferencesSynchronize(kDomain);
+  preferences.DGWPreferencesSetValue(kGateDay, Int32(yesterday), kPassDomain);
+  preferences.DGWPreferencesSynchronize(kPassDomain);
   journal.end();
 }
 
 void RunDriver::runDailyTasks(std::int32_t day, const std::optional<Array>& appInfo) {
   const PassHold hold(platform_.passLock);
-  const std::int64_t last = platform_.preferences.DGWPreferencesGetIntegerValue(kLastDay, kDomain);
+  const std::int64_t last =
+      platform_.preferences.DGWPreferencesGetIntegerValue(kGateDay, kPassDomain);
   PassJournal journal(platform_, day, /*isGated=*/false, last);
   runSequence(day, appInfo, journal);
   journal.end();
@@ -68,8 +67,8 @@ void RunDriver::runDailyTasks(std::int32_t day, const std::optional<Array>& appI
 
 std::optional<std::int64_t> RunDriver::gateDay() {
   Preferences& preferences = platform_.preferences;
-  if (!preferences.isReadable(kDomain)) return std::nullopt;
-  return preferences.DGWPreferencesGetIntegerValue(kLastDay, kDomain);
+  if (!preferences.isReadable(kPassDomain)) return std::nullopt;
+  return preferences.DGWPreferencesGetIntegerValue(kGateDay, kPassDomain);
 }
 
 std::optional<std::vector<std::int32_t>> RunDriver::missingDays() {
@@ -116,7 +115,7 @@ void RunDriver::warnOfFutureDay(std::int64_t day) {
       "The last daily pass is recorded for day %lld, far in the future: no pass runs until then. "
       "If "
       "today's date is right, \"quorletctl prefs remove %s %s\" lets passes run again",
-      day, kDomain, kLastDay);
+      day, kPassDomain, kGateDay);
 }
 
 ReportOutcome RunDriver::writeLog(std::int32_t day, const std::optional<Array>& appInfo,

@@ -9,10 +9,11 @@
 #include <string>
 #include <utility>
 
+#include "platform/names.h"
+
 namespace quorlet {
 namespace {
 
-constexpr std::string_view kOwnDomain = "nuvex.aggregated.quorlet";
 constexpr std::string_view kLastOSUpdate = "LastOSUpdate";
 constexpr std::string_view kTaskingID = "TaskingID";
 constexpr std::string_view kTaskingOS = "TaskingOS";
@@ -58,14 +59,14 @@ class TaskingUpdate {
 
  private:
   std::optional<PropertyValue> own(std::string_view key) {
-    return platform_.preferences.DGWPreferencesGetValue(key, kOwnDomain);
+    return platform_.preferences.DGWPreferencesGetValue(key, kPassDomain);
   }
   std::optional<std::string> ownText(std::string_view key) {
     const auto value = own(key);
     return Text(value ? &*value : nullptr);
   }
   void set(std::string_view key, std::optional<PropertyValue> value) {
-    platform_.preferences.DGWPreferencesSetValue(key, std::move(value), kOwnDomain);
+    platform_.preferences.DGWPreferencesSetValue(key, std::move(value), kPassDomain);
   }
 
   void noteOSChange() {
@@ -126,7 +127,7 @@ class TaskingUpdate {
     // A run may also have been cut short with only its record left to remove.
     if (old != nullptr || payload != nullptr || own(kTaskingInProgress)) {
       set(kTaskingInProgress, PropertyValue(record));
-      platform_.preferences.DGWPreferencesSynchronize(kOwnDomain);
+      platform_.preferences.DGWPreferencesSynchronize(kPassDomain);
       const bool isWritten = writeDomains(old, payload);
       // While this is not durable, the next run does the same again.
       const Dictionary& known = payload != nullptr ? record : Dictionary();
@@ -135,11 +136,11 @@ class TaskingUpdate {
       }
       if (payload != nullptr) set(kTaskingOS, Optional(record.find(kTaskingOS)));
       // Cut short before the announcement, the next run makes it.
-      platform_.preferences.DGWPreferencesSynchronize(kOwnDomain);
+      platform_.preferences.DGWPreferencesSynchronize(kPassDomain);
       platform_.notifications.PostNotification(kTaskingChanged);
       if (!isWritten) return;
       set(kTaskingInProgress, std::nullopt);
-      platform_.preferences.DGWPreferencesSynchronize(kOwnDomain);
+      platform_.preferences.DGWPreferencesSynchronize(kPassDomain);
       return;
     }
     platform_.notifications.PostNotification(kTaskingChanged);
@@ -151,7 +152,7 @@ class TaskingUpdate {
     const auto set = [&](const std::string& domain, const std::string& key,
                          const PropertyValue* value) {
       // Not a tasking's to change: it is what brings this one to its end.
-      if (domain == kOwnDomain && key == kTaskingInProgress) return;
+      if (domain == kPassDomain && key == kTaskingInProgress) return;
       platform_.preferences.DGWPreferencesSetValue(key, Optional(value), domain);
       touched.insert(domain);
     };
@@ -163,7 +164,7 @@ class TaskingUpdate {
     bool allWritten = true;
     for (const std::string& domain : touched) {
       // Our own one follows with the record, which must not be durable before the others.
-      if (domain == kOwnDomain) continue;
+      if (domain == kPassDomain) continue;
       allWritten = platform_.preferences.DGWPreferencesSynchronize(domain) && allWritten;
     }
     return allWritten;

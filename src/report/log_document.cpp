@@ -2,13 +2,13 @@
 #include <utility>
 #include <variant>
 
+#include "platform/names.h"
 #include "report/report.h"
 #include "values/property_list.h"
 
 namespace quorlet {
 namespace {
 
-constexpr std::string_view kDomain = "nuvex.aggregated.quorlet";
 constexpr std::string_view kLastOSVersion = "LastOSVersion";
 constexpr std::string_view kAllApps = "nuvex.tilehall.numAllInstalledApps";
 constexpr std::string_view kThirdPartyApps = "nuvex.tilehall.numThirdPartyApps";
@@ -20,18 +20,18 @@ std::string FirstOrUnknown(const std::vector<std::string>& list) {
 
 // Remembers the running OS version; when it is new, the metadata that tells the one before.
 std::optional<Dictionary> NoteOSVersion(Platform& platform, std::int32_t day) {
-  const auto previous = platform.preferences.DGWPreferencesGetValue(kLastOSVersion, kDomain);
+  const auto previous = platform.preferences.DGWPreferencesGetValue(kLastOSVersion, kPassDomain);
   const std::string current = platform.diagnostics.DGWOSVersion();
   const std::string* previousText = previous ? previous->asString() : nullptr;
   if (previousText != nullptr && *previousText == current) return std::nullopt;
   const std::string before = previousText != nullptr ? *previousText : kUnknown;
   // Written together: should this log never be spooled, the next one tells it.
-  if (!platform.preferences.DGWPreferencesGetValue(kOSVersionBefore, kDomain)) {
+  if (!platform.preferences.DGWPreferencesGetValue(kOSVersionBefore, kPassDomain)) {
     platform.preferences.DGWPreferencesSetValue(
-        kOSVersionBefore, Dictionary{{"version", before}, {"day", Int32(day)}}, kDomain);
+        kOSVersionBefore, Dictionary{{"version", before}, {"day", Int32(day)}}, kPassDomain);
   }
-  platform.preferences.DGWPreferencesSetValue(kLastOSVersion, PropertyValue(current), kDomain);
-  platform.preferences.DGWPreferencesSynchronize(kDomain);
+  platform.preferences.DGWPreferencesSetValue(kLastOSVersion, PropertyValue(current), kPassDomain);
+  platform.preferences.DGWPreferencesSynchronize(kPassDomain);
   return Dictionary{{"previous_os_version", before}};
 }
 
@@ -63,7 +63,8 @@ bool TLReport::serializeWithDateAndAppInfo(std::int32_t yesterday,
   const auto writer = [&](LogOutput& output) {
     return output.write(std::get<std::string>(document));
   };
-  if (_platform.diagnostics.DGWWriteLogForSubmission("193", "log-aggregated", metadata, writer)) {
+  if (_platform.diagnostics.DGWWriteLogForSubmission(kAggregatedLogType, kAggregatedLogName,
+                                                     metadata, writer)) {
     return true;
   }
   _platform.log.error("Failed to write aggregated log");
@@ -73,7 +74,7 @@ bool TLReport::serializeWithDateAndAppInfo(std::int32_t yesterday,
 Dictionary TLReport::assembleDocument(std::int32_t yesterday, const std::string& whitelistDigest,
                                       const std::optional<Array>& appInfo) {
   const auto tasking = [this](std::string_view key) {
-    return _platform.preferences.DGWPreferencesGetValue(key, kDomain);
+    return _platform.preferences.DGWPreferencesGetValue(key, kPassDomain);
   };
   const auto taskID = tasking("TaskingID");
   const auto taskDigest = tasking("TaskingDigest");

@@ -118,9 +118,9 @@ class ExporterConnection {
   RegistryHandle connection() const { return connection_; }
 
   // Asks for the size in bytes of the export. Without `selectors` (nullptr) the driver gets no
-  // request block. Writes no message; as do the next ones.
+  // request block. Like fetch(), it writes no message.
   KernelReturn querySize(const SelectorPair* selectors, std::uint16_t flags, std::uint32_t& size);
-  // Fetches the export into `buffer`; `written` is what the driver has filled of it.
+  // Fetches the export into `buffer`; `written` is how many bytes the driver wrote.
   KernelReturn fetch(const SelectorPair* selectors, std::uint16_t flags,
                      std::span<std::byte> buffer, std::size_t& written);
 

@@ -7,12 +7,12 @@
 #include <exception>
 #include <optional>
 
+#include "platform/names.h"
 #include "values/text.h"
 
 namespace quorlet {
 namespace {
 
-constexpr char kDomain[] = "nuvex.diagwell.quorlet";
 constexpr char kLastLoggedAt[] = "SSLastLoggedAt";
 constexpr double kSecondsBetweenLogs = 604800;
 constexpr char kProcessName[] = "quorlet";
@@ -71,7 +71,7 @@ std::string LogText(Platform& platform, Date now, const Dictionary& values) {
 
 void WriteLog(Platform& platform, std::string_view typeCode, const Dictionary* values) {
   const Date now = platform.clock.now();
-  const auto stored = platform.preferences.CopyPreferenceValue(kLastLoggedAt, kDomain);
+  const auto stored = platform.preferences.CopyPreferenceValue(kLastLoggedAt, kCollectorsDomain);
   const Date* last = stored ? stored->asDate() : nullptr;
   if (last != nullptr && now.secondsSince1970 - last->secondsSince1970 < kSecondsBetweenLogs) {
     platform.log.log("NANDLogWriter:Last written at %@ current %@ :skipped", PropertyValue(*last),
@@ -83,8 +83,8 @@ void WriteLog(Platform& platform, std::string_view typeCode, const Dictionary* v
   platform.diagnostics.DGWWriteLogForSubmission(
       typeCode, "StorageStatus", std::nullopt,
       [&](LogOutput& output) { return output.write(text); });
-  platform.preferences.DGWPreferencesSetValue(kLastLoggedAt, PropertyValue(now), kDomain);
-  platform.preferences.DGWPreferencesSynchronize(kDomain);
+  platform.preferences.DGWPreferencesSetValue(kLastLoggedAt, PropertyValue(now), kCollectorsDomain);
+  platform.preferences.DGWPreferencesSynchronize(kCollectorsDomain);
 }
 
 }  // namespace

@@ -20,6 +20,7 @@
 #include <string>
 #include <vector>
 
+#include "platform/names.h"
 #include "storage/exporters.h"
 #include "storage/nand_info.h"
 #include "storage/statistics_parser.h"
@@ -33,7 +34,6 @@ namespace quorlet {
 namespace {
 
 constexpr std::int32_t kStructuredLogType = 176;
-constexpr char kStatusLogType[] = "165";
 constexpr float kDefaultThreshold = 2.0F;
 constexpr float kThresholdLimit = 10.0F;
 

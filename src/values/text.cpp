@@ -61,7 +61,7 @@ std::string FormatMessage(std::string_view text, std::span<const MessageArgument
       out += arguments[next++].text();
       text.remove_prefix(length);
     } else {
-      // "%%", or a text that no compiler counted: what is not understood stays as it is.
+      // "%%", or a conversion without an argument, which is printed as it stands.
       out += '%';
       text.remove_prefix(text.starts_with("%%") ? 2 : 1);
     }
@@ -71,7 +71,7 @@ std::string FormatMessage(std::string_view text, std::span<const MessageArgument
 
 std::size_t PrintableAsciiPrefix(std::string_view text) {
   std::size_t at = 0;
-  // Eight bytes at a time, without a branch for each: most text is nothing else.
+  // Most text is plain ASCII: eight bytes at a time, without a branch for each.
   for (; text.size() - at >= 8; at += 8) {
     unsigned odd = 0;
     for (std::size_t i = 0; i < 8; ++i) {

@@ -104,6 +104,7 @@ TEST_F(RecordTest, TakesDatagramsInWhileACommitWaits) {
   start();
   sqlite3* other = nullptr;
   ASSERT_EQ(sqlite3_open(device.path(kStore).c_str(), &other), SQLITE_OK);
+  sqlite3_busy_timeout(other, 10'000);  // the listener, too, locks the store while it starts
   ASSERT_EQ(sqlite3_exec(other, "BEGIN IMMEDIATE", nullptr, nullptr, nullptr), SQLITE_OK);
   // Many times what the kernel's queue holds; a sender that waits would give up after 3 s.
   const auto started = std::chrono::steady_clock::now();

@@ -1,4 +1,4 @@
-// Where what we write lies below the root.
+// Where what we read and write lies below the root.
 #ifndef QUORLET_PLATFORM_LINUX_BASE_PATHS_H_
 #define QUORLET_PLATFORM_LINUX_BASE_PATHS_H_
 
@@ -6,6 +6,7 @@
 
 namespace quorlet {
 
+inline constexpr char kDriversDirectory[] = "/var/db/drivers";
 inline constexpr char kPreferencesDirectory[] = "/var/mobile/Library/Preferences";
 // Logs for submission, in pending/ and outbox/.
 inline constexpr char kSpoolDirectory[] = "/var/mobile/Library/Logs/Diagwell";

@@ -66,7 +66,7 @@ std::string Sequence(const std::string& directory) {
   return ReadKernelText(directory + "/diskseq").value_or("");
 }
 
-// Made of other devices, or of memory: their traffic is, or is none of, the disks'.
+// Built from other devices, whose traffic would count twice, or from memory.
 bool IsVirtual(const BlockDevice& device) {
   constexpr std::array<std::string_view, 5> kKinds = {"loop", "ram", "zram", "dm-", "md"};
   return device.link.find("/virtual/block/") != std::string::npos ||

@@ -113,7 +113,7 @@ class CpuFrequencyPublisher : public LivePublisher {
       for (const Frequency& frequency : frequencies) {
         const std::uint64_t id = FrequencyID(frequency.kilohertz);
         if (id == 0) break;  // the channel is left out: it has too few records
-        // The frequency is the slot: a table that changes is another one.
+        // Slots are named by frequency, so that a table that changes does not mix up totals.
         const std::size_t slot = 2 * static_cast<std::size_t>(frequency.kilohertz);
         records.push_back({static_cast<std::int64_t>(id),
                            totals_.add(cpu.id, slot, frequency.entered),

@@ -21,6 +21,7 @@
 #include "platform/linux/base/paths.h"
 #include "platform/linux/base/property_json.h"
 #include "platform/linux/logs/services.h"
+#include "platform/names.h"
 
 namespace quorlet {
 namespace {
@@ -117,7 +118,7 @@ class LinuxDiagnostics : public Diagnostics {
 
   bool DiagnosticLogSubmissionEnabled() override {
     bool found = false;
-    return preferences_.DGWPreferencesGetBoolValue("SubmissionEnabled", "nuvex.diagwell", found);
+    return preferences_.DGWPreferencesGetBoolValue(kSubmissionEnabled, kConsentDomain, found);
   }
 
   std::string DGWOSVersion() override { return OSVersionText(osVersion_); }

@@ -13,6 +13,7 @@
 #include <variant>
 #include <vector>
 
+#include "platform/linux/base/paths.h"
 #include "platform/report_records.h"
 #include "platform/storage_exports.h"
 #include "values/byte_reader.h"
@@ -22,7 +23,6 @@
 namespace quorlet {
 namespace {
 
-constexpr char kDirectory[] = "/var/db/drivers";
 constexpr std::size_t kMaxFiles = 4096;
 // Of all files together.
 constexpr std::size_t kMaxBytes = std::size_t{64} << 20;
@@ -221,7 +221,8 @@ DriverFile ReadDescription(std::string_view text) {
 
 class DriverFiles : public EntrySource {
  public:
-  DriverFiles(const Root& root, SystemLog& log) : directory_(root.path(kDirectory)), log_(log) {}
+  DriverFiles(const Root& root, SystemLog& log)
+      : directory_(root.path(kDriversDirectory)), log_(log) {}
 
   std::vector<RegistryEntry> entries() override {
     read();

@@ -23,9 +23,10 @@ namespace quorlet {
 
 inline constexpr std::string_view kReportHubClass = "DrvReportHub";
 
-// The driver of one connection to the hub. `described`, which may be none, is asked first: what it
-// answers to opening and closing counts, a method of its that fails stays failed, and a scalar that
-// it answers to method 2 becomes the token. The sources must outlive the driver.
+// The driver of one connection to the hub. `described` (may be nullptr) is the hub as a driver file
+// describes it, and is asked first: its answers to opening and closing are used, a method that
+// fails there fails, and a scalar that it returns for method 2 becomes the token. The sources must
+// outlive the driver.
 std::shared_ptr<EntryDriver> MakeReportHub(std::vector<EntrySource*> sources,
                                            std::shared_ptr<EntryDriver> described);
 

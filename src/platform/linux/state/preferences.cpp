@@ -28,7 +28,7 @@ namespace {
 
 constexpr std::size_t kLongestShownName = 201;  // a byte more than a good name has
 
-// What tells one content of a file from another; `error` is set when there is none to be seen.
+// Tells whether a file has changed since it was read; `error` when it cannot be examined.
 struct FileVersion {
   dev_t device = 0;
   ino_t inode = 0;
