@@ -102,7 +102,10 @@ class ValueBuilder final : public nlohmann::json_sax<Json> {
   bool parse_error(std::size_t, const std::string&, const Json::exception& error) override {
     std::string_view why = error.what();
     if (why.starts_with('[')) why.remove_prefix(std::min(why.find(']') + 2, why.size()));
-    return fail(std::string(why));
+    // It quotes what it read last, several bytes for one.
+    constexpr std::size_t kLongestReason = 200;
+    return fail(std::string(why.substr(0, kLongestReason)) +
+                (why.size() > kLongestReason ? "..." : ""));
   }
 
   const std::string& error() const { return error_; }

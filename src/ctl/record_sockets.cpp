@@ -1,5 +1,8 @@
 #include "ctl/record_sockets.h"
 
+#include <fcntl.h>
+#include <sys/time.h>
+
 #include <cerrno>
 #include <cstring>
 #include <utility>
@@ -9,6 +12,9 @@
 
 namespace quorlet {
 namespace {
+
+// How long a read may wait. Signals and timers wait as long.
+constexpr timeval kMoment = {0, 20'000};
 
 // The kernel's word, which only root can forge.
 Sender SenderOf(msghdr& header) {
@@ -47,6 +53,11 @@ std::vector<ListeningSocket> OpenRecordSockets(const std::string& path) {
   for (const ListeningSocket& socket : sockets) {
     // Over UDP there are no credentials to ask for.
     static_cast<void>(setsockopt(socket.get(), SOL_SOCKET, SO_PASSCRED, &on, sizeof on));
+    const int flags = fcntl(socket.get(), F_GETFL);
+    if (flags >= 0 &&
+        setsockopt(socket.get(), SOL_SOCKET, SO_RCVTIMEO, &kMoment, sizeof kMoment) == 0) {
+      static_cast<void>(fcntl(socket.get(), F_SETFL, flags & ~O_NONBLOCK));
+    }
   }
   return sockets;
 }
@@ -55,7 +66,7 @@ std::vector<ListeningSocket> OpenRecordSockets(const std::string& path) {
 DatagramReader::DatagramReader()
     : texts_(std::make_unique_for_overwrite<char[]>(kAtOnce * kLongestDatagram)) {}
 
-std::size_t DatagramReader::read(int socket, const Take& take) {
+std::size_t DatagramReader::read(int socket, Patience patience, const Take& take) {
   for (std::size_t i = 0; i < kAtOnce; ++i) {
     places_[i] = {texts_.get() + i * kLongestDatagram, kLongestDatagram};
     msghdr& header = messages_[i].msg_hdr;
@@ -65,9 +76,10 @@ std::size_t DatagramReader::read(int socket, const Take& take) {
     header.msg_control = credentials_[i].bytes.data();
     header.msg_controllen = credentials_[i].bytes.size();
   }
-  const int count = Uninterrupted([&] {
-    return recvmmsg(socket, messages_.data(), kAtOnce, MSG_DONTWAIT | MSG_CMSG_CLOEXEC, nullptr);
-  });
+  const int flags =
+      MSG_CMSG_CLOEXEC | (patience == Patience::kAMoment ? MSG_WAITFORONE : MSG_DONTWAIT);
+  const int count =
+      Uninterrupted([&] { return recvmmsg(socket, messages_.data(), kAtOnce, flags, nullptr); });
   for (int i = 0; i < count; ++i) {
     mmsghdr& message = messages_[static_cast<std::size_t>(i)];
     const auto* text = static_cast<const char*>(message.msg_hdr.msg_iov->iov_base);

@@ -30,9 +30,10 @@ class DatagramReader {
   static constexpr std::size_t kLongestDatagram = std::size_t{1} << 18;
 
   // Hands each datagram that waits on the socket, up to some, to `take`; `isCut` when its end was
-  // lost. Returns how many there were; 0 when none waits.
+  // lost. Returns how many there were. Where none waits, it may give the first one a moment.
   using Take = std::function<void(std::string_view text, Sender sender, bool isCut)>;
-  std::size_t read(int socket, const Take& take);
+  enum class Patience { kNone, kAMoment };
+  std::size_t read(int socket, Patience patience, const Take& take);
 
  private:
   static constexpr std::size_t kAtOnce = 16;

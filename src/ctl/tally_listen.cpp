@@ -35,6 +35,7 @@ using Steady = std::chrono::steady_clock;
 constexpr char kDefaultSocket[] = "/run/quorlet/statsd";
 constexpr std::chrono::seconds kFlushInterval{1};
 constexpr std::chrono::minutes kTellInterval{1};
+constexpr std::chrono::milliseconds kWaitInterval{20};
 constexpr std::uint64_t kLargestStore = std::uint64_t{256} << 20;
 constexpr std::uint64_t kLeastFreePercent = 5;
 // What may wait in the sockets when the end has come; senders that go on must not put it off.
@@ -131,7 +132,7 @@ class TallyListener {
 
   bool isOver() const;
   void wait();
-  std::size_t readSockets();
+  std::size_t readSockets(DatagramReader::Patience patience);
   void take(std::string_view text, Sender sender, bool isCut);
   void enterNow();
   void checkStore();
@@ -153,6 +154,7 @@ class TallyListener {
   bool isStoreFull_ = false;
   Steady::time_point time_ = Steady::now();
   Steady::time_point lastDatagram_ = time_;
+  Steady::time_point nextWait_ = time_;
   Steady::time_point nextFlush_ = time_;
   Steady::time_point nextCheck_ = time_;
   Steady::time_point nextTell_ = time_ + kTellInterval;
@@ -172,9 +174,17 @@ bool TallyListener::isOver() const {
 }
 
 void TallyListener::run() {
+  using enum DatagramReader::Patience;
+  bool isComing = false;
   while (!isOver()) {
-    wait();
-    if (!book_.isFull()) readSockets();
+    // While datagrams come one upon the other, reading is the waiting, which spares a call for
+    // each. Now and then the rest is looked at.
+    if (isComing && sockets_.size() == 1 && !book_.isFull() && time_ < nextWait_) {
+      isComing = readSockets(kAMoment) != 0;
+    } else {
+      wait();
+      isComing = !book_.isFull() && readSockets(kNone) != 0;
+    }
     flushIfDue();
     tellIfDue();
   }
@@ -197,21 +207,24 @@ void TallyListener::wait() {
     throw Failure("cannot wait for datagrams: " + ErrnoText(errno));
   }
   time_ = Steady::now();
+  nextWait_ = time_ + kWaitInterval;
   hasEnded_ |= waited[0].revents != 0;
   if (waited[1].revents != 0) writer_->clearDoneEvent();
 }
 
-std::size_t TallyListener::readSockets() {
+std::size_t TallyListener::readSockets(DatagramReader::Patience patience) {
   checkStore();
   std::size_t count = 0;
   for (const ListeningSocket& socket : sockets_) {
     bool isFirst = true;
-    count += reader_.read(socket.get(), [&](std::string_view text, Sender sender, bool isCut) {
+    const auto handler = [&](std::string_view text, Sender sender, bool isCut) {
       if (isFirst) enterNow();
       isFirst = false;
       take(text, sender, isCut);
-    });
+    };
+    count += reader_.read(socket.get(), patience, handler);
   }
+  time_ = Steady::now();
   if (count != 0) lastDatagram_ = time_;
   return count;
 }
@@ -249,7 +262,8 @@ void TallyListener::tellIfDue() {
 }
 
 bool TallyListener::finish() {
-  for (std::size_t i = 0; i < kMostLastReads && !book_.isFull() && readSockets() != 0; ++i) {
+  using enum DatagramReader::Patience;
+  for (std::size_t i = 0; i < kMostLastReads && !book_.isFull() && readSockets(kNone) != 0; ++i) {
   }
   // What senders find from now on is no listener, rather than one that does not read.
   sockets_.clear();
