@@ -21,11 +21,11 @@ class SampleStore {
     static SampleStore store;
     return store;
   }
-  TallyLedger& ledger() { return platform_.ledger(); }
+  CounterStore& store() { return platform_.services().counterStore; }
 
  private:
   SampleStore() : directory_(makeDirectory()), platform_(Root(directory_), Access::kReadWrite) {
-    if (!FillLedger(platform_.ledger(), kDay)) std::abort();
+    if (!FillStore(store(), kDay)) std::abort();
   }
   ~SampleStore() {
     std::error_code ignored;
@@ -55,7 +55,7 @@ struct Welford {
 };
 
 void ReadScalars(benchmark::State& state) {
-  const auto history = SampleStore::instance().ledger().openHistory();
+  const auto history = SampleStore::instance().store().initWithDefaultPath();
   for (auto _ : state) {
     std::int64_t rows = 0;
     history->scalarsForKeyPrefixMinDaysSince1970MaxDaysSince1970RowHandler(
@@ -67,7 +67,7 @@ void ReadScalars(benchmark::State& state) {
 BENCHMARK(ReadScalars)->Unit(benchmark::kMillisecond);
 
 void ReadDistributions(benchmark::State& state) {
-  const auto history = SampleStore::instance().ledger().openHistory();
+  const auto history = SampleStore::instance().store().initWithDefaultPath();
   for (auto _ : state) {
     std::int64_t values = 0;
     history->distributionsForKeyPrefixMinDaysSince1970MaxDaysSince1970RowHandler(
@@ -87,11 +87,11 @@ BENCHMARK(ReadDistributions)->Unit(benchmark::kMillisecond);
 
 // The same steps on one distribution's values in memory: what no store can go below.
 void MemoryOnly(benchmark::State& state) {
-  const std::vector<DistributionSample> samples = SampleValues(0);
+  const std::vector<double> values = SampleValues(0, kDay).values;
   for (auto _ : state) {
     for (int i = 0; i < kDistributions; ++i) {
       Welford welford;
-      for (const DistributionSample& sample : samples) welford.add(sample.value);
+      for (const double value : values) welford.add(value);
       benchmark::DoNotOptimize(welford);
     }
   }
@@ -99,31 +99,26 @@ void MemoryOnly(benchmark::State& state) {
 }
 BENCHMARK(MemoryOnly)->Unit(benchmark::kMillisecond);
 
-// So many values in one committed transaction.
+// So many values in one committed transaction: of one key, or one each of many keys.
 void Record(benchmark::State& state) {
-  TallyLedger& ledger = SampleStore::instance().ledger();
-  std::vector<DistributionSample> samples = SampleValues(0);
-  samples.resize(static_cast<std::size_t>(state.range(0)));
-  for (auto _ : state) {
-    if (!ledger.recordValues("recorded", kDay + 1, samples)) state.SkipWithError("refused");
+  CounterStore& store = SampleStore::instance().store();
+  StoreChanges changes;
+  for (std::int64_t key = 0; key < state.range(1); ++key) {
+    RecordedValues& recorded = changes.values.emplace_back(SampleValues(0, kDay + 1));
+    recorded.key = "recorded" + std::to_string(key);
+    recorded.values.resize(static_cast<std::size_t>(state.range(0)));
+    recorded.runs = {{0, static_cast<std::uint32_t>(state.range(0))}};
   }
-  state.SetItemsProcessed(state.iterations() * state.range(0));
+  for (auto _ : state) {
+    if (!store.write(changes)) state.SkipWithError("refused");
+  }
+  state.SetItemsProcessed(state.iterations() * state.range(0) * state.range(1));
 }
-BENCHMARK(Record)->Arg(1)->Arg(kValuesPerDistribution)->Unit(benchmark::kMicrosecond);
-
-// One value at a time, many to a transaction.
-void RecordJoined(benchmark::State& state) {
-  TallyLedger& ledger = SampleStore::instance().ledger();
-  const DistributionSample sample{1.5, 2};
-  const bool kept = ledger.inTransaction([&] {
-    for (auto _ : state) {
-      if (!ledger.recordValues("joined", kDay + 1, {&sample, 1})) return false;
-    }
-    return true;
-  });
-  if (!kept) state.SkipWithError("refused");
-}
-BENCHMARK(RecordJoined)->Unit(benchmark::kMicrosecond);
+BENCHMARK(Record)
+    ->Args({1, 1})
+    ->Args({kValuesPerDistribution, 1})
+    ->Args({1, 1000})
+    ->Unit(benchmark::kMicrosecond);
 
 }  // namespace
 }  // namespace quorlet::bench

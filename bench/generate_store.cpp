@@ -56,11 +56,12 @@ bool WritePlainTable(const char* path, std::int32_t day) {
                                  &insert, nullptr) == SQLITE_OK;
   for (int i = 0; good && i < kDistributions; ++i) {
     const std::string key = DistributionKey(i);
-    for (const DistributionSample& sample : SampleValues(i)) {
+    int second = 0;
+    for (const double value : SampleValues(i, day).values) {
       sqlite3_bind_text(insert, 1, key.c_str(), -1, SQLITE_STATIC);
       sqlite3_bind_int(insert, 2, day);
-      sqlite3_bind_int(insert, 3, sample.secondsInDay);
-      sqlite3_bind_double(insert, 4, sample.value);
+      sqlite3_bind_int(insert, 3, second++ * 86400 / kValuesPerDistribution);
+      sqlite3_bind_double(insert, 4, value);
       good = good && sqlite3_step(insert) == SQLITE_DONE;
       sqlite3_reset(insert);
     }
@@ -76,7 +77,7 @@ int Run(const char* directory, const char* plainDatabase) {
   const Root& root = platform.root();
   const std::int32_t yesterday = platform.services().counterStore.TLDaysSince1970() - 1;
   const bool good =
-      FillLedger(platform.ledger(), yesterday) &&
+      FillStore(platform.services().counterStore, yesterday) &&
       WritePlist(root.path("/Library/Application Support/TallyLedger/Whitelist_Zed.plist"),
                  Whitelist(false)) &&
       WritePlist(root.path("/every_key.plist"), Whitelist(true)) &&

@@ -17,27 +17,26 @@ std::string DistributionKey(int number) {
   return SubsystemPrefix(number) + "time" + std::to_string(number);
 }
 
-std::vector<DistributionSample> SampleValues(int distribution) {
+RecordedValues SampleValues(int distribution, std::int32_t day) {
   std::mt19937 random(static_cast<unsigned>(distribution));
   std::lognormal_distribution<double> duration(3, 1.5);
-  std::vector<DistributionSample> samples;
-  samples.reserve(kValuesPerDistribution);
+  RecordedValues recorded;
+  recorded.key = DistributionKey(distribution);
+  recorded.day = day;
   for (int i = 0; i < kValuesPerDistribution; ++i) {
-    samples.push_back({duration(random), i * 86400 / kValuesPerDistribution});
+    recorded.add(duration(random), i * 86400 / kValuesPerDistribution);
   }
-  return samples;
+  return recorded;
 }
 
-bool FillLedger(TallyLedger& ledger, std::int32_t day) {
-  return ledger.inTransaction([&] {
-    for (int i = 0; i < kScalars; ++i) {
-      if (!ledger.setScalar(ScalarKey(i), day, std::int64_t{i} * 7919)) return false;
-    }
-    for (int i = 0; i < kDistributions; ++i) {
-      if (!ledger.recordValues(DistributionKey(i), day, SampleValues(i))) return false;
-    }
-    return true;
-  });
+bool FillStore(CounterStore& store, std::int32_t day) {
+  StoreChanges changes;
+  for (int i = 0; i < kScalars; ++i) {
+    changes.scalars.push_back(
+        {ScalarChange::Kind::kSet, ScalarKey(i), std::int64_t{i} * 7919, day});
+  }
+  for (int i = 0; i < kDistributions; ++i) changes.values.push_back(SampleValues(i, day));
+  return store.write(changes);
 }
 
 }  // namespace quorlet::bench

@@ -6,7 +6,7 @@
 #include <string>
 #include <vector>
 
-#include "platform/linux/counters/tally_ledger.h"
+#include "platform/counter_store.h"
 
 namespace quorlet::bench {
 
@@ -21,10 +21,10 @@ std::string ScalarKey(int number);
 std::string DistributionKey(int number);
 
 // The values of a distribution: durations in ms, the same ones in every run.
-std::vector<DistributionSample> SampleValues(int distribution);
+RecordedValues SampleValues(int distribution, std::int32_t day);
 
-// Records all of it for `day`. False when the ledger refused.
-[[nodiscard]] bool FillLedger(TallyLedger& ledger, std::int32_t day);
+// Records all of it for `day`. False when the store refused.
+[[nodiscard]] bool FillStore(CounterStore& store, std::int32_t day);
 
 }  // namespace quorlet::bench
 

@@ -4,8 +4,8 @@
 #include <set>
 
 #include "ctl/record_book.h"
-#include "fakes/fake_platform.h"
-#include "fakes/temp_root.h"
+#include "fakes/fake_clock.h"
+#include "fakes/fake_counter_store.h"
 #include "fuzz_support.h"
 
 namespace quorlet {
@@ -40,7 +40,7 @@ void CheckAgain(std::string_view text, const StatsdLine& line) {
          "further fields change a line", longer);
 }
 
-void CheckBatch(const RecordBatch& batch) {
+void CheckBatch(const StoreChanges& batch) {
   std::set<std::string> keys;
   for (const ScalarChange& change : batch.scalars) {
     keys.insert(change.key);
@@ -60,12 +60,10 @@ void CheckBatch(const RecordBatch& batch) {
 
 extern "C" int LLVMFuzzerTestOneInput(const std::uint8_t* data, std::size_t size) {
   using namespace quorlet;
-  static const TempRoot device;
-  static FakePlatform platform;
-  static const auto ledger = MakeTallyLedger(device.root(), Access::kReadWrite, platform.queries,
-                                             platform.preferences, platform.log);
+  static FakeClock clock;
+  static FakeCounterStore store(clock);
   RecordBook book(RecordWhitelist::Naming(true), 900, kLimits);
-  Expect(book.enterDay(kDay, *ledger), "no day");
+  Expect(book.enterDay(kDay, store), "no day");
   RecordRefusals refusals;
   StatsdLine line;
   std::string_view rest = AsText(data, size);

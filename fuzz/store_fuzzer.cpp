@@ -19,10 +19,18 @@ using Files = std::map<std::string, std::string>;  // by name
 // Every process starts anew on the same directory.
 struct Process {
   explicit Process(const TempRoot& device, Access access)
-      : ledger(MakeTallyLedger(device.root(), access, platform.queries, platform.preferences,
-                               platform.log)),
-        store(MakeLinuxCounterStore(*ledger, platform.clock, platform.log)) {
+      : store(MakeLinuxCounterStore(device.root(), access, platform.clock, platform.queries,
+                                    platform.preferences, platform.log)) {
     platform.clock.goToDay(kDay);
+  }
+  // So many equal values.
+  bool record(std::int32_t day, std::uint32_t count, double value) {
+    StoreChanges changes;
+    changes.values.push_back({"d", day, std::vector<double>(count, value), {{60, count}}});
+    for (const char* key : {"a.b", "a.c", "z"}) {
+      changes.scalars.push_back({ScalarChange::Kind::kAdd, key, day, day});
+    }
+    return store->write(changes);
   }
   std::int64_t corruptions() {
     return platform.preferences.DGWPreferencesGetIntegerValue("DatabaseCorruptionCount",
@@ -30,7 +38,6 @@ struct Process {
   }
 
   FakePlatform platform;
-  std::unique_ptr<TallyLedger> ledger;
   std::unique_ptr<CounterStore> store;
 };
 
@@ -59,11 +66,7 @@ void Replace(const TempRoot& device, const std::string& directory, const Files& 
 Files MakeSound(const TempRoot& device, const std::string& directory) {
   Process process(device, Access::kReadWrite);
   for (const std::int32_t day : {kDay - 40, kDay - 1, kDay}) {
-    for (const char* key : {"a.b", "a.c", "z"}) {
-      Expect(process.ledger->setScalar(key, day, day), "the store cannot be made");
-    }
-    const std::vector<DistributionSample> samples(day == kDay ? 500 : 20, {1.5, 60});
-    Expect(process.ledger->recordValues("d", day, samples), "the store cannot be made");
+    Expect(process.record(day, day == kDay ? 500 : 20, 1.5), "the store cannot be made");
   }
   Files files = ReadFiles(device, directory);
   std::erase_if(files, [](const auto& file) { return file.second.empty(); });
@@ -139,12 +142,8 @@ void ReadOnly(const TempRoot& device, const std::string& directory) {
 void ReadAndWrite(const TempRoot& device, const std::string& directory) {
   Process process(device, Access::kReadWrite);
   ReadAll(*process.store, kDay - 2, kDay);
-  StoreChanges changes;
-  changes.scalars.push_back({ScalarChange::Kind::kAdd, "a.b", 1, kDay});
-  const bool written = process.store->write(changes);
+  const bool written = process.record(kDay, 100, 2.5);
   Expect(written || !process.platform.log.errors().empty(), "a failure is not told");
-  const std::vector<DistributionSample> samples(100, {2.5, 7});
-  static_cast<void>(process.ledger->recordValues("d", kDay, samples));
   process.store->TLClientCheckpoint();
   ReadAll(*process.store, std::numeric_limits<std::int32_t>::min(), kDay);
 

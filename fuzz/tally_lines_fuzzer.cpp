@@ -12,6 +12,7 @@
 #include "ctl/tally_lines.h"
 #include "fakes/fake_platform.h"
 #include "fuzz_support.h"
+#include "platform/linux/counters/counter_store.h"
 
 namespace quorlet {
 namespace {
@@ -78,9 +79,9 @@ Model ModelOf(std::string_view text) {
 }
 
 // The whole store.
-void Compare(TallyLedger& ledger, const Model& model) {
+void Compare(CounterStore& store, const Model& model) {
   Model stored;
-  if (const auto history = ledger.openHistory()) {
+  if (const auto history = store.initWithDefaultPath()) {
     const std::int32_t first = std::numeric_limits<std::int32_t>::min();
     history->scalarsForKeyPrefixMinDaysSince1970MaxDaysSince1970RowHandler(
         "", first, kLastDay,
@@ -104,8 +105,9 @@ void Compare(TallyLedger& ledger, const Model& model) {
 void Import(std::string_view text, const Model& model) {
   static const TempRoot device;
   static FakePlatform platform;
-  static const auto ledger = MakeTallyLedger(device.root(), Access::kReadWrite, platform.queries,
-                                             platform.preferences, platform.log);
+  static const auto store =
+      MakeLinuxCounterStore(device.root(), Access::kReadWrite, platform.clock, platform.queries,
+                            platform.preferences, platform.log);
   const int file = memfd_create("lines", MFD_CLOEXEC);
   Expect(file >= 0 && ::write(file, text.data(), text.size()) == static_cast<ssize_t>(text.size()),
          "no memory file");
@@ -114,7 +116,7 @@ void Import(std::string_view text, const Model& model) {
   std::optional<std::string> failure;
   ImportCounts counts;
   try {
-    counts = ImportTallies(name, *ledger, messages);
+    counts = ImportTallies(name, *store, messages);
   } catch (const Failure& wrong) {
     failure = wrong.what();
   }
@@ -127,8 +129,10 @@ void Import(std::string_view text, const Model& model) {
   } else {
     Expect(counts.scalars + counts.values == model.lines, "lines are not counted");
   }
-  Compare(*ledger, model.isWrong ? Model() : model);
-  Expect(ledger->dropCounters(), "the store cannot be emptied");
+  Compare(*store, model.isWrong ? Model() : model);
+  StoreChanges drop;
+  drop.dropCounters = true;
+  Expect(store->write(drop), "the store cannot be emptied");
 }
 
 }  // namespace

@@ -124,16 +124,17 @@ constexpr std::array<DemoDistribution, 3> kDistributions = {
 constexpr std::int32_t kSampleSpacing = 300;  // seconds
 
 // Values that look measured, and are the same on every machine.
-std::vector<DistributionSample> DemoSamples(const DemoDistribution& distribution) {
-  std::vector<DistributionSample> samples;
+RecordedValues DemoValues(const DemoDistribution& distribution, std::int32_t day) {
+  RecordedValues recorded;
+  recorded.key = distribution.key;
+  recorded.day = day;
   std::uint32_t state = 1;
   for (std::int32_t second = 0; second < 86400; second += kSampleSpacing) {
     state = state * 1'664'525 + 1'013'904'223;
     const auto range = static_cast<std::uint32_t>(distribution.high - distribution.low);
-    const double value = distribution.low + static_cast<double>((state >> 8) % (range * 4)) / 4;
-    samples.push_back({value, second});
+    recorded.add(distribution.low + static_cast<double>((state >> 8) % (range * 4)) / 4, second);
   }
-  return samples;
+  return recorded;
 }
 
 }  // namespace
@@ -160,14 +161,13 @@ std::vector<DemoFile> MakeDemoFiles(Date startOfToday) {
   };
 }
 
-bool AddDemoCounters(TallyLedger& ledger, std::int32_t day) {
-  return std::ranges::all_of(kScalars,
-                             [&](const DemoScalar& scalar) {
-                               return ledger.setScalar(scalar.key, day, scalar.value);
-                             }) &&
-         std::ranges::all_of(kDistributions, [&](const DemoDistribution& distribution) {
-           return ledger.recordValues(distribution.key, day, DemoSamples(distribution));
-         });
+void AddDemoCounters(std::int32_t day, StoreChanges& changes) {
+  for (const DemoScalar& scalar : kScalars) {
+    changes.scalars.push_back({ScalarChange::Kind::kSet, scalar.key, scalar.value, day});
+  }
+  for (const DemoDistribution& distribution : kDistributions) {
+    changes.values.push_back(DemoValues(distribution, day));
+  }
 }
 
 }  // namespace quorlet

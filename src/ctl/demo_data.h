@@ -7,7 +7,7 @@
 #include <vector>
 
 #include "drvreport/property_value.h"
-#include "platform/linux/counters/tally_ledger.h"
+#include "platform/counter_store.h"
 
 namespace quorlet {
 
@@ -20,8 +20,8 @@ struct DemoFile {
 // a task snapshot, an OS release, a machine id and two applications.
 std::vector<DemoFile> MakeDemoFiles(Date startOfToday);
 
-// Counters of the day: scalars and distributions. False after an error line.
-[[nodiscard]] bool AddDemoCounters(TallyLedger& ledger, std::int32_t day);
+// Adds the counters of the day: scalars and distributions.
+void AddDemoCounters(std::int32_t day, StoreChanges& changes);
 
 }  // namespace quorlet
 

@@ -63,11 +63,14 @@ void MakeCounters(Session& session, LinuxPlatform& platform) {
   const std::string path = platform.root().path(*home + kCounterStorePath);
   const bool existed = Exists(path);
   if (!existed) {
-    const std::int32_t today = platform.services().counterStore.TLDaysSince1970();
-    TallyLedger& ledger = platform.ledger();
-    const bool kept = ledger.inTransaction(
-        [&] { return AddDemoCounters(ledger, today - 1) && AddDemoCounters(ledger, today); });
-    if (!kept) throw Failure(session.messages.lastErrorOr("the counters could not be stored"));
+    CounterStore& store = platform.services().counterStore;
+    const std::int32_t today = store.TLDaysSince1970();
+    StoreChanges changes;
+    AddDemoCounters(today - 1, changes);
+    AddDemoCounters(today, changes);
+    if (!store.write(changes)) {
+      throw Failure(session.messages.lastErrorOr("the counters could not be stored"));
+    }
   }
   Say(session, existed, path);
 }

@@ -57,14 +57,14 @@ WideInteger RecordBook::Sum::rounded() const {
   return nearest += fraction >= 0.5 ? 1 : fraction <= -0.5 ? -1 : 0;
 }
 
-bool RecordBook::enterDay(std::int32_t day, TallyLedger& ledger) {
+bool RecordBook::enterDay(std::int32_t day, CounterStore& store) {
   if (day_ == day) return true;
   if (day_) closeDay();
   day_ = day;
   forgetOldKeys();
   keysOfDay_ = 0;
   const bool isRead =
-      ledger.keysOfDay(day, [this](std::string_view key, std::optional<std::uint64_t> values) {
+      store.keysOfDay(day, [this](std::string_view key, std::optional<std::uint64_t> values) {
         const bool isExact = whitelist_.match(key) == RecordWhitelist::Match::kNamedExactly;
         if (!isExact) ++keysOfDay_;
         const bool isKept = isExact || entries_.size() < kMostRemembered;
@@ -78,7 +78,7 @@ bool RecordBook::enterDay(std::int32_t day, TallyLedger& ledger) {
         }
         return true;
       });
-  readOwners(ledger);
+  readOwners(store);
   return isRead;
 }
 
@@ -137,9 +137,7 @@ std::optional<Refusal> RecordBook::add(const StatsdLine& line, Sender sender, st
   if (!entry.isListed) changed_.push_back(&*found);
   entry.isListed = true;
   if (line.kind == StatsdKind::kValues) {
-    for (const StatsdNumber& number : line.numbers) entry.values.push_back(number.real);
-    if (entry.runs.empty() || entry.runs.back().second != second) entry.runs.push_back({second, 0});
-    entry.runs.back().count += line.numbers.size();
+    for (const StatsdNumber& number : line.numbers) entry.values.add(number.real, second);
     entry.valuesOfDay += line.numbers.size();
     waitingValues_ += line.numbers.size();
     return std::nullopt;
@@ -168,46 +166,42 @@ void RecordBook::closeDay() {
       closed_.scalars.push_back({kind, key, growth.saturated(), *day_});
       entry.written = rounded;
     }
-    if (!entry.values.empty()) {
-      closed_.values.push_back({key, *day_, std::exchange(entry.values, {}), {}});
-      closed_.values.back().runs = std::exchange(entry.runs, {});
+    if (!entry.values.runs.empty()) {
+      RecordedValues& recorded = closed_.values.emplace_back(std::exchange(entry.values, {}));
+      recorded.key = key;
+      recorded.day = *day_;
     }
     entry.isSet = entry.hasScalar = entry.isListed = false;
   }
   changed_.clear();
-  if (ownersChanged_) closed_.keyOwners = ownersNote();
+  if (ownersChanged_) closed_.notes = {ownersNote()};
   ownersChanged_ = false;
 }
 
-RecordBatch RecordBook::take() {
+StoreChanges RecordBook::take() {
   closeDay();
   waitingValues_ = 0;
   return std::exchange(closed_, {});
 }
 
-// "DAY", then "UID COUNT" in each line; "-" is the user that the kernel does not tell.
-std::string RecordBook::ownersNote() const {
-  std::string note = std::to_string(*day_);
+// "-" is the user that the kernel does not tell.
+StoreNote RecordBook::ownersNote() const {
+  Dictionary owners;
   for (const auto& [owner, count] : owners_) {
-    note += "\n" + (owner ? std::to_string(*owner) : "-") + " " + std::to_string(count);
+    owners[owner ? std::to_string(*owner) : "-"] = Int64(static_cast<std::int64_t>(count));
   }
-  return note;
+  return {kKeyOwnersNote, Dictionary{{"day", Int32(*day_)}, {"owners", owners}}};
 }
 
-void RecordBook::readOwners(TallyLedger& ledger) {
+void RecordBook::readOwners(CounterStore& store) {
   owners_.clear();
-  std::optional<std::string> note;
-  if (!ledger.readNote(kKeyOwnersNote, note) || !note) return;
-  std::string_view rest = *note;
-  for (bool isFirst = true; const auto line = NextStatsdLine(rest); isFirst = false) {
-    if (isFirst) {
-      if (ParseNumber<std::int32_t>(*line) != day_) return;
-      continue;
-    }
-    const std::size_t blank = std::min(line->find(' '), line->size());
-    const auto count = ParseNumber<std::size_t>(line->substr(std::min(blank + 1, line->size())));
-    const auto owner = ParseNumber<uid_t>(line->substr(0, blank));
-    if (count && owners_.size() < limits_.keys) owners_[owner] = *count;
+  std::optional<Dictionary> note;
+  if (!store.readNote(kKeyOwnersNote, note) || !note || IntegerEntry(*note, "day") != day_) return;
+  const Dictionary* owners = DictionaryEntry(*note, "owners");
+  if (owners == nullptr || owners->size() > limits_.keys) return;
+  for (const auto& [owner, count] : *owners) {
+    const auto known = IntegerEntry(*owners, owner).value_or(0);
+    owners_[ParseNumber<uid_t>(owner)] = static_cast<std::size_t>(std::max<std::int64_t>(known, 0));
   }
 }
 

@@ -19,7 +19,6 @@
 #include "ctl/statsd_line.h"
 #include "ctl/wide_integer.h"
 #include "platform/counter_store.h"
-#include "platform/linux/counters/tally_ledger.h"
 
 namespace quorlet {
 
@@ -37,26 +36,7 @@ struct RecordTime {
   std::int32_t second = 0;  // of the day
 };
 
-// Values of one key and day in their order. Most have the second of the one before.
-struct RecordedValues {
-  struct Run {
-    std::int32_t second;
-    std::size_t count;
-  };
-  std::string key;
-  std::int32_t day = 0;
-  std::vector<double> values;
-  std::vector<Run> runs;
-};
-
-// What is written in one transaction.
-struct RecordBatch {
-  std::vector<ScalarChange> scalars;
-  std::vector<RecordedValues> values;
-  std::optional<std::string> keyOwners;  // a note of the store: what a later listener has to know
-
-  bool empty() const { return scalars.empty() && values.empty(); }
-};
+// A note of the store: what a later listener has to know. {"day", "owners": {uid: keys}}
 inline constexpr char kKeyOwnersNote[] = "RecordedKeyOwners";
 
 // Sums up lines for the next transaction and keeps within the limits. For one thread.
@@ -68,7 +48,7 @@ class RecordBook {
 
   // The day of the lines that follow. Where it is another than before, what the store holds for it
   // is read: false, after an error line, when that failed; then it counts as empty.
-  bool enterDay(std::int32_t day, TallyLedger& ledger);
+  bool enterDay(std::int32_t day, CounterStore& store);
   // Takes in a line of the entered day, or says why not.
   [[nodiscard]] std::optional<Refusal> add(const StatsdLine& line, Sender sender,
                                            std::int32_t second);
@@ -77,7 +57,7 @@ class RecordBook {
   // Whether nothing more should be taken in before the next take().
   bool isFull() const { return waitingValues_ >= limits_.waitingValues; }
   // What is to be written; the book is empty afterwards, but for the fractions.
-  RecordBatch take();
+  StoreChanges take();
 
  private:
   // A sum, exact in its whole part; both parts have one sign or are 0.
@@ -97,8 +77,7 @@ class RecordBook {
     bool isNamedExactly = false;
     bool wasUsed = false;  // on this day
     std::uint64_t valuesOfDay = 0;
-    std::vector<double> values;
-    std::vector<RecordedValues::Run> runs;
+    RecordedValues values;  // without their key and day
   };
   struct Hash {
     using is_transparent = void;
@@ -111,8 +90,8 @@ class RecordBook {
   std::optional<Refusal> admit(std::string_view key, Sender sender, Entries::iterator& found);
   void closeDay();
   void forgetOldKeys();
-  void readOwners(TallyLedger& ledger);
-  std::string ownersNote() const;
+  void readOwners(CounterStore& store);
+  StoreNote ownersNote() const;
 
   const RecordLimits limits_;
   const uid_t self_;
@@ -120,7 +99,7 @@ class RecordBook {
   std::optional<std::int32_t> day_;
   Entries entries_;
   std::vector<Entries::value_type*> changed_;
-  RecordBatch closed_;  // of days that are over
+  StoreChanges closed_;  // of days that are over
   std::size_t waitingValues_ = 0;
   std::size_t keysOfDay_ = 0;
   std::map<Sender, std::size_t> owners_;  // how many of them each user made

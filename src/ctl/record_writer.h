@@ -7,9 +7,8 @@
 #include <optional>
 #include <thread>
 
-#include "ctl/record_book.h"
+#include "platform/counter_store.h"
 #include "platform/linux/base/descriptor.h"
-#include "platform/linux/counters/tally_ledger.h"
 
 namespace quorlet {
 
@@ -17,8 +16,8 @@ namespace quorlet {
 // until it is written or the end has come.
 class RecordWriter {
  public:
-  // An operation of the ledger, which outlives the writer, must have returned on this thread.
-  explicit RecordWriter(TallyLedger& ledger);
+  // An operation of the store, which outlives the writer, must have returned on this thread.
+  explicit RecordWriter(CounterStore& store);
   RecordWriter(const RecordWriter&) = delete;
   RecordWriter& operator=(const RecordWriter&) = delete;
   ~RecordWriter();
@@ -26,7 +25,7 @@ class RecordWriter {
   // Whether a batch is being written.
   bool isBusy();
   // Takes over a batch; only while it is not busy.
-  void write(RecordBatch batch);
+  void write(StoreChanges batch);
   // Becomes readable when a batch was written.
   int doneEvent() const { return done_.get(); }
   void clearDoneEvent();
@@ -36,18 +35,15 @@ class RecordWriter {
  private:
   void run();
 
-  TallyLedger& ledger_;
+  CounterStore& store_;
   Descriptor done_;
   std::mutex mutex_;
   std::condition_variable changed_;
-  std::optional<RecordBatch> batch_;
+  std::optional<StoreChanges> batch_;
   bool isEnding_ = false;
   bool isLost_ = false;
   std::thread thread_;  // last: it uses the others
 };
-
-// All of the batch in one transaction.
-[[nodiscard]] bool WriteRecordBatch(const RecordBatch& batch, TallyLedger& ledger);
 
 }  // namespace quorlet
 

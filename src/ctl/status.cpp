@@ -125,7 +125,7 @@ Finding Inspection::store() {
   if (::stat(file.c_str(), &status) != 0 && errno == ENOENT) {
     return Ok("none yet: the first counter makes " + file);
   }
-  if (!platform_.ledger().isSound()) {
+  if (!services().counterStore.isSound()) {
     return Error(whyOr("it is damaged"), "quorlet -d");
   }
   const auto days = services().counterStore.daysWithCounters(kFirstDay, kLastDay);

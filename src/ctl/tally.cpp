@@ -46,31 +46,39 @@ std::int32_t SecondOfToday(LinuxPlatform& platform) {
   return static_cast<std::int32_t>(now - std::floor(now / 86400) * 86400);
 }
 
+// All or, after a Failure, nothing.
+void Write(Session& session, CounterStore& store, const std::string& key,
+           const StoreChanges& changes) {
+  if (!store.takesKey(key) || !store.write(changes)) {
+    throw Failure(session.messages.lastErrorOr(kStoreSilent));
+  }
+}
+
 void ChangeScalar(Session& session, const TallyArguments& arguments, bool add) {
   const auto platform = session.open(Access::kReadWrite);
-  const std::int32_t day = DayOrToday(arguments, *platform);
-  TallyLedger& ledger = platform->ledger();
-  const bool kept = add ? ledger.addToScalar(arguments.key, day, arguments.scalar)
-                        : ledger.setScalar(arguments.key, day, arguments.scalar);
-  if (!kept) throw Failure(session.messages.lastErrorOr(kStoreSilent));
+  const auto kind = add ? ScalarChange::Kind::kAdd : ScalarChange::Kind::kSet;
+  StoreChanges changes;
+  changes.scalars = {{kind, arguments.key, arguments.scalar, DayOrToday(arguments, *platform)}};
+  Write(session, platform->services().counterStore, arguments.key, changes);
   NoteUnlisted(session, arguments.key, KeyKind::kScalar);
 }
 
 void Record(Session& session, const TallyArguments& arguments) {
   const auto platform = session.open(Access::kReadWrite);
-  const std::int32_t day = DayOrToday(arguments, *platform);
   const std::int32_t second = arguments.second ? *arguments.second : SecondOfToday(*platform);
-  std::vector<DistributionSample> samples;
-  for (const double number : arguments.numbers) samples.push_back({number, second});
-  if (!platform->ledger().recordValues(arguments.key, day, samples)) {
-    throw Failure(session.messages.lastErrorOr(kStoreSilent));
-  }
+  StoreChanges changes;
+  RecordedValues& recorded = changes.values.emplace_back();
+  recorded.key = arguments.key;
+  recorded.day = DayOrToday(arguments, *platform);
+  for (const double number : arguments.numbers) recorded.add(number, second);
+  Write(session, platform->services().counterStore, arguments.key, changes);
   NoteUnlisted(session, arguments.key, KeyKind::kDistribution);
 }
 
 void Import(Session& session, const TallyArguments& arguments) {
   const auto platform = session.open(Access::kReadWrite);
-  const ImportCounts counts = ImportTallies(arguments.file, platform->ledger(), session.messages);
+  const ImportCounts counts =
+      ImportTallies(arguments.file, platform->services().counterStore, session.messages);
   session.out.line("imported " + Counted(counts.scalars, "scalar") + " and " +
                    Counted(counts.values, "value"));
 }
@@ -238,7 +246,7 @@ void DumpTallies(Session& session, const TallyArguments& arguments) {
   {
     const auto platform = session.open(Access::kReadOnly);
     const bool exists = StoreExists(*platform, session.messages);
-    const auto history = exists ? platform->ledger().openHistory() : nullptr;
+    const auto history = exists ? platform->services().counterStore.initWithDefaultPath() : nullptr;
     if (exists && history == nullptr) {
       throw Failure(session.messages.lastErrorOr("the counter store cannot be read"));
     }

@@ -4,6 +4,7 @@
 #include <sys/stat.h>
 #include <unistd.h>
 
+#include <algorithm>
 #include <array>
 #include <cerrno>
 #include <cstdio>
@@ -12,10 +13,12 @@
 #include <memory>
 #include <optional>
 #include <string_view>
+#include <tuple>
 #include <utility>
 #include <vector>
 
 #include "ctl/tally_lines.h"
+#include "platform/linux/base/files.h"
 
 namespace quorlet {
 namespace {
@@ -114,22 +117,29 @@ class ImportedRows {
   void add(SampleLine line) {
     const auto [row, isNew] = values_.try_emplace({line.day, std::move(line.key)});
     if (isNew) countRow(sizeof(*row) + row->first.second.size());
-    row->second.push_back(line.sample);
-    bytes_ += sizeof(line.sample);
+    row->second.add(line.sample.value, line.sample.secondsInDay);
+    bytes_ += sizeof(double) + sizeof(RecordedValues::Run);
     ++counts.values;
   }
 
   bool areTooMany() const { return bytes_ > kMaxImportBytes; }
 
-  // False when the store refused a write, which it then has said itself.
-  [[nodiscard]] bool writeTo(TallyLedger& ledger) const {
-    for (const auto& [dayAndKey, value] : scalars_) {
-      if (!ledger.setScalar(dayAndKey.second, dayAndKey.first, value)) return false;
+  // Row by row, so that nothing is in memory twice.
+  StoreChanges take() {
+    StoreChanges changes;
+    changes.scalars.reserve(scalars_.size());
+    changes.values.reserve(values_.size());
+    while (!scalars_.empty()) {
+      auto row = scalars_.extract(scalars_.begin());
+      auto& [day, key] = row.key();
+      changes.scalars.push_back({ScalarChange::Kind::kSet, std::move(key), row.mapped(), day});
     }
-    for (const auto& [dayAndKey, samples] : values_) {
-      if (!ledger.recordValues(dayAndKey.second, dayAndKey.first, samples)) return false;
+    while (!values_.empty()) {
+      auto row = values_.extract(values_.begin());
+      RecordedValues& recorded = changes.values.emplace_back(std::move(row.mapped()));
+      std::tie(recorded.day, recorded.key) = std::move(row.key());
     }
-    return true;
+    return changes;
   }
 
  private:
@@ -141,7 +151,7 @@ class ImportedRows {
   }
 
   std::map<DayAndKey, std::int64_t> scalars_;
-  std::map<DayAndKey, std::vector<DistributionSample>> values_;
+  std::map<DayAndKey, RecordedValues> values_;  // without their day and key
   std::size_t bytes_ = 0;
 };
 
@@ -162,14 +172,17 @@ void ReadRows(LineReader& lines, ImportedRows& rows) {
 
 }  // namespace
 
-ImportCounts ImportTallies(const std::string& file, TallyLedger& ledger, const Messages& messages) {
+ImportCounts ImportTallies(const std::string& file, CounterStore& store, const Messages& messages) {
   ImportedRows rows;
   {
     const File input = OpenInput(file);
     LineReader lines(input.get(), file == "-" ? "standard input" : file);
     ReadRows(lines, rows);
   }
-  if (!ledger.inTransaction([&] { return rows.writeTo(ledger); })) {
+  const auto isTaken = [&store](const auto& change) { return store.takesKey(change.key); };
+  const StoreChanges changes = rows.take();
+  if (!std::ranges::all_of(changes.scalars, isTaken) ||
+      !std::ranges::all_of(changes.values, isTaken) || !store.write(changes)) {
     throw Failure(messages.lastErrorOr("the counters could not be stored"));
   }
   return rows.counts;

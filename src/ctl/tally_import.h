@@ -6,7 +6,7 @@
 #include <string>
 
 #include "ctl/messages.h"
-#include "platform/linux/counters/tally_ledger.h"
+#include "platform/counter_store.h"
 
 namespace quorlet {
 
@@ -18,7 +18,7 @@ struct ImportCounts {
 // Imports every line of the file (standard input: "-") or, after a Failure that names the line,
 // none. All lines are read before the store is locked; more than fits into bounded memory is
 // refused.
-ImportCounts ImportTallies(const std::string& file, TallyLedger& ledger, const Messages& messages);
+ImportCounts ImportTallies(const std::string& file, CounterStore& store, const Messages& messages);
 
 }  // namespace quorlet
 

@@ -111,7 +111,7 @@ class TallyListener {
         storePath_(StorePath(platform)),
         book_(Whitelist(arguments, platform), geteuid()) {
     enterNow();
-    writer_.emplace(platform.ledger());
+    writer_.emplace(platform.services().counterStore);
   }
 
   void run();
@@ -165,7 +165,7 @@ void TallyListener::enterNow() {
   now_.day = platform_.services().counterStore.TLDaysSince1970();
   now_.second =
       static_cast<std::int32_t>(std::clamp(seconds - now_.day * 86400.0, 0.0, double{kLastSecond}));
-  static_cast<void>(book_.enterDay(now_.day, platform_.ledger()));
+  static_cast<void>(book_.enterDay(now_.day, platform_.services().counterStore));
 }
 
 bool TallyListener::isOver() const {
@@ -270,9 +270,9 @@ bool TallyListener::finish() {
   if (const auto text = refusals_.take()) platform_.services().log.log("%@", *text);
   bool isKept = true;
   if (!book_.empty()) {
-    RecordBatch last = book_.take();
+    StoreChanges last = book_.take();
     isKept = writer_->finish();
-    writer_.emplace(platform_.ledger());
+    writer_.emplace(platform_.services().counterStore);
     writer_->write(std::move(last));
   }
   return writer_->finish() && isKept;

@@ -93,6 +93,27 @@ struct ScalarChange {
   std::int32_t day;  // the day on which the value was measured
 };
 
+// Values that are appended to those of one distribution key and day, in this order.
+struct RecordedValues {
+  // So many of them in a row have this second of the day.
+  struct Run {
+    std::int32_t second;
+    std::uint32_t count;
+  };
+  std::string key;
+  std::int32_t day = 0;
+  std::vector<double> values;
+  std::vector<Run> runs;
+
+  void add(double value, std::int32_t second) {
+    values.push_back(value);
+    if (runs.empty() || runs.back().second != second || runs.back().count == UINT32_MAX) {
+      runs.push_back({second, 0});
+    }
+    ++runs.back().count;
+  }
+};
+
 // What the program itself has to remember in step with the counters. No value: it is forgotten.
 struct StoreNote {
   std::string name;
@@ -103,10 +124,15 @@ struct StoreNote {
 struct StoreChanges {
   bool dropCounters = false;  // every scalar and distribution of every day
   std::vector<ScalarChange> scalars;
+  std::vector<RecordedValues> values;
   std::vector<StoreNote> notes;
 
-  bool empty() const { return !dropCounters && scalars.empty() && notes.empty(); }
+  bool empty() const { return !dropCounters && scalars.empty() && values.empty() && notes.empty(); }
 };
+
+// Given a key of a day, and how many values it has; nothing for a scalar's. False: no more keys.
+using DayKeyHandler =
+    std::function<bool(std::string_view key, std::optional<std::uint64_t> values)>;
 
 class CounterStore {
  public:
@@ -122,13 +148,24 @@ class CounterStore {
   virtual void TLClientCheckpoint() = 0;
 
   // Makes all changes in one short transaction, durable when it returns. A failure leaves one error
-  // line, and none of them is made: false. A change whose key the store cannot take (longer than
-  // 64 KiB, say) is left out, with an error line of its own.
+  // line, and none of them is made: false. A change whose key the store cannot take is left out,
+  // with an error line of its own.
   [[nodiscard]] virtual bool write(const StoreChanges& changes) = 0;
+
+  // Whether the key is short enough for the store (64 KiB); one error line when it is not.
+  [[nodiscard]] virtual bool takesKey(std::string_view key) = 0;
 
   // Reads the note of that name, nothing when there is none. False, after an error line, when that
   // cannot be known.
   [[nodiscard]] virtual bool readNote(std::string_view name, std::optional<Dictionary>& value) = 0;
+
+  // Names the keys of a day until `handler` answers false. False, after an error line, when they
+  // cannot be read.
+  [[nodiscard]] virtual bool keysOfDay(std::int32_t day, const DayKeyHandler& handler) = 0;
+
+  // Looks for damage, in every value too, and changes nothing. False, after an error line, when
+  // there is some or when it cannot be known; true where there is no store.
+  [[nodiscard]] virtual bool isSound() = 0;
 
   // Sets, or adds to (saturating), today's value of one key.
   void TLClientSetValueForScalarKey(std::string_view key, std::int64_t value) {

@@ -11,18 +11,6 @@ namespace {
 
 constexpr std::int64_t kDeep = 0x44454550, kIdle = 0x49444C45;  // "DEEP", "IDLE"
 
-TEST(ValueAccessorsTest, SimpleAndArray) {
-  std::uint64_t unit = 99;
-  EXPECT_EQ(DrvReportSimpleGetIntegerValue(Sample(1, {{1}, {2}}), &unit), kNone);
-  EXPECT_EQ(unit, 99u);
-  EXPECT_EQ(DrvReportSimpleGetIntegerValue(Sample(1, {{-7, 1}}), &unit), -7);
-  EXPECT_EQ(unit, 1ULL << 63);
-  const Dictionary array = Sample(4, {{10, 11, 12, 13}, {14, 15, 16, 17}}, 9);
-  for (const auto& [index, value] : {std::pair(5, 15LL), {7, 17LL}, {8, kNone}, {-1, kNone}}) {
-    EXPECT_EQ(DrvReportArrayGetValueAtIndex(array, index), value) << index;
-  }
-}
-
 TEST(ValueAccessorsTest, States) {
   Dictionary good = Sample(2, {{kDeep}, {kIdle, 2, 30, 0, -1}, {kDeep, 3, 10, 0, -1}});
   Dictionary torn = Sample(2, {{kDeep, 1, 9, 0, 1}, {kIdle, 1, 9}}, 2);

@@ -2,15 +2,15 @@
 
 #include <gtest/gtest.h>
 
+#include <algorithm>
 #include <cmath>
 #include <limits>
 #include <map>
 #include <string>
 #include <vector>
 
-#include "ctl/record_writer.h"
-#include "fakes/fake_platform.h"
-#include "fakes/temp_root.h"
+#include "fakes/fake_clock.h"
+#include "fakes/fake_counter_store.h"
 
 namespace quorlet {
 namespace {
@@ -35,29 +35,26 @@ class RecordBookTest : public testing::Test {
   }
   std::map<std::string, std::int64_t> stored(std::int32_t day) {
     std::map<std::string, std::int64_t> scalars;
-    ledger->openHistory()->scalarsForKeyPrefixMinDaysSince1970MaxDaysSince1970RowHandler(
-        "", day - 1, day, [&](std::string_view key, std::int32_t, std::int64_t value, bool&) {
-          scalars[std::string(key)] = value;
-        });
+    for (const auto& [row, value] : store.scalars) {
+      if (row.second == day) scalars[row.first] = value;
+    }
     return scalars;
   }
-  bool write(RecordBook& book) { return WriteRecordBatch(book.take(), *ledger); }
+  bool write(RecordBook& book) { return store.write(book.take()); }
 
-  const TempRoot device;
-  FakePlatform platform;
-  const std::unique_ptr<TallyLedger> ledger = MakeTallyLedger(
-      device.root(), Access::kReadWrite, platform.queries, platform.preferences, platform.log);
+  FakeClock clock;
+  FakeCounterStore store{clock};
 };
 
 TEST_F(RecordBookTest, SumsAcrossFlushesAndDays) {
   RecordBook book(RecordWhitelist::Naming(true), kSelf);
-  ASSERT_TRUE(book.enterDay(7, *ledger));
+  ASSERT_TRUE(book.enterDay(7, store));
   addAll(book, "half:2.5|c down:-2.5|c rate:3|c|@0.1 most:9223372036854775806|c kept:5|c g:4|g");
   ASSERT_TRUE(write(book));
   // 2.5 was written as 3, so the next half adds nothing; and so on.
   addAll(book,
          "half:0.5|c down:0.1|c most:9:9|c kept:0|c g:-1.5|g new:+2|g exact:9007199254740993|c");
-  ASSERT_TRUE(book.enterDay(8, *ledger));
+  ASSERT_TRUE(book.enterDay(8, store));
   addAll(book, "half:0.4|c g:10|g g:1:+2:-0.5|g");
   ASSERT_TRUE(write(book));
   EXPECT_TRUE(book.empty());
@@ -75,17 +72,16 @@ TEST_F(RecordBookTest, SumsAcrossFlushesAndDays) {
 
 TEST_F(RecordBookTest, KeysOfADayAreSharedAcrossListeners) {
   const RecordLimits limits{.keys = 5, .keysOfUser = 2, .values = 3};
-  ASSERT_TRUE(ledger->setScalar("old", 7, 1));
-  ASSERT_TRUE(
-      ledger->recordValues("old.values", 7, std::vector<DistributionSample>{{1, 1}, {2, 2}}));
+  store.hasScalar("old", 7, 1);
+  store.hasDistribution("old.values", 7, {1, 2});
   for (const char* owned : {"a1", "a2"}) {  // each in a listener of its own
     RecordBook book(RecordWhitelist::Naming(true), kSelf, limits);
-    ASSERT_TRUE(book.enterDay(7, *ledger));
+    ASSERT_TRUE(book.enterDay(7, store));
     EXPECT_EQ(add(book, owned + std::string(":1|c"), 10), std::nullopt);
     ASSERT_TRUE(write(book));
   }
   RecordBook book(RecordWhitelist::Naming(true), kSelf, limits);
-  ASSERT_TRUE(book.enterDay(7, *ledger));
+  ASSERT_TRUE(book.enterDay(7, store));
   EXPECT_EQ(add(book, "a3:1|c", 10), Refusal::kTooManyKeysOfUser);
   EXPECT_EQ(add(book, "old:1|c", 10), std::nullopt);
   EXPECT_EQ(add(book, "old.values:1:2|ms", 10), Refusal::kTooManyValues);
@@ -93,13 +89,13 @@ TEST_F(RecordBookTest, KeysOfADayAreSharedAcrossListeners) {
   EXPECT_EQ(add(book, "old.values:1|ms", 10), Refusal::kTooManyValues);
   EXPECT_EQ(add(book, "b1:1|c", std::nullopt), std::nullopt);
   EXPECT_EQ(add(book, "b2:1|c", 0), Refusal::kTooManyKeys);
-  ASSERT_TRUE(book.enterDay(8, *ledger));
+  ASSERT_TRUE(book.enterDay(8, store));
   EXPECT_EQ(add(book, "a3:1|c", 10), std::nullopt);
 }
 
 TEST_F(RecordBookTest, ReservedKeysAreForRootAndTheService) {
   RecordBook book(RecordWhitelist::Naming(true), kSelf);
-  ASSERT_TRUE(book.enterDay(7, *ledger));
+  ASSERT_TRUE(book.enterDay(7, store));
   for (const char* line : {"nuvex.a:1|c", "datausage.b:1|ms"}) {
     EXPECT_EQ(add(book, line, 10), Refusal::kReserved);
     EXPECT_EQ(add(book, line, std::nullopt), Refusal::kReserved);

@@ -6,6 +6,7 @@
 #include <functional>
 #include <memory>
 #include <string>
+#include <type_traits>
 #include <utility>
 #include <vector>
 
@@ -35,71 +36,75 @@ class FailingPlatform {
   }
 
  private:
-  // What every service here is made of. `call` is not made when it is to fail.
-  struct Service {
-    explicit Service(FailingPlatform& platform) : real(platform.real_), strike(platform.strike_) {}
-    template <typename Call>
-    void make(const char* name, const Call& call) {
-      if (!strike(name)) call();
+  // What every service here is made of. A call is not made when it is to fail.
+  template <typename Interface>
+  struct Service : Interface {
+    Service(Interface& given, const Strike& asked) : real(given), strike(asked) {}
+    template <typename Result, typename... Parameters>
+    Result attempt(const char* name, std::type_identity_t<Result> failure,
+                   Result (Interface::*method)(Parameters...),
+                   std::type_identity_t<Parameters>... arguments) {
+      if (strike(name)) return failure;
+      return (real.*method)(std::forward<Parameters>(arguments)...);
     }
-    template <typename Result, typename Call>
-    Result make(const char* name, Result failure, const Call& call) {
-      return strike(name) ? failure : call();
+    template <typename... Parameters>
+    void attempt(const char* name, void (Interface::*method)(Parameters...),
+                 std::type_identity_t<Parameters>... arguments) {
+      if (!strike(name)) (real.*method)(std::forward<Parameters>(arguments)...);
     }
-    const Platform& real;
+    Interface& real;
     const Strike& strike;
   };
 
-  struct FailingDrives : Drives, Service {
+  struct FailingDrives : Service<Drives> {
     using Service::Service;
-    std::vector<Drive> read() override {
-      return make<std::vector<Drive>>("drives", {}, [&] { return real.drives.read(); });
-    }
+    std::vector<Drive> read() override { return attempt("drives", {}, &Drives::read); }
   };
 
-  struct FailingPreferences : Preferences, Service {
+  struct FailingPreferences : Service<Preferences> {
     using Service::Service;
     std::optional<PropertyValue> DGWPreferencesGetValue(std::string_view key,
                                                         std::string_view domain) override {
-      return real.preferences.DGWPreferencesGetValue(key, domain);
+      return real.DGWPreferencesGetValue(key, domain);
     }
     void DGWPreferencesSetValue(std::string_view key, std::optional<PropertyValue> value,
                                 std::string_view domain) override {
       // In memory, it cannot fail but for want of memory.
       static_cast<void>(strike("set a preference"));
-      real.preferences.DGWPreferencesSetValue(key, std::move(value), domain);
+      real.DGWPreferencesSetValue(key, std::move(value), domain);
     }
     bool DGWPreferencesSynchronize(std::string_view domain) override {
-      return make("synchronize preferences", false,
-                  [&] { return real.preferences.DGWPreferencesSynchronize(domain); });
+      return attempt("synchronize preferences", false, &Preferences::DGWPreferencesSynchronize,
+                     domain);
     }
     void addToInteger(std::string_view key, std::int64_t delta, std::string_view domain) override {
       static_cast<void>(strike("add to a preference"));
-      real.preferences.addToInteger(key, delta, domain);
+      real.addToInteger(key, delta, domain);
     }
     bool isReadable(std::string_view domain) override {
-      return make("read preferences", false, [&] { return real.preferences.isReadable(domain); });
+      return attempt("read preferences", false, &Preferences::isReadable, domain);
     }
   };
 
-  struct FailingCounterStore : CounterStore, Service {
+  struct FailingCounterStore : Service<CounterStore> {
     using Service::Service;
-    std::int32_t TLDaysSince1970() override { return real.counterStore.TLDaysSince1970(); }
-    Date dateForDaysSince1970(std::int32_t day) override {
-      return real.counterStore.dateForDaysSince1970(day);
-    }
-    void TLClientCheckpoint() override {
-      make("checkpoint", [&] { real.counterStore.TLClientCheckpoint(); });
-    }
+    std::int32_t TLDaysSince1970() override { return real.TLDaysSince1970(); }
+    Date dateForDaysSince1970(std::int32_t day) override { return real.dateForDaysSince1970(day); }
+    void TLClientCheckpoint() override { attempt("checkpoint", &CounterStore::TLClientCheckpoint); }
     bool write(const StoreChanges& changes) override {
-      return make("write counters", false, [&] { return real.counterStore.write(changes); });
+      return attempt("write counters", false, &CounterStore::write, changes);
     }
     bool readNote(std::string_view name, std::optional<Dictionary>& value) override {
-      return make("read a note", false, [&] { return real.counterStore.readNote(name, value); });
+      return attempt("read a note", false, &CounterStore::readNote, name, value);
     }
+    bool takesKey(std::string_view key) override { return real.takesKey(key); }
+    bool keysOfDay(std::int32_t day, const DayKeyHandler& handler) override {
+      return real.keysOfDay(day, handler);
+    }
+    bool isSound() override { return real.isSound(); }
     std::unique_ptr<TLHistory> initWithDefaultPath() override {
       if (strike("read counters")) return std::make_unique<FailedHistory>();
-      return real.counterStore.initWithDefaultPath();
+      return real.initWithDefaultPath();
     }
     struct FailedHistory : TLHistory {
       void scalarsForKeyPrefixMinDaysSince1970MaxDaysSince1970RowHandler(
@@ -110,274 +115,243 @@ class FailingPlatform {
     };
   };
 
-  struct FailingDiagnostics : Diagnostics, Service {
+  struct FailingDiagnostics : Service<Diagnostics> {
     using Service::Service;
-    bool DiagnosticLogSubmissionEnabled() override {
-      return real.diagnostics.DiagnosticLogSubmissionEnabled();
-    }
-    std::string DGWOSVersion() override { return real.diagnostics.DGWOSVersion(); }
+    bool DiagnosticLogSubmissionEnabled() override { return real.DiagnosticLogSubmissionEnabled(); }
+    std::string DGWOSVersion() override { return real.DGWOSVersion(); }
     std::optional<PropertyValue> DGWGetDATaskingValue(std::string_view name) override {
-      return real.diagnostics.DGWGetDATaskingValue(name);
+      return real.DGWGetDATaskingValue(name);
     }
     bool writeLog(const LogRequest& request, const LogWriter& writer) override {
-      return make("write a log", false, [&] { return real.diagnostics.writeLog(request, writer); });
+      return attempt("write a log", false, &Diagnostics::writeLog, request, writer);
     }
-    bool hasLog(const std::string& fileName) override { return real.diagnostics.hasLog(fileName); }
+    bool hasLog(const std::string& fileName) override { return real.hasLog(fileName); }
     bool removeLogs(std::span<const std::string> fileNames) override {
-      return make("remove logs", false, [&] { return real.diagnostics.removeLogs(fileNames); });
+      return attempt("remove logs", false, &Diagnostics::removeLogs, fileNames);
     }
     bool removeAllLogs() override {
-      return make("remove all logs", false, [&] { return real.diagnostics.removeAllLogs(); });
+      return attempt("remove all logs", false, &Diagnostics::removeAllLogs);
     }
     void SubmitDiagnosticLogs() override {
-      make("submit logs", [&] { real.diagnostics.SubmitDiagnosticLogs(); });
+      attempt("submit logs", &Diagnostics::SubmitDiagnosticLogs);
     }
   };
 
-  struct FailingCrashSupport : CrashSupport, Service {
+  struct FailingCrashSupport : Service<CrashSupport> {
     using Service::Service;
     bool logEntries(std::int32_t type, std::span<const Dictionary> entries) override {
-      return make("log entries", false,
-                  [&] { return real.crashSupport.logEntries(type, entries); });
+      return attempt("log entries", false, &CrashSupport::logEntries, type, entries);
     }
     bool syncStructuredData() override {
-      return make("sync entries", false, [&] { return real.crashSupport.syncStructuredData(); });
+      return attempt("sync entries", false, &CrashSupport::syncStructuredData);
     }
     bool stageEntries() override {
-      return make("stage entries", false, [&] { return real.crashSupport.stageEntries(); });
+      return attempt("stage entries", false, &CrashSupport::stageEntries);
     }
     bool publishStagedEntries() override {
-      return make("publish entries", false,
-                  [&] { return real.crashSupport.publishStagedEntries(); });
+      return attempt("publish entries", false, &CrashSupport::publishStagedEntries);
     }
     void FSDumpAllOldStructuredDataLogs() override {
-      make("move old entries", [&] { real.crashSupport.FSDumpAllOldStructuredDataLogs(); });
+      attempt("move old entries", &CrashSupport::FSDumpAllOldStructuredDataLogs);
     }
-    void rollCarewellLogs() override {
-      make("rotate logs", [&] { real.crashSupport.rollCarewellLogs(); });
-    }
-    std::string GetSysIDWithDescription() override {
-      return real.crashSupport.GetSysIDWithDescription();
-    }
-    std::string GetHardwareModel() override { return real.crashSupport.GetHardwareModel(); }
-    std::string GetSystemVersion() override { return real.crashSupport.GetSystemVersion(); }
-    std::string GetIncidentID() override { return real.crashSupport.GetIncidentID(); }
+    void rollCarewellLogs() override { attempt("rotate logs", &CrashSupport::rollCarewellLogs); }
+    std::string GetSysIDWithDescription() override { return real.GetSysIDWithDescription(); }
+    std::string GetHardwareModel() override { return real.GetHardwareModel(); }
+    std::string GetSystemVersion() override { return real.GetSystemVersion(); }
+    std::string GetIncidentID() override { return real.GetIncidentID(); }
   };
 
-  struct FailingSupportLibrary : SupportLibrary, Service {
+  struct FailingSupportLibrary : Service<SupportLibrary> {
     using Service::Service;
-    bool load() override {
-      return make("load the library", false, [&] { return real.supportLibrary.load(); });
-    }
+    bool load() override { return attempt("load the library", false, &SupportLibrary::load); }
     Function findFunction(const char* name) override {
-      return strike("find a function") ? nullptr : real.supportLibrary.findFunction(name);
+      return strike("find a function") ? nullptr : real.findFunction(name);
     }
   };
 
-  struct FailingDeviceInfo : DeviceInfo, Service {
+  struct FailingDeviceInfo : Service<DeviceInfo> {
     using Service::Service;
     std::optional<PropertyValue> DQCopyAnswer(std::string_view question) override {
-      return make("ask the device", std::optional<PropertyValue>(),
-                  [&] { return real.deviceInfo.DQCopyAnswer(question); });
+      return attempt("ask the device", std::nullopt, &DeviceInfo::DQCopyAnswer, question);
     }
   };
 
-  struct FailingOSVersion : OSVersion, Service {
+  struct FailingOSVersion : Service<OSVersion> {
     using Service::Service;
     std::optional<Dictionary> CopySystemVersionDictionary() override {
-      return make("read the version", std::optional<Dictionary>(),
-                  [&] { return real.osVersion.CopySystemVersionDictionary(); });
+      return attempt("read the version", std::nullopt, &OSVersion::CopySystemVersionDictionary);
     }
   };
 
-  struct FailingKernelParameters : KernelParameters, Service {
+  struct FailingKernelParameters : Service<KernelParameters> {
     using Service::Service;
     int sysctlbyname(std::string_view name, std::span<std::byte> buffer,
                      std::size_t& length) override {
-      return make("read a parameter", EIO,
-                  [&] { return real.kernelParameters.sysctlbyname(name, buffer, length); });
+      return attempt("read a parameter", EIO, &KernelParameters::sysctlbyname, name, buffer,
+                     length);
     }
     bool removeTaken(std::string_view name) override {
-      return make("remove parameters", false,
-                  [&] { return real.kernelParameters.removeTaken(name); });
+      return attempt("remove parameters", false, &KernelParameters::removeTaken, name);
     }
-    void returnTaken(std::string_view name) override { real.kernelParameters.returnTaken(name); }
+    void returnTaken(std::string_view name) override { real.returnTaken(name); }
   };
 
-  struct FailingEnvironment : Environment, Service {
+  struct FailingEnvironment : Service<Environment> {
     using Service::Service;
     std::optional<FileStatus> stat(std::string_view path) override {
-      return make("look at a file", std::optional<FileStatus>(),
-                  [&] { return real.environment.stat(path); });
+      return attempt("look at a file", std::nullopt, &Environment::stat, path);
     }
     std::optional<std::string> readFile(std::string_view path, std::size_t limit) override {
-      return make("read a file", std::optional<std::string>(),
-                  [&] { return real.environment.readFile(path, limit); });
+      return attempt("read a file", std::nullopt, &Environment::readFile, path, limit);
     }
     std::optional<std::string> SystemGroupContainerPath(std::string_view identifier,
                                                         std::uint64_t& error) override {
       error = EIO;
-      return make("find a container", std::optional<std::string>(),
-                  [&] { return real.environment.SystemGroupContainerPath(identifier, error); });
+      return attempt("find a container", std::nullopt, &Environment::SystemGroupContainerPath,
+                     identifier, error);
     }
     bool CheckMultiUserMode(std::int32_t& mode) override {
-      return make("ask for users", false,
-                  [&] { return real.environment.CheckMultiUserMode(mode); });
+      return attempt("ask for users", false, &Environment::CheckMultiUserMode, mode);
     }
-    std::uint64_t TickClockNow() override { return real.environment.TickClockNow(); }
+    std::uint64_t TickClockNow() override { return real.TickClockNow(); }
     int TickTimebase(std::uint32_t& numerator, std::uint32_t& denominator) override {
-      return make("ask for the timebase", 1,
-                  [&] { return real.environment.TickTimebase(numerator, denominator); });
+      return attempt("ask for the timebase", 1, &Environment::TickTimebase, numerator, denominator);
     }
   };
 
-  struct FailingApplications : Applications, Service {
+  struct FailingApplications : Service<Applications> {
     using Service::Service;
     bool EnumerateApplicationBundles(
         const std::function<void(ApplicationBundleType)>& visit) override {
-      return make("list applications", false,
-                  [&] { return real.applications.EnumerateApplicationBundles(visit); });
+      return attempt("list applications", false, &Applications::EnumerateApplicationBundles, visit);
     }
   };
 
-  struct FailingLocale : LocaleService, Service {
+  struct FailingLocale : Service<LocaleService> {
     using Service::Service;
     using Languages = std::vector<std::string>;
     Languages PreferredLanguages() override {
-      return make("ask for languages", Languages(),
-                  [&] { return real.locale.PreferredLanguages(); });
+      return attempt("ask for languages", {}, &LocaleService::PreferredLanguages);
     }
     Languages SystemLanguages() override {
-      return make("list languages", Languages(), [&] { return real.locale.SystemLanguages(); });
+      return attempt("list languages", {}, &LocaleService::SystemLanguages);
     }
     Languages PreferredLocalizations(const Languages& available,
                                      const Languages& preferred) override {
-      return real.locale.PreferredLocalizations(available, preferred);
+      return real.PreferredLocalizations(available, preferred);
     }
     std::optional<std::string> CurrentRegionCode() override {
-      return make("ask for the region", std::optional<std::string>(),
-                  [&] { return real.locale.CurrentRegionCode(); });
+      return attempt("ask for the region", std::nullopt, &LocaleService::CurrentRegionCode);
     }
   };
 
-  struct FailingPassLock : PassLock, Service {
+  struct FailingPassLock : Service<PassLock> {
     using Service::Service;
-    bool lock() override {
-      return make("take the lock", false, [&] { return real.passLock.lock(); });
-    }
-    void unlock() override { real.passLock.unlock(); }
+    bool lock() override { return attempt("take the lock", false, &PassLock::lock); }
+    void unlock() override { real.unlock(); }
   };
 
-  struct FailingNotifications : Notifications, Service {
+  struct FailingNotifications : Service<Notifications> {
     using Service::Service;
     void PostNotification(std::string_view name) override {
-      make("post a notification", [&] { real.notifications.PostNotification(name); });
+      attempt("post a notification", &Notifications::PostNotification, name);
     }
   };
 
-  struct FailingNetworkUsage : NetworkUsage, Service {
+  struct FailingNetworkUsage : Service<NetworkUsage> {
     using Service::Service;
     void QueryProcessDataUsage(const std::vector<std::string>& nameFilter, UsageNameKind kind,
                                Reply reply) override {
-      make("ask for usage",
-           [&] { real.networkUsage.QueryProcessDataUsage(nameFilter, kind, std::move(reply)); });
+      attempt("ask for usage", &NetworkUsage::QueryProcessDataUsage, nameFilter, kind,
+              std::move(reply));
     }
   };
 
-  struct FailingDriverRegistry : DriverRegistry, Service {
+  struct FailingDriverRegistry : Service<DriverRegistry> {
     using Service::Service;
     RegistryHandle FindServiceByClass(std::string_view className) override {
-      return make("find a driver", RegistryHandle{},
-                  [&] { return real.driverRegistry.FindServiceByClass(className); });
+      return attempt("find a driver", {}, &DriverRegistry::FindServiceByClass, className);
     }
     KernelReturn FindServicesMatching(const Dictionary& match, RegistryHandle& iterator) override {
-      return make("find drivers", kKernelError,
-                  [&] { return real.driverRegistry.FindServicesMatching(match, iterator); });
+      return attempt("find drivers", kKernelError, &DriverRegistry::FindServicesMatching, match,
+                     iterator);
     }
     RegistryHandle IteratorNext(RegistryHandle iterator) override {
-      return make("go to the next driver", RegistryHandle{},
-                  [&] { return real.driverRegistry.IteratorNext(iterator); });
+      return attempt("go to the next driver", {}, &DriverRegistry::IteratorNext, iterator);
     }
     bool IteratorIsValid(RegistryHandle iterator) override {
-      return real.driverRegistry.IteratorIsValid(iterator);
+      return real.IteratorIsValid(iterator);
     }
-    void ReleaseHandle(RegistryHandle handle) override {
-      real.driverRegistry.ReleaseHandle(handle);
-    }
+    void ReleaseHandle(RegistryHandle handle) override { real.ReleaseHandle(handle); }
     std::uint32_t HandleRetainCount(RegistryHandle handle) override {
-      return real.driverRegistry.HandleRetainCount(handle);
+      return real.HandleRetainCount(handle);
     }
     KernelReturn OpenDriverConnection(RegistryHandle service, std::uint32_t type,
                                       RegistryHandle& connection) override {
-      return make("open a driver", kKernelError, [&] {
-        return real.driverRegistry.OpenDriverConnection(service, type, connection);
-      });
+      return attempt("open a driver", kKernelError, &DriverRegistry::OpenDriverConnection, service,
+                     type, connection);
     }
     KernelReturn CloseDriverConnection(RegistryHandle connection) override {
-      return real.driverRegistry.CloseDriverConnection(connection);
+      return real.CloseDriverConnection(connection);
     }
     KernelReturn CallDriverMethod(RegistryHandle connection, std::uint32_t method,
                                   DriverCall& call) override {
-      return make("call a driver", kKernelError,
-                  [&] { return real.driverRegistry.CallDriverMethod(connection, method, call); });
+      return attempt("call a driver", kKernelError, &DriverRegistry::CallDriverMethod, connection,
+                     method, call);
     }
     KernelReturn MapDriverMemory(RegistryHandle connection, std::uint32_t memoryType,
                                  std::span<const std::byte>& memory) override {
-      return make("map a driver's memory", kKernelError, [&] {
-        return real.driverRegistry.MapDriverMemory(connection, memoryType, memory);
-      });
+      return attempt("map a driver's memory", kKernelError, &DriverRegistry::MapDriverMemory,
+                     connection, memoryType, memory);
     }
     void UnmapDriverMemory(RegistryHandle connection, std::uint32_t memoryType,
                            std::span<const std::byte> memory) override {
-      real.driverRegistry.UnmapDriverMemory(connection, memoryType, memory);
+      real.UnmapDriverMemory(connection, memoryType, memory);
     }
     std::optional<PropertyValue> CopyEntryProperty(RegistryHandle entry,
                                                    std::string_view key) override {
-      return make("read a property", std::optional<PropertyValue>(),
-                  [&] { return real.driverRegistry.CopyEntryProperty(entry, key); });
+      return attempt("read a property", std::nullopt, &DriverRegistry::CopyEntryProperty, entry,
+                     key);
     }
     std::optional<PropertyValue> SearchEntryProperty(RegistryHandle entry,
                                                      std::string_view key) override {
-      return make("search a property", std::optional<PropertyValue>(),
-                  [&] { return real.driverRegistry.SearchEntryProperty(entry, key); });
+      return attempt("search a property", std::nullopt, &DriverRegistry::SearchEntryProperty, entry,
+                     key);
     }
     KernelReturn GetEntryName(RegistryHandle entry, std::string& name) override {
-      return make("read a name", kKernelError,
-                  [&] { return real.driverRegistry.GetEntryName(entry, name); });
+      return attempt("read a name", kKernelError, &DriverRegistry::GetEntryName, entry, name);
     }
     KernelReturn GetEntryID(RegistryHandle entry, std::uint64_t& id) override {
-      return make("read an ID", kKernelError,
-                  [&] { return real.driverRegistry.GetEntryID(entry, id); });
+      return attempt("read an ID", kKernelError, &DriverRegistry::GetEntryID, entry, id);
     }
   };
 
-  struct FailingTaskSnapshot : TaskSnapshot, Service {
+  struct FailingTaskSnapshot : Service<TaskSnapshot> {
     using Service::Service;
     std::optional<Data> CaptureTaskSnapshot(std::uint32_t flags) override {
-      return make("take a snapshot", std::optional<Data>(),
-                  [&] { return real.taskSnapshot.CaptureTaskSnapshot(flags); });
+      return attempt("take a snapshot", std::nullopt, &TaskSnapshot::CaptureTaskSnapshot, flags);
     }
   };
 
   Platform real_;
   Strike strike_;
-  FailingPreferences preferences_{*this};
-  FailingCounterStore counterStore_{*this};
-  FailingDiagnostics diagnostics_{*this};
-  FailingCrashSupport crashSupport_{*this};
-  FailingSupportLibrary supportLibrary_{*this};
-  FailingDeviceInfo deviceInfo_{*this};
-  FailingOSVersion osVersion_{*this};
-  FailingKernelParameters kernelParameters_{*this};
-  FailingEnvironment environment_{*this};
-  FailingApplications applications_{*this};
-  FailingLocale locale_{*this};
-  FailingPassLock passLock_{*this};
-  FailingNotifications notifications_{*this};
-  FailingNetworkUsage networkUsage_{*this};
-  FailingDrives drives_{*this};
-  FailingDriverRegistry driverRegistry_{*this};
-  FailingTaskSnapshot taskSnapshot_{*this};
+  FailingPreferences preferences_{real_.preferences, strike_};
+  FailingCounterStore counterStore_{real_.counterStore, strike_};
+  FailingDiagnostics diagnostics_{real_.diagnostics, strike_};
+  FailingCrashSupport crashSupport_{real_.crashSupport, strike_};
+  FailingSupportLibrary supportLibrary_{real_.supportLibrary, strike_};
+  FailingDeviceInfo deviceInfo_{real_.deviceInfo, strike_};
+  FailingOSVersion osVersion_{real_.osVersion, strike_};
+  FailingKernelParameters kernelParameters_{real_.kernelParameters, strike_};
+  FailingEnvironment environment_{real_.environment, strike_};
+  FailingApplications applications_{real_.applications, strike_};
+  FailingLocale locale_{real_.locale, strike_};
+  FailingPassLock passLock_{real_.passLock, strike_};
+  FailingNotifications notifications_{real_.notifications, strike_};
+  FailingNetworkUsage networkUsage_{real_.networkUsage, strike_};
+  FailingDrives drives_{real_.drives, strike_};
+  FailingDriverRegistry driverRegistry_{real_.driverRegistry, strike_};
+  FailingTaskSnapshot taskSnapshot_{real_.taskSnapshot, strike_};
   EnvironmentQueries queries_;
 };
 

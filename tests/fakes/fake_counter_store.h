@@ -58,6 +58,13 @@ class FakeCounterStore : public CounterStore {
                                  : std::numeric_limits<std::int64_t>::max();
       }
     }
+    for (const RecordedValues& recorded : changes.values) {
+      Samples& samples = distributions[{recorded.key, recorded.day}];
+      auto value = recorded.values.begin();
+      for (auto [second, count] : recorded.runs) {
+        while (count-- > 0) samples.push_back({*value++, second});
+      }
+    }
     for (const StoreNote& note : changes.notes) {
       notes.erase(note.name);
       if (note.value) notes.emplace(note.name, note.value->deepCopy());
@@ -69,6 +76,17 @@ class FakeCounterStore : public CounterStore {
     value = found != notes.end() ? std::optional(found->second.deepCopy()) : std::nullopt;
     return true;
   }
+  bool takesKey(std::string_view) override { return true; }
+  bool keysOfDay(std::int32_t day, const DayKeyHandler& handler) override {
+    for (const auto& [row, value] : scalars) {
+      if (row.second == day && !handler(row.first, std::nullopt)) return true;
+    }
+    for (const auto& [row, samples] : distributions) {
+      if (row.second == day && !handler(row.first, samples.size())) return true;
+    }
+    return true;
+  }
+  bool isSound() override { return torn.empty(); }
   std::unique_ptr<TLHistory> initWithDefaultPath() override {
     ++historiesOpened;
     return isMissing ? nullptr : std::make_unique<History>(*this);

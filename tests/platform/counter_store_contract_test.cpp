@@ -11,7 +11,6 @@
 #include "fakes/fake_platform.h"
 #include "fakes/temp_root.h"
 #include "platform/linux/counters/counter_store.h"
-#include "platform/linux/counters/tally_ledger.h"
 
 namespace quorlet {
 namespace {
@@ -63,13 +62,28 @@ std::string Distributions(const History& history, std::string_view prefix = "",
   return rows;
 }
 
-// A process with the ledger of a root. Whatever logs an error line fails the test that did not
+// Samples of a key, and what is added to "sum".
+StoreChanges Changes(std::string_view key, std::int32_t day, const Samples& samples,
+                     std::int64_t sum = 0) {
+  StoreChanges changes;
+  RecordedValues& recorded = changes.values.emplace_back();
+  recorded.key = key;
+  recorded.day = day;
+  for (const auto& [value, second] : samples) recorded.add(value, second);
+  if (sum != 0) changes.scalars.push_back({ScalarChange::Kind::kAdd, "sum", sum, day});
+  return changes;
+}
+
+// A process with the store of a root. Whatever logs an error line fails the test that did not
 // expect (and take) it.
 struct LinuxSubject {
   explicit LinuxSubject(const TempRoot& root, Access access = Access::kReadWrite)
-      : ledger(MakeTallyLedger(root.root(), access, queries, preferences, log)) {}
+      : store(MakeLinuxCounterStore(root.root(), access, clock, queries, preferences, log)) {}
   ~LinuxSubject() { EXPECT_EQ(log.errors(), std::vector<std::string>{}); }
-  History history() { return ledger->openHistory(); }
+  History history() { return store->initWithDefaultPath(); }
+  bool record(std::string_view key, const Samples& samples, std::int64_t sum = 0) {
+    return store->write(Changes(key, kToday, samples, sum));
+  }
   // How many error lines there were since the last call.
   std::size_t takeErrors() { return std::exchange(log.lines, {}).size(); }
   std::int64_t corruptionCount() {
@@ -81,7 +95,8 @@ struct LinuxSubject {
   FakeEnvironment environment;
   FakePreferences preferences;
   EnvironmentQueries queries{deviceInfo, environment, log};
-  std::unique_ptr<TallyLedger> ledger;
+  FakeClock clock;
+  std::unique_ptr<CounterStore> store;
 };
 
 TEST(CounterStoreContract, TheFakeAndTheLinuxStoreGiveTheSameRows) {
@@ -89,9 +104,10 @@ TEST(CounterStoreContract, TheFakeAndTheLinuxStoreGiveTheSameRows) {
   FakeCounterStore fake(clock);
   const TempRoot root;
   LinuxSubject subject(root);
-  const auto store = MakeLinuxCounterStore(*subject.ledger, clock, subject.log);
+  const auto& store = subject.store;
   for (const std::int32_t day : {kToday - 31, kToday + 1, kToday - 30, kToday}) {
     clock.goToDay(day);
+    subject.clock.goToDay(day);
     for (const auto& key : {"b"s, "\xff\xff\x01"s, "\xff"s, "ab"s, "a\xff\xff"s, "a\xff"s,
                             "a\xc3\xa4"s, "a\0b"s, "a"s, ""s}) {
       for (CounterStore* each : {store.get(), static_cast<CounterStore*>(&fake)}) {
@@ -99,9 +115,8 @@ TEST(CounterStoreContract, TheFakeAndTheLinuxStoreGiveTheSameRows) {
         each->TLClientAddValueForScalarKey(key, -12);
         each->TLClientAddValueForScalarKey(key + "low", -INT64_MAX);
         each->TLClientAddValueForScalarKey(key + "low", -INT64_MAX);
+        EXPECT_TRUE(each->write(Changes(key, day, {{2, 3}, {4, 3}, {1, 5}})));
       }
-      fake.distributions[{key, day}] = {{2, 3}};
-      EXPECT_TRUE(subject.ledger->recordValues(key, day, Samples{{2, 3}}));
     }
   }
   store->TLClientCheckpoint();  // drops what is older than 30 days
@@ -109,6 +124,16 @@ TEST(CounterStoreContract, TheFakeAndTheLinuxStoreGiveTheSameRows) {
   EXPECT_EQ(Scalars(subject.history(), "b", 0),
             "b 19970: -3\nb 20000: -3\n"
             "blow 19970: -9223372036854775808\nblow 20000: -9223372036854775808\n");
+  std::string keys[2];
+  for (const int i : {0, 1}) {
+    CounterStore& each = i == 0 ? *store : fake;
+    EXPECT_TRUE(each.keysOfDay(kToday, [&](std::string_view key, auto values) {
+      keys[i] += std::string(key) + " " + std::to_string(values.value_or(99)) + "\n";
+      return key != "b" || !values;
+    }));
+  }
+  EXPECT_EQ(keys[0], keys[1]);
+  EXPECT_TRUE(keys[0].ends_with("b 3\n")) << keys[0];
   for (const std::string prefix : {"", "a", "a\xff", "ab", "b", "c", "\xff", "\xff\xff"}) {
     for (const auto& [low, high] :
          {std::pair{0, kToday + 1}, {kToday - 30, kToday}, {kToday, kToday}, {kToday + 1, 0}}) {
@@ -128,7 +153,7 @@ TEST(LinuxCounterStore, ValuesComeInTheOrderRecorded) {
   for (const int batch : {1, 1, 13, 1, 1, 14, 16, 17, 95, 97, 380, 721, 1403, 1500}) {
     Samples samples = Ramp(batch);
     samples[0] = {batch % 2 == 0 ? NAN : -HUGE_VAL, -batch};
-    EXPECT_TRUE(subject.ledger->recordValues("r", kToday, samples));
+    EXPECT_TRUE(subject.record("r", samples));
     all.insert(all.end(), samples.begin(), samples.end());
     ASSERT_EQ(Distributions(subject.history(), "r"), Row("r", kToday, all));
   }
@@ -167,10 +192,7 @@ TEST(LinuxCounterStore, ProcessesLoseNothingAndKilledOnesLeaveWholeTransactions)
     LinuxSubject subject(root);
     bool good = true;
     for (int n = 0; good && n < times; ++n) {
-      good = subject.ledger->inTransaction([&] {
-        return subject.ledger->addToScalar("sum", kToday, 9) &&
-               subject.ledger->recordValues("d", kToday, Ramp(9));
-      });
+      good = subject.record("d", Ramp(9), 9);
     }
     subject.takeErrors();
     return good ? static_cast<int>(subject.corruptionCount()) : 99;
@@ -197,9 +219,8 @@ void Fill(const TempRoot& root) {
   const TempRoot own;
   {
     LinuxSubject subject(own);
-    EXPECT_TRUE(subject.ledger->setScalar("s", kToday, 7));
-    EXPECT_TRUE(subject.ledger->recordValues("d", kToday, Ramp(200)));
-    EXPECT_TRUE(subject.ledger->recordValues("e", kToday, Ramp(3000)));
+    EXPECT_TRUE(subject.record("d", Ramp(200), 7));
+    EXPECT_TRUE(subject.record("e", Ramp(3000)));
   }
   // The file alone: whoever ends has copied the log back.
   root.write(kDatabase, own.read(kDatabase));
@@ -235,13 +256,13 @@ TEST(LinuxCounterStore, ADamagedDatabaseIsReplaced) {
       const std::string before = State(root);
       LinuxSubject preview(root, Access::kReadOnly);
       Distributions(preview.history());
-      EXPECT_FALSE(preview.ledger->setScalar("s", kToday, 1));
+      EXPECT_FALSE(preview.record("s", Ramp(1)));
       EXPECT_EQ(preview.takeErrors(), 2u);
       EXPECT_TRUE(State(root) == before);
 
       LinuxSubject subject(root);
       if (byReading) Distributions(subject.history());
-      EXPECT_TRUE(subject.ledger->recordValues("d", kToday, Ramp(2)));
+      EXPECT_TRUE(subject.record("d", Ramp(2)));
       EXPECT_EQ(subject.takeErrors(), 1u);
       EXPECT_EQ(subject.corruptionCount(), 1);
       EXPECT_TRUE(root.read(kDatabase + ".damaged"s) == damaged);

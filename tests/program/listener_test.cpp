@@ -87,8 +87,9 @@ TEST(ListenerProgramTest, EveryTransitionThroughTheSocket) {
   const std::string yesterday = ProgramDevice::yesterday();
   const PropertyValue status = Operation(0);
   const PropertyValue run = RunDay(std::stoll(yesterday));
-  const PropertyValue apps = AppInfo({Dictionary{
-      {"uuid", Data(16)}, {"bundle_id", "b"}, {"version", "1"}, {"tesk_id", Int64(7)}}});
+  const PropertyValue apps = AppInfo(
+      {Dictionary{{"uuid", Data(16)}, {"bundle_id", "b"}, {"version", "1"}, {"tesk_id", Int64(7)}},
+       "x", Dictionary{{"uuid", Data(15)}, {"bundle_id", "b"}, {"version", "1"}}});
   struct Case {
     const char* name;
     std::vector<PropertyValue> messages;

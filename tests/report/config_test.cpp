@@ -82,12 +82,6 @@ TEST_F(ConfigTest, TaskingSwitchesGroupsOff) {
             "passing @{} for unknown as device is Nuvex Internal");
 }
 
-TEST_F(ConfigTest, TheDigestIsOfTheBytes) {
-  device.environment.files[std::string(kWhitelistPath)] = "<plist version=\"1.0\"><dict/></plist>";
-  // printf '<plist version="1.0"><dict/></plist>' | md5sum
-  EXPECT_EQ(load().configFileDigest(), "be5a5e8f37d7f11fc2c74e4372ebb8f0");
-}
-
 TEST_F(ConfigTest, FaultyEntriesAreSkippedWithOneLineEach) {
   whitelist(
       "<key>G</key><dict><key>ScalarKeys</key><dict><key>good</key><dict/>"

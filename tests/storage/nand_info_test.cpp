@@ -137,20 +137,6 @@ TEST(NANDInfo, MergeLeavesOutVersionsAndErrors) {
   }
 }
 
-// Through the whole daily sequence of collectors.
-TEST(DailyPush, NumbersBecomeCountersOfToday) {
-  ExportDevice device("NuvexEmbeddedNVMeController");
-  device.preferences.DGWPreferencesSetValue("StoreDemoMode", Int8(1), "nuvex.demo-settings");
-  device.words = ExportOf({{"exportVersion", {1}}, {"nandWrites", {9}}});
-  collectPlatformStatistics(device.services);
-  auto& scalars = device.counterStore.scalars;
-  EXPECT_EQ((scalars[{"nuvex.NANDInfo.NumPhysicalWrites", 20000}]), 9);
-  EXPECT_EQ((scalars[{"nuvex.NANDInfo.DriverVersion", 20000}]), -1);
-  EXPECT_EQ((scalars[{"nuvex.NANDInfo.DemoMode", 20000}]), 1);
-  EXPECT_EQ(scalars.size(), 2U + 15U);
-  EXPECT_TRUE(device.driverRegistry.isBalanced());
-}
-
 TEST(DailyPush, ErrorsAreLogged) {
   const std::pair<ExportWords, std::string> cases[] = {
       {{1}, "Unsupported export version"},

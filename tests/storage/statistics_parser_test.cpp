@@ -71,28 +71,6 @@ TEST(StatisticsParser, FieldsAndNamesOfAFullExport) {
   for (const char* name : {"", "0", "qosPerCmdQ160", "qosPerCmdQ00", "boots0", "padSizes99999"}) {
     EXPECT_EQ(FindStatisticsSlot(name), std::nullopt) << name;
   }
-  const FSPParseContext& c = context;
-  const ExportWords fields = {c.exportVersion,
-                              c.numVirtualBlocks,
-                              c.blocksPerVirtualBlock,
-                              c.pagesPerVirtualBlock,
-                              c.bytesPerPage,
-                              c.hostReads,
-                              c.hostWrites,
-                              c.numFreeVirtualBlocks,
-                              c.wearLevMoves,
-                              c.nandReads,
-                              c.nandWrites,
-                              c.bandErases,
-                              c.IND_pool_free,
-                              c.IND_pool_count,
-                              c.utilFormatTime,
-                              c.numSleepOps,
-                              c.maxHighEnduranceBlockErases,
-                              c.readCountHisto[0],
-                              c.readCountHisto[4] - 0x100000001 * 4000};
-  EXPECT_EQ(fields, (ExportWords{53, 52, 51, 50, 49, 7, 4, 48, 17, 19, 18, 20, 12, 13, 56, 28, 45,
-                                 265, 265}));
 }
 
 TEST(StatisticsParser, EveryLength) {

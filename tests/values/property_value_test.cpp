@@ -50,24 +50,5 @@ TEST(Containers, HandlesShareAndCopiesDoNot) {
   EXPECT_TRUE(ArrayEntry(*shallow.asDictionary(), "list")->sharesWith(list));
 }
 
-TEST(Description, PrintsEveryKind) {
-  const std::pair<PropertyValue, std::string_view> cases[] = {
-      {Int64(kMin), "-9223372036854775808"},
-      {Double(0.1), "0.1"},
-      {Double(-kInfinity), "-inf"},
-      {Double(-NAN), "nan"},
-      {Single(0.1F), "0.1"},
-      {Date{1772600767}, "2026-03-04 05:06:07 +0000"},
-      {Data{std::byte{1}, std::byte{0xAB}}, "{length = 2, bytes = 0x01ab}"},
-      {Data(25), "{length = 25, bytes = 0x000000000000000000000000000000000000000000000000...}"},
-      {Dictionary{{"list", Array{Int32(1), "two words", Dictionary{{"a-b", "c\n\"\x01"}}}},
-                  {"plain", "x_1.y/z"},
-                  {"", ""}},
-       "{\n    \"\" = \"\";\n    list = (\n        1,\n        \"two words\",\n        {\n"
-       "            \"a-b\" = \"c\\n\\\"\\x01\";\n        }\n    );\n    plain = x_1.y/z;\n}"},
-  };
-  for (const auto& [value, text] : cases) EXPECT_EQ(value.description(), text);
-}
-
 }  // namespace
 }  // namespace quorlet

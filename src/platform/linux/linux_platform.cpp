@@ -7,7 +7,6 @@
 
 #include "platform/linux/base/semaphores.h"
 #include "platform/linux/base/services.h"
-#include "platform/linux/counters/counter_store.h"
 #include "platform/linux/device/services.h"
 #include "platform/linux/drives/drive_exports.h"
 #include "platform/linux/drives/drive_reader.h"
@@ -45,8 +44,8 @@ struct LinuxPlatform::Services {
         deviceInfo(MakeLinuxDeviceInfo(root, *log)),
         environment(MakeLinuxEnvironment(root, *deviceInfo, *log)),
         queries(*deviceInfo, *environment, *log),
-        ledger(MakeTallyLedger(root, access, queries, *preferences, *log, options)),
-        counterStore(MakeLinuxCounterStore(*ledger, *clock, *log)),
+        counterStore(
+            MakeLinuxCounterStore(root, access, *clock, queries, *preferences, *log, options)),
         osVersion(MakeLinuxOSVersion(root, *log)),
         diagnostics(MakeLinuxDiagnostics(root, access, *clock, *preferences, *osVersion, *log)),
         crashSupport(MakeLinuxCrashSupport(root, access, *clock, *osVersion, *log)),
@@ -70,7 +69,6 @@ struct LinuxPlatform::Services {
   const std::unique_ptr<DeviceInfo> deviceInfo;
   const std::unique_ptr<Environment> environment;
   EnvironmentQueries queries;
-  const std::unique_ptr<TallyLedger> ledger;
   const std::unique_ptr<CounterStore> counterStore;
   const std::unique_ptr<OSVersion> osVersion;
   const std::unique_ptr<Diagnostics> diagnostics;
@@ -121,7 +119,6 @@ LinuxPlatform::LinuxPlatform(Root root, Access access, std::unique_ptr<SystemLog
 LinuxPlatform::~LinuxPlatform() = default;
 
 Platform& LinuxPlatform::services() { return services_->bundle; }
-TallyLedger& LinuxPlatform::ledger() { return *services_->ledger; }
 const Root& LinuxPlatform::root() const { return services_->root; }
 
 }  // namespace quorlet

@@ -6,7 +6,7 @@
 
 #include "platform/linux/base/access.h"
 #include "platform/linux/base/files.h"
-#include "platform/linux/counters/tally_ledger.h"
+#include "platform/linux/counters/counter_store.h"
 #include "platform/platform.h"
 
 namespace quorlet {
@@ -24,7 +24,6 @@ class LinuxPlatform {
 
   // Borrowed from this object.
   Platform& services();
-  TallyLedger& ledger();
   const Root& root() const;
 
  private:

@@ -23,91 +23,24 @@ constexpr char kCorruptionCountDomain[] = "nuvex.aggregated";
 // Which file was counted last; there while it is being moved aside.
 constexpr char kCountedFileKey[] = "DatabaseCorruptionCounted";
 
-class LinuxTallyLedger final : public TallyLedger {
- public:
-  LinuxTallyLedger(const Root& root, Access access, EnvironmentQueries& queries,
-                   Preferences& preferences, SystemLog& log, const TallyOptions& options)
-      : root_(root),
-        access_(access),
-        queries_(queries),
-        preferences_(preferences),
-        log_(log),
-        copiesBack_(options.copiesBack),
-        patience_(options.patience) {}
+}  // namespace
 
-  ~LinuxTallyLedger() override {
-    if (copiesBack_ && writer_.isOpen()) writer_.copyBack();
-  }
+TallyLedger::TallyLedger(const Root& root, Access access, EnvironmentQueries& queries,
+                         Preferences& preferences, SystemLog& log, const TallyOptions& options)
+    : root_(root),
+      access_(access),
+      queries_(queries),
+      preferences_(preferences),
+      log_(log),
+      copiesBack_(options.copiesBack),
+      patience_(options.patience) {}
 
-  bool takesKey(std::string_view key) override {
-    if (key.size() <= kLongestTallyKey) return true;
-    log_.error("A counter's key of %llu bytes is too long", key.size());
-    return false;
-  }
-
-  bool setScalar(std::string_view key, std::int32_t day, std::int64_t value) override {
-    return write(key, [&] { return writer_.setScalar(key, day, value); });
-  }
-  bool addToScalar(std::string_view key, std::int32_t day, std::int64_t value) override {
-    return write(key, [&] { return writer_.addToScalar(key, day, value); });
-  }
-  bool recordValues(std::string_view key, std::int32_t day,
-                    std::span<const DistributionSample> samples) override {
-    if (samples.empty()) return true;
-    return write(key, [&] { return writer_.recordValues(key, day, samples); });
-  }
-  bool setNote(std::string_view name, const std::optional<std::string>& value) override {
-    return write(name, [&] { return writer_.setNote(name, value); });
-  }
-  bool keysOfDay(std::int32_t day, const DayKeyHandler& handler) override;
-  bool dropCounters() override {
-    return write({}, [&] { return writer_.dropCounters(); });
-  }
-  bool readNote(std::string_view name, std::optional<std::string>& value) override;
-  bool inTransaction(const std::function<bool()>& work) override;
-  bool checkpoint(std::int32_t firstDay) override;
-  bool isSound() override;
-  std::unique_ptr<TLHistory> openHistory() override;
-
- private:
-  using Work = std::function<int()>;  // gives SQLite's result code
-
-  bool findPath();
-  bool mayWrite();
-  int openWriter();
-  int openOrCreate();
-  int begin();
-  bool write(std::string_view key, const Work& work);
-  bool writeJoined(const Work& work);
-  std::string reasonOf(int code) const;
-  bool recover(int code, bool mayTryAgain);
-  bool replaceDamaged(const FileIdentity& damaged, const std::string& why);
-  bool moveAside(const FileIdentity& damaged, const std::string& why);
-  void countCorruption(const FileIdentity& damaged);
-  int startNewDatabase();
-  int placeNewDatabase();
-  int lockFailed(const FileLock& lock);
-  void handleReadFailure(TallyDatabase& reader, int code);
-
-  const Root root_;
-  const Access access_;
-  EnvironmentQueries& queries_;
-  Preferences& preferences_;
-  SystemLog& log_;
-  const bool copiesBack_;
-  // Recursive: the work of a transaction calls the writing operations.
-  std::recursive_mutex mutex_;
-  std::string directory_;
-  std::string path_;
-  LockPatience patience_;
-  TallyDatabase writer_;
-  std::string fileError_;  // what kept the writer from being opened
-  bool inTransaction_ = false;
-  bool transactionFailed_ = false;
-};
+TallyLedger::~TallyLedger() {
+  if (copiesBack_ && writer_.isOpen()) writer_.copyBack();
+}
 
 // Where the database is. Without a data home there is nothing to work on, which has been logged.
-bool LinuxTallyLedger::findPath() {
+bool TallyLedger::findPath() {
   if (!path_.empty()) return true;
   const std::optional<std::string> home = queries_.dataHomePath();
   if (!home) return false;
@@ -116,13 +49,13 @@ bool LinuxTallyLedger::findPath() {
   return true;
 }
 
-bool LinuxTallyLedger::mayWrite() {
+bool TallyLedger::mayWrite() {
   if (access_ == Access::kReadWrite) return findPath();
   log_.error("The counter store cannot be written with read-only access");
   return false;
 }
 
-int LinuxTallyLedger::openWriter() {
+int TallyLedger::openWriter() {
   FileIdentity file;
   int error = FindIdentity(path_, file);
   // Another process may have replaced a damaged database meanwhile.
@@ -142,7 +75,7 @@ int LinuxTallyLedger::openWriter() {
   return code;
 }
 
-int LinuxTallyLedger::openOrCreate() {
+int TallyLedger::openOrCreate() {
   FileIdentity file;
   fileError_.clear();
   const bool isMissing = FindIdentity(path_, file) == ENOENT;
@@ -154,21 +87,19 @@ int LinuxTallyLedger::openOrCreate() {
   return code;
 }
 
-int LinuxTallyLedger::begin() {
+int TallyLedger::begin() {
   int code = openWriter();
   if (code == SQLITE_OK) code = writer_.begin();
   if (code == SQLITE_OK) patience_.noteWait(/*inVain=*/false);
   return code;
 }
 
-bool LinuxTallyLedger::write(std::string_view key, const Work& work) {
+bool TallyLedger::write(const Work& work) {
   const std::lock_guard lock(mutex_);
-  if (!takesKey(key)) return false;
-  if (inTransaction_) return writeJoined(work);
   if (!mayWrite()) return false;
   for (const bool mayTryAgain : {true, false}) {
     int code = begin();
-    if (code == SQLITE_OK) code = work();
+    if (code == SQLITE_OK) code = work(writer_);
     if (code == SQLITE_OK) code = writer_.commit();
     if (code == SQLITE_OK) return true;
     if (!recover(code, mayTryAgain)) return false;
@@ -176,39 +107,7 @@ bool LinuxTallyLedger::write(std::string_view key, const Work& work) {
   return false;
 }
 
-// One operation of an open transaction. After a failure nothing more is tried: all is lost anyway.
-bool LinuxTallyLedger::writeJoined(const Work& work) {
-  if (transactionFailed_) return false;
-  const int code = work();
-  if (code == SQLITE_OK) return true;
-  transactionFailed_ = true;
-  static_cast<void>(recover(code, /*mayTryAgain=*/true));
-  return false;
-}
-
-bool LinuxTallyLedger::inTransaction(const std::function<bool()>& work) {
-  const std::lock_guard lock(mutex_);
-  if (!mayWrite()) return false;
-  if (int code = begin(); code != SQLITE_OK) {
-    if (!recover(code, /*mayTryAgain=*/true)) return false;
-    code = begin();
-    if (code != SQLITE_OK) return recover(code, /*mayTryAgain=*/false);
-  }
-  inTransaction_ = true;
-  transactionFailed_ = false;
-  const bool keep = work();
-  inTransaction_ = false;
-  if (transactionFailed_) return false;
-  if (!keep) {
-    writer_.rollback();
-    return false;
-  }
-  const int code = writer_.commit();
-  if (code != SQLITE_OK) static_cast<void>(recover(code, /*mayTryAgain=*/true));
-  return code == SQLITE_OK;
-}
-
-bool LinuxTallyLedger::readNote(std::string_view name, std::optional<std::string>& value) {
+bool TallyLedger::readNote(std::string_view name, std::optional<std::string>& value) {
   const std::lock_guard lock(mutex_);
   value.reset();
   FileIdentity file;
@@ -227,7 +126,7 @@ bool LinuxTallyLedger::readNote(std::string_view name, std::optional<std::string
   return false;
 }
 
-bool LinuxTallyLedger::keysOfDay(std::int32_t day, const DayKeyHandler& handler) {
+bool TallyLedger::keysOfDay(std::int32_t day, const DayKeyHandler& handler) {
   const std::lock_guard lock(mutex_);
   FileIdentity file;
   if (!findPath()) return false;
@@ -239,7 +138,7 @@ bool LinuxTallyLedger::keysOfDay(std::int32_t day, const DayKeyHandler& handler)
   return code == SQLITE_OK;
 }
 
-bool LinuxTallyLedger::checkpoint(std::int32_t firstDay) {
+bool TallyLedger::checkpoint(std::int32_t firstDay) {
   const std::lock_guard lock(mutex_);
   if (!mayWrite()) return false;
   FileIdentity file;
@@ -251,13 +150,15 @@ bool LinuxTallyLedger::checkpoint(std::int32_t firstDay) {
     if (code == SQLITE_OK) code = writer_.examine(/*values=*/false);
     if (code == SQLITE_OK) code = writer_.hasDaysBefore(firstDay, has);
     if (code == SQLITE_OK && !has) return true;
-    if (code == SQLITE_OK) return write({}, [&] { return writer_.dropDaysBefore(firstDay); });
+    if (code == SQLITE_OK) {
+      return write([&](TallyDatabase& database) { return database.dropDaysBefore(firstDay); });
+    }
     if (!recover(code, mayTryAgain)) return false;
   }
   return false;
 }
 
-bool LinuxTallyLedger::isSound() {
+bool TallyLedger::isSound() {
   const std::lock_guard lock(mutex_);
   FileIdentity file;
   if (!findPath()) return false;
@@ -275,7 +176,7 @@ bool LinuxTallyLedger::isSound() {
   return false;
 }
 
-std::string LinuxTallyLedger::reasonOf(int code) const {
+std::string TallyLedger::reasonOf(int code) const {
   if (!fileError_.empty()) return fileError_;
   std::string why = writer_.message(code);
   // Of a write-ahead log, the lock that its one writer holds.
@@ -287,7 +188,7 @@ std::string LinuxTallyLedger::reasonOf(int code) const {
 
 // Ends the failed transaction. Returns whether the operation should be tried once more, which the
 // caller can; otherwise there is one error line.
-bool LinuxTallyLedger::recover(int code, bool mayTryAgain) {
+bool TallyLedger::recover(int code, bool mayTryAgain) {
   const std::string why = reasonOf(code);
   const FileIdentity file = writer_.identity();
   fileError_.clear();
@@ -299,20 +200,18 @@ bool LinuxTallyLedger::recover(int code, bool mayTryAgain) {
   return false;
 }
 
-int LinuxTallyLedger::lockFailed(const FileLock& lock) {
+int TallyLedger::lockFailed(const FileLock& lock) {
   fileError_ = directory_ + kLockName + " cannot be locked: " + ErrnoText(lock.error());
   return SQLITE_CANTOPEN;
 }
 
 // Moves the damaged database aside, unless a second look finds it sound. Returns whether there may
 // be a good one now; otherwise there is one error line.
-bool LinuxTallyLedger::replaceDamaged(const FileIdentity& damaged, const std::string& why) {
+bool TallyLedger::replaceDamaged(const FileIdentity& damaged, const std::string& why) {
   if (access_ == Access::kReadOnly) {
     log_.error("The counter store %@ is damaged: %@", path_, why);
     return false;
   }
-  // A reader may have found it while a transaction is open here.
-  if (inTransaction_) transactionFailed_ = true;
   writer_.close();
   const FileLock lock(directory_ + kLockName, Sharing::kGroupOfDirectory);
   if (lock.error() != 0) {
@@ -338,7 +237,7 @@ bool LinuxTallyLedger::replaceDamaged(const FileIdentity& damaged, const std::st
 
 // With the lock held. A kill at any point leaves what the next process brings to its end: the
 // damage is counted once, and what lies beside the database goes when the new one is made.
-bool LinuxTallyLedger::moveAside(const FileIdentity& damaged, const std::string& why) {
+bool TallyLedger::moveAside(const FileIdentity& damaged, const std::string& why) {
   countCorruption(damaged);
   std::string aside;
   if (const int error = MoveAsideAsDamaged(path_, aside)) {
@@ -358,7 +257,7 @@ bool LinuxTallyLedger::moveAside(const FileIdentity& damaged, const std::string&
 }
 
 // Together with which file was counted, so that nobody counts it again who finds it still there.
-void LinuxTallyLedger::countCorruption(const FileIdentity& damaged) {
+void TallyLedger::countCorruption(const FileIdentity& damaged) {
   const PropertyValue file(std::to_string(damaged.device) + ":" + std::to_string(damaged.inode));
   const auto counted = preferences_.DGWPreferencesGetValue(kCountedFileKey, kCorruptionCountDomain);
   if (counted && *counted == file) return;
@@ -369,7 +268,7 @@ void LinuxTallyLedger::countCorruption(const FileIdentity& damaged) {
 
 // Puts a new database where there is none, or one without tables: all of it at once, so that no
 // process ever meets half of it.
-int LinuxTallyLedger::startNewDatabase() {
+int TallyLedger::startNewDatabase() {
   writer_.close();
   const FileLock lock(directory_ + kLockName, Sharing::kGroupOfDirectory);
   if (lock.error() != 0) return lockFailed(lock);
@@ -384,7 +283,7 @@ int LinuxTallyLedger::startNewDatabase() {
 }
 
 // With the lock held.
-int LinuxTallyLedger::placeNewDatabase() {
+int TallyLedger::placeNewDatabase() {
   // What an earlier database left beside it would be played into the new one.
   bool hasLeftOvers = false;
   for (const char* suffix : kTallySideFiles) {
@@ -397,7 +296,7 @@ int LinuxTallyLedger::placeNewDatabase() {
   return SQLITE_CANTOPEN;
 }
 
-std::unique_ptr<TLHistory> LinuxTallyLedger::openHistory() {
+std::unique_ptr<TLHistory> TallyLedger::openHistory() {
   const std::lock_guard lock(mutex_);
   if (!findPath()) return nullptr;
   for (int attempt = 0; attempt < 2; ++attempt) {
@@ -424,7 +323,7 @@ std::unique_ptr<TLHistory> LinuxTallyLedger::openHistory() {
   return MakeTallyHistory(TallyDatabase(), {});
 }
 
-void LinuxTallyLedger::handleReadFailure(TallyDatabase& reader, int code) {
+void TallyLedger::handleReadFailure(TallyDatabase& reader, int code) {
   const std::lock_guard lock(mutex_);
   const std::string why = reader.message(code);
   const FileIdentity file = reader.identity();
@@ -434,14 +333,6 @@ void LinuxTallyLedger::handleReadFailure(TallyDatabase& reader, int code) {
   } else {
     log_.error("Cannot read the counter store %@: %@", path_, why);
   }
-}
-
-}  // namespace
-
-std::unique_ptr<TallyLedger> MakeTallyLedger(const Root& root, Access access,
-                                             EnvironmentQueries& queries, Preferences& preferences,
-                                             SystemLog& log, const TallyOptions& options) {
-  return std::make_unique<LinuxTallyLedger>(root, access, queries, preferences, log, options);
 }
 
 }  // namespace quorlet
