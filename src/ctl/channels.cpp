@@ -156,8 +156,8 @@ void List(Session& session, const ChannelsArguments& arguments) {
         {"CHANNEL", "GROUP", "FORMAT", "UNIT", "ELEMENTS", "DRIVER"}};
     for (Dictionary& channel : InOrder(channels)) rows.push_back(ListRow(channel));
     if (rows.size() == 1) return;
-    for (const std::string& line :
-         TableLines(rows, {false, false, false, false, true, false}, GetTerminalSize().columns)) {
+    for (const std::string& line : TableLines(rows, {false, false, false, false, true, false}, 0,
+                                              GetTerminalSize().columns)) {
       session.out.line(line);
     }
     return;

@@ -16,12 +16,12 @@
 namespace quorlet {
 namespace {
 
-// A log is first in the first, then in the second.
-constexpr std::array<std::string_view, 2> kStages = {"pending", "outbox"};
 // A document may take all of the spool; the rest is for its header.
 constexpr std::size_t kMaxLogBytes = std::size_t{65} << 20;
 
-bool IsStage(const std::filesystem::path& name) { return name == kStages[0] || name == kStages[1]; }
+bool IsStage(const std::filesystem::path& name) {
+  return name == kSpoolStages[0] || name == kSpoolStages[1];
+}
 
 // The name before the last "outbox" or "pending" among the directories of a path.
 std::optional<std::string> DeviceInPath(const std::string& path) {
@@ -73,7 +73,7 @@ std::pair<std::string, std::variant<std::string, int>> ReadFromSpool(const Root&
                                                                      const std::string& name) {
   std::string path;
   // A log that leaves the first directory after it was looked for there is in the second.
-  for (const std::string_view stage : kStages) {
+  for (const std::string_view stage : kSpoolStages) {
     path = root.path(std::string(kSpoolDirectory) + "/" + std::string(stage) + "/" + name);
     auto bytes = ReadOwnFile(path, kMaxLogBytes);
     const int* error = std::get_if<int>(&bytes);
@@ -86,7 +86,7 @@ std::pair<std::string, std::variant<std::string, int>> ReadFromSpool(const Root&
 
 void VisitSpool(const Root& root, LogVisitor& visitor) {
   std::set<std::string> all;
-  for (const std::string_view stage : kStages) {
+  for (const std::string_view stage : kSpoolStages) {
     const std::string directory =
         root.path(std::string(kSpoolDirectory) + "/" + std::string(stage));
     auto names = ReadDirectory(directory);

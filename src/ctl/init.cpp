@@ -17,16 +17,16 @@ namespace {
 constexpr auto kDirectories = std::to_array<const char*>({
     "/Library/Application Support/TallyLedger",
     "/run/quorlet/notify",
-    "/var/db/drivers",
+    kDriversDirectory,
     "/var/db/kernel",
     "/var/db/vigil",
     "/var/lib/quorlet",
-    "/var/log",
-    "/var/mobile/Library/Logs/Carewell",
-    "/var/mobile/Library/Logs/Diagwell/outbox",
-    "/var/mobile/Library/Logs/Diagwell/pending",
-    "/var/mobile/Library/Logs/FaultScribe",
-    "/var/mobile/Library/Preferences",
+    kSystemLogDirectory,
+    kSupportLogDirectory,
+    kOutboxDirectory,
+    kPendingDirectory,
+    kStructuredLogDirectory,
+    kPreferencesDirectory,
     "/var/mobile/Library/TallyLedger",
 });
 

@@ -30,7 +30,6 @@ namespace quorlet {
 namespace {
 
 // In the order in which a log passes through them.
-constexpr std::array<std::string_view, 2> kStages = {"pending", "outbox"};
 // All logs together take no more.
 constexpr std::size_t kMaxLogBytes = 64 << 20;
 constexpr std::size_t kMaxHeaderBytes = 1 << 20;
@@ -118,7 +117,7 @@ std::uint64_t NumberOf(std::string_view name) {
 // Every log, the newest last.
 std::vector<StoredLog> FindLogs() {
   std::vector<StoredLog> logs;
-  for (const std::string_view stage : kStages) {
+  for (const std::string_view stage : kSpoolStages) {
     for (const std::string& name : NamesIn(StageDirectory(stage))) {
       // Temporary files are hidden.
       if (name.starts_with('.')) continue;
@@ -152,14 +151,14 @@ void List(Session& session, const LogsArguments& arguments) {
                       log.type.empty() ? "?" : Escape(log.type), Escape(log.name)});
     }
     for (const std::string& line :
-         TableLines(rows, {false, false, true, true, false}, GetTerminalSize().columns)) {
+         TableLines(rows, {false, false, true, true, false}, 4, GetTerminalSize().columns)) {
       session.out.line(line);
     }
     return;
   }
   for (const StoredLog& log : logs) {
     const std::string size = std::to_string(log.size);
-    std::string line = log.stage == kStages[0] ? "pending  " : "outbox   ";
+    std::string line = log.stage == kSpoolStages[0] ? "pending  " : "outbox   ";
     line += Escape(log.created);
     line.append(size.size() < 9 ? 9 - size.size() : 1, ' ').append(size).append("  type ");
     line += log.type.empty() ? "?" : Escape(log.type);
@@ -176,7 +175,7 @@ std::string LogBytes(const std::string& path, std::variant<std::string, int> byt
 // Where the log of that name has got to.
 std::string PathOfNamedLog(const std::string& name) {
   if (!IsSafeName(name)) throw Failure("not the name of a log: " + name);
-  for (const std::string_view stage : kStages) {
+  for (const std::string_view stage : kSpoolStages) {
     const std::string path = StageDirectory(stage) + "/" + name;
     if (::access(path.c_str(), F_OK) == 0) return path;
     if (errno != ENOENT) FailReading(path, errno);

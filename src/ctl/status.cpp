@@ -19,6 +19,7 @@
 #include "driver/run_driver.h"
 #include "platform/linux/base/paths.h"
 #include "platform/linux/logs/structured_log.h"
+#include "platform/names.h"
 #include "report/config.h"
 
 namespace quorlet {
@@ -29,8 +30,10 @@ constexpr std::int32_t kFarAhead = 30;
 constexpr std::int32_t kEarliestToday = 19723;
 constexpr char kAnyLog[] = "quorletctl logs submit";
 constexpr char kSetClock[] = "timedatectl set-ntp true";
-constexpr char kResetGate[] =
-    "quorletctl prefs remove nuvex.aggregated.quorlet LastCrashLogSerializationDateInDaysSince1970";
+
+std::string ResetGate() {
+  return std::string("quorletctl prefs remove ") + kPassDomain + " " + kGateDay;
+}
 
 std::string Size(std::uint64_t bytes) {
   constexpr std::uint64_t kKibi = 1024;
@@ -146,7 +149,7 @@ Finding Inspection::lastPass() {
   if (*gate > std::int64_t{today()} - 1 + kFarAhead) {
     return Error(
         "recorded for day " + std::to_string(*gate) + ", far ahead: no pass runs until then",
-        kResetGate);
+        ResetGate());
   }
   std::string text =
       *gate == 0 ? "there was none yet" : "for " + DayText(static_cast<std::int32_t>(*gate));
@@ -162,9 +165,8 @@ Finding Inspection::lastPass() {
 }
 
 Finding Inspection::spool() {
-  const std::string directory = path(kSpoolDirectory);
-  const Files pending = FilesIn(directory + "/pending");
-  const Files outbox = FilesIn(directory + "/outbox");
+  const Files pending = FilesIn(path(kPendingDirectory));
+  const Files outbox = FilesIn(path(kOutboxDirectory));
   const std::uint64_t bytes = pending.bytes + outbox.bytes;
   const std::string text = Counted(pending.count, "log") + " pending, " +
                            std::to_string(outbox.count) + " in outbox, " + Size(bytes) + " of " +
@@ -173,7 +175,7 @@ Finding Inspection::spool() {
   return Warning(text + "; when that is full, the oldest go",
                  pending.count > 0 && isConsented()
                      ? kAnyLog
-                     : "rsync -a --remove-source-files '" + directory + "/outbox/' SERVER:");
+                     : "rsync -a --remove-source-files '" + path(kOutboxDirectory) + "/' SERVER:");
 }
 
 Finding Inspection::structuredLog() {

@@ -76,7 +76,8 @@ std::string RightAligned(std::string_view text, std::size_t columns) {
 }
 
 std::vector<std::string> TableLines(const std::vector<std::vector<std::string>>& rows,
-                                    const std::vector<bool>& toTheRight, std::size_t columns) {
+                                    const std::vector<bool>& toTheRight, std::size_t name,
+                                    std::size_t columns) {
   constexpr std::string_view kGap = "  ";
   constexpr std::size_t kNarrowest = 8;
   std::vector<std::size_t> widths(toTheRight.size());
@@ -88,11 +89,12 @@ std::vector<std::string> TableLines(const std::vector<std::vector<std::string>>&
   std::size_t total = (widths.size() - 1) * kGap.size();
   for (const std::size_t width : widths) total += width;
   while (total > columns) {
-    std::size_t* widest = nullptr;
+    std::size_t* widest = &widths[name];
     for (std::size_t i = 0; i < widths.size(); ++i) {
-      if (!toTheRight[i] && (widest == nullptr || widths[i] > *widest)) widest = &widths[i];
+      if (toTheRight[i] || i == name || widths[i] <= kNarrowest) continue;
+      if (widest == &widths[name] || widths[i] > *widest) widest = &widths[i];
     }
-    if (widest == nullptr || *widest <= kNarrowest) break;
+    if (*widest <= kNarrowest) break;
     --*widest;
     --total;
   }

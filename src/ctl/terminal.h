@@ -28,10 +28,12 @@ std::string LeftAligned(std::string_view text, std::size_t columns);
 std::string RightAligned(std::string_view text, std::size_t columns);
 
 // Columns as wide as what is in them, two blanks between, and no blanks at the ends of lines. Where
-// they do not fit `columns`, the widest ones that are aligned to the left are cut; numbers, which
-// stand in the columns that `toTheRight` names, never are. All rows have as many cells.
+// they do not fit `columns`, the widest ones that are aligned to the left are cut, the one that
+// `name` numbers last; numbers, which stand in the columns that `toTheRight` names, never are. All
+// rows have as many cells.
 std::vector<std::string> TableLines(const std::vector<std::vector<std::string>>& rows,
-                                    const std::vector<bool>& toTheRight, std::size_t columns);
+                                    const std::vector<bool>& toTheRight, std::size_t name,
+                                    std::size_t columns);
 
 // "[#####.....]" for a share of 0.5 and a width of 10; nothing but dots for what is no share.
 std::string Bar(double share, std::size_t width);

@@ -108,8 +108,8 @@ class LinuxDiagnostics : public Diagnostics {
   LinuxDiagnostics(const Root& root, Access access, Clock& clock, Preferences& preferences,
                    OSVersion& osVersion, SystemLog& log)
       : directory_(root.path(kSpoolDirectory)),
-        pending_(directory_ + "/pending"),
-        outbox_(directory_ + "/outbox"),
+        pending_(root.path(kPendingDirectory)),
+        outbox_(root.path(kOutboxDirectory)),
         access_(access),
         clock_(clock),
         preferences_(preferences),

@@ -1,3 +1,5 @@
+// How much each service has transferred: from a file, or as the service manager and the network
+// links tell. This is the head of its room; what is given must outlive the service.
 #ifndef QUORLET_PLATFORM_LINUX_NETWORK_NETWORK_USAGE_H_
 #define QUORLET_PLATFORM_LINUX_NETWORK_NETWORK_USAGE_H_
 

@@ -1,3 +1,6 @@
+// Sockets that other programs reach us at, the frames on them, and the notifications we post.
+// What the services are given by reference must outlive them; none of them opens or reads anything
+// before it is used.
 #ifndef QUORLET_PLATFORM_LINUX_SERVICE_SERVICES_H_
 #define QUORLET_PLATFORM_LINUX_SERVICE_SERVICES_H_
 
@@ -10,8 +13,6 @@
 #include "platform/system_log.h"
 
 namespace quorlet {
-
-// Where services have their sockets, below the root.
 
 // Connections at the same time. A newcomer beyond them takes the place of the one that has been
 // silent longest, so that silent peers do not lock others out.
