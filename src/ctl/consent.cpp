@@ -7,6 +7,7 @@
 #include "ctl/json_value.h"
 #include "ctl/options.h"
 #include "ctl/session.h"
+#include "platform/names.h"
 
 namespace quorlet {
 namespace {
@@ -50,6 +51,9 @@ void Status(Session& session, const ConsentArguments& arguments) {
 
 void RequireConsent(Platform& services) {
   if (services.diagnostics.DiagnosticLogSubmissionEnabled()) return;
+  if (!services.preferences.isReadable(kConsentDomain)) {
+    throw Failure("the owner's consent cannot be read: see \"quorletctl consent status\"");
+  }
   throw Failure(
       "the device's owner has not consented to logs being submitted: see \"quorletctl consent "
       "on\"");

@@ -8,9 +8,13 @@
 #include <cerrno>
 #include <csignal>
 #include <cstdlib>
+#include <string>
+#include <string_view>
+#include <utility>
 
 #include "ctl/session.h"
 #include "platform/linux/base/descriptor.h"
+#include "platform/linux/base/files.h"
 
 namespace quorlet {
 namespace {
@@ -82,6 +86,22 @@ void CheckRoot(bool mayBeNew) {
   if (!S_ISDIR(status.st_mode)) throw Failure("QUORLET_ROOT is not a directory: " + root);
 }
 
+// What went wrong, and what to do about it where that is always the same.
+std::string WithRemedy(const std::string& failure) {
+  const std::pair<std::string, std::string_view> kRemedies[] = {
+      {ErrnoText(EACCES),
+       "try it as root or as the owner of the files, which \"quorletctl status\" names"},
+      {"Couldn't load whitelist", "\"quorletctl status\" shows how to put one there"},
+      {"there is no whitelist", "\"quorletctl status\" shows how to put one there"},
+      {"there is no log yet", "\"quorletctl status\" says what is missing"},
+      {"the service is not running", "\"quorlet\" is it, or systemctl start quorlet.socket"},
+  };
+  for (const auto& [failed, remedy] : kRemedies) {
+    if (failure.find(failed) != std::string::npos) return failure + ": " + std::string(remedy);
+  }
+  return failure;
+}
+
 int Run(int argc, char** argv) {
   Session session;
   CLI::App app("Puts counters, preferences and whitelists before quorlet and shows its logs.",
@@ -98,7 +118,7 @@ int Run(int argc, char** argv) {
   } catch (const std::exception& failure) {
     // What has been written already belongs to the result as far as it goes.
     [[maybe_unused]] const bool written = session.out.finish();
-    PrintErrorLine(failure.what());
+    PrintErrorLine(WithRemedy(failure.what()));
     return kFailed;
   }
   if (!session.out.finish()) {

@@ -6,6 +6,7 @@
 
 #include <CLI/CLI.hpp>
 #include <array>
+#include <cerrno>
 #include <memory>
 #include <utility>
 #include <vector>
@@ -49,6 +50,9 @@ struct Group {
 Dictionary ReadWhitelist(const std::string& path) {
   const auto bytes = ReadWholeFile(path, kMaxPropertyListBytes);
   if (const int* error = std::get_if<int>(&bytes)) {
+    if (*error == ENOENT && path.ends_with(kWhitelistPath)) {
+      throw Failure("there is no whitelist at " + path);
+    }
     throw Failure("cannot read " + path + ": " + ErrnoText(*error));
   }
   const auto parsed = ReadPropertyList(std::get<std::string>(bytes));
