@@ -34,7 +34,7 @@ void CheckLine(std::string_view text, const StatsdLine& line) {
 void CheckAgain(std::string_view text, const StatsdLine& line) {
   const std::string longer = std::string(text) + "|#a:b,c|T17|c:x";
   StatsdLine again;
-  Expect(!ParseStatsdLine(longer, again), "further fields are refused", longer);
+  Expect(ParseStatsdLine(longer, again) == Refusal::kNone, "further fields are refused", longer);
   Expect(again.key == line.key && again.kind == line.kind && again.rate == line.rate &&
              again.numbers.size() == line.numbers.size(),
          "further fields change a line", longer);
@@ -68,13 +68,13 @@ extern "C" int LLVMFuzzerTestOneInput(const std::uint8_t* data, std::size_t size
   StatsdLine line;
   std::string_view rest = AsText(data, size);
   while (const auto text = NextStatsdLine(rest)) {
-    auto refusal = ParseStatsdLine(*text, line);
-    if (!refusal) {
+    Refusal refusal = ParseStatsdLine(*text, line);
+    if (refusal == Refusal::kNone) {
       CheckLine(*text, line);
       CheckAgain(*text, line);
       refusal = book.add(line, kUser, kSecond);
     }
-    if (refusal) refusals.add(*refusal, kUser);
+    if (refusal != Refusal::kNone) refusals.add(refusal, kUser);
   }
   if (const auto told = refusals.take()) Expect(told->size() < 1000, "a long line", *told);
   CheckBatch(book.take());

@@ -96,8 +96,7 @@ void RecordBook::forgetOldKeys() {
   }
 }
 
-std::optional<Refusal> RecordBook::admit(std::string_view key, Sender sender,
-                                         Entries::iterator& found) {
+Refusal RecordBook::admit(std::string_view key, Sender sender, Entries::iterator& found) {
   const bool isTrusted = sender == kRootUser || sender == self_;
   const RecordWhitelist::Match match = whitelist_.match(key);
   if (match == RecordWhitelist::Match::kNone) return Refusal::kNotInWhitelist;
@@ -115,14 +114,15 @@ std::optional<Refusal> RecordBook::admit(std::string_view key, Sender sender,
   if (found == entries_.end()) found = entries_.emplace(std::string(key), Entry()).first;
   found->second.isKnown = true;
   found->second.isNamedExactly = isExact;
-  return std::nullopt;
+  return Refusal::kNone;
 }
 
-std::optional<Refusal> RecordBook::add(const StatsdLine& line, Sender sender, std::int32_t second) {
+Refusal RecordBook::add(const StatsdLine& line, Sender sender, std::int32_t second) {
   if (IsReserved(line.key) && sender != kRootUser && sender != self_) return Refusal::kReserved;
   auto found = entries_.find(line.key);
   if (found == entries_.end() || !found->second.isKnown) {
-    if (const auto refusal = admit(line.key, sender, found)) return refusal;
+    const Refusal refusal = admit(line.key, sender, found);
+    if (refusal != Refusal::kNone) return refusal;
   } else if (!found->second.wasUsed && !found->second.isNamedExactly &&
              whitelist_.match(line.key) == RecordWhitelist::Match::kNone) {
     // Others may have put it into the store.
@@ -137,10 +137,11 @@ std::optional<Refusal> RecordBook::add(const StatsdLine& line, Sender sender, st
   if (!entry.isListed) changed_.push_back(&*found);
   entry.isListed = true;
   if (line.kind == StatsdKind::kValues) {
-    for (const StatsdNumber& number : line.numbers) entry.values.add(number.real, second);
+    if (!entry.values) entry.values = std::make_unique<RecordedValues>();
+    for (const StatsdNumber& number : line.numbers) entry.values->add(number.real, second);
     entry.valuesOfDay += line.numbers.size();
     waitingValues_ += line.numbers.size();
-    return std::nullopt;
+    return Refusal::kNone;
   }
   entry.hasScalar = true;
   for (const StatsdNumber& number : line.numbers) {
@@ -151,7 +152,7 @@ std::optional<Refusal> RecordBook::add(const StatsdLine& line, Sender sender, st
     }
     entry.sum.add(number, line.kind == StatsdKind::kCounter ? line.rate : 1);
   }
-  return std::nullopt;
+  return Refusal::kNone;
 }
 
 // Moves what is to be written of the day over to what is ready.
@@ -166,8 +167,8 @@ void RecordBook::closeDay() {
       closed_.scalars.push_back({kind, key, growth.saturated(), *day_});
       entry.written = rounded;
     }
-    if (!entry.values.runs.empty()) {
-      RecordedValues& recorded = closed_.values.emplace_back(std::exchange(entry.values, {}));
+    if (const auto values = std::exchange(entry.values, nullptr)) {
+      RecordedValues& recorded = closed_.values.emplace_back(std::move(*values));
       recorded.key = key;
       recorded.day = *day_;
     }

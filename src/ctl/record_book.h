@@ -8,6 +8,7 @@
 #include <cstdint>
 #include <functional>
 #include <map>
+#include <memory>
 #include <optional>
 #include <string>
 #include <string_view>
@@ -50,8 +51,7 @@ class RecordBook {
   // is read: false, after an error line, when that failed; then it counts as empty.
   bool enterDay(std::int32_t day, CounterStore& store);
   // Takes in a line of the entered day, or says why not.
-  [[nodiscard]] std::optional<Refusal> add(const StatsdLine& line, Sender sender,
-                                           std::int32_t second);
+  [[nodiscard]] Refusal add(const StatsdLine& line, Sender sender, std::int32_t second);
 
   bool empty() const { return changed_.empty() && closed_.empty(); }
   // Whether nothing more should be taken in before the next take().
@@ -77,7 +77,8 @@ class RecordBook {
     bool isNamedExactly = false;
     bool wasUsed = false;  // on this day
     std::uint64_t valuesOfDay = 0;
-    RecordedValues values;  // without their key and day
+    // Without their key and day. Elsewhere, since what scalars need is better close together.
+    std::unique_ptr<RecordedValues> values;
   };
   struct Hash {
     using is_transparent = void;
@@ -87,7 +88,7 @@ class RecordBook {
   };
   using Entries = std::unordered_map<std::string, Entry, Hash, std::equal_to<>>;
 
-  std::optional<Refusal> admit(std::string_view key, Sender sender, Entries::iterator& found);
+  Refusal admit(std::string_view key, Sender sender, Entries::iterator& found);
   void closeDay();
   void forgetOldKeys();
   void readOwners(CounterStore& store);

@@ -89,15 +89,15 @@ bool IsClean(std::string_view key) {
   });
 }
 
-std::optional<Refusal> CheckKey(std::string_view key) {
+Refusal CheckKey(std::string_view key) {
   if (key.empty()) return Refusal::kUnreadable;
   if (key.size() > kLongestRecordedKey) return Refusal::kKeyTooLong;
-  return IsClean(key) ? std::nullopt : std::optional(Refusal::kKeyBytes);
+  return IsClean(key) ? Refusal::kNone : Refusal::kKeyBytes;
 }
 
 }  // namespace
 
-std::optional<Refusal> ParseStatsdLine(std::string_view text, StatsdLine& line) {
+Refusal ParseStatsdLine(std::string_view text, StatsdLine& line) {
   if (text.starts_with("_e{")) return Refusal::kEvent;
   if (text.starts_with("_sc|")) return Refusal::kServiceCheck;
   std::string_view numbers, type, field;

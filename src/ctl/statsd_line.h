@@ -27,6 +27,7 @@ enum class Refusal {
   kTooManyKeysOfUser,
   kTooManyValues,
   kStoreFull,
+  kNone,  // it was
 };
 inline constexpr std::size_t kRefusalCount = 12;
 
@@ -47,9 +48,9 @@ struct StatsdLine {
   double rate = 1;                    // above 0, at most 1
 };
 
-// Reads a line without its line break into `line`, whose vector is used again. Nothing when it was
-// read; otherwise why not, and `line` holds nothing of use.
-[[nodiscard]] std::optional<Refusal> ParseStatsdLine(std::string_view text, StatsdLine& line);
+// Reads a line without its line break into `line`, whose vector is used again. Where it was not
+// read, `line` holds nothing of use.
+[[nodiscard]] Refusal ParseStatsdLine(std::string_view text, StatsdLine& line);
 
 // Takes the next line off the front of a datagram's text; lines without any byte are passed over.
 // Nothing at the end.

@@ -236,10 +236,10 @@ void TallyListener::take(std::string_view text, Sender sender, bool isCut) {
     text = text.substr(0, text.rfind('\n') + 1);
   }
   while (const auto line = NextStatsdLine(text)) {
-    auto refusal = ParseStatsdLine(*line, line_);
-    if (!refusal && isStoreFull_) refusal = Refusal::kStoreFull;
-    if (!refusal) refusal = book_.add(line_, sender, now_.second);
-    if (refusal) refusals_.add(*refusal, sender);
+    Refusal refusal = ParseStatsdLine(*line, line_);
+    if (refusal == Refusal::kNone && isStoreFull_) refusal = Refusal::kStoreFull;
+    if (refusal == Refusal::kNone) refusal = book_.add(line_, sender, now_.second);
+    if (refusal != Refusal::kNone) refusals_.add(refusal, sender);
   }
 }
 

@@ -20,17 +20,17 @@ constexpr uid_t kSelf = 900;
 
 class RecordBookTest : public testing::Test {
  protected:
-  std::optional<Refusal> add(RecordBook& book, const std::string& text, Sender sender = kSelf) {
+  Refusal add(RecordBook& book, const std::string& text, Sender sender = kSelf) {
     StatsdLine line;
-    const auto refusal = ParseStatsdLine(text, line);
-    return refusal ? refusal : book.add(line, sender, 5);
+    const Refusal refusal = ParseStatsdLine(text, line);
+    return refusal != Refusal::kNone ? refusal : book.add(line, sender, 5);
   }
   // Takes in lines separated by blanks.
   void addAll(RecordBook& book, std::string text) {
     std::ranges::replace(text, ' ', '\n');
     std::string_view rest = text;
     while (const auto line = NextStatsdLine(rest)) {
-      EXPECT_EQ(add(book, std::string(*line)), std::nullopt) << *line;
+      EXPECT_EQ(add(book, std::string(*line)), Refusal::kNone) << *line;
     }
   }
   std::map<std::string, std::int64_t> stored(std::int32_t day) {
@@ -77,20 +77,20 @@ TEST_F(RecordBookTest, KeysOfADayAreSharedAcrossListeners) {
   for (const char* owned : {"a1", "a2"}) {  // each in a listener of its own
     RecordBook book(RecordWhitelist::Naming(true), kSelf, limits);
     ASSERT_TRUE(book.enterDay(7, store));
-    EXPECT_EQ(add(book, owned + std::string(":1|c"), 10), std::nullopt);
+    EXPECT_EQ(add(book, owned + std::string(":1|c"), 10), Refusal::kNone);
     ASSERT_TRUE(write(book));
   }
   RecordBook book(RecordWhitelist::Naming(true), kSelf, limits);
   ASSERT_TRUE(book.enterDay(7, store));
   EXPECT_EQ(add(book, "a3:1|c", 10), Refusal::kTooManyKeysOfUser);
-  EXPECT_EQ(add(book, "old:1|c", 10), std::nullopt);
+  EXPECT_EQ(add(book, "old:1|c", 10), Refusal::kNone);
   EXPECT_EQ(add(book, "old.values:1:2|ms", 10), Refusal::kTooManyValues);
-  EXPECT_EQ(add(book, "old.values:1|ms", 10), std::nullopt);
+  EXPECT_EQ(add(book, "old.values:1|ms", 10), Refusal::kNone);
   EXPECT_EQ(add(book, "old.values:1|ms", 10), Refusal::kTooManyValues);
-  EXPECT_EQ(add(book, "b1:1|c", std::nullopt), std::nullopt);
+  EXPECT_EQ(add(book, "b1:1|c", std::nullopt), Refusal::kNone);
   EXPECT_EQ(add(book, "b2:1|c", 0), Refusal::kTooManyKeys);
   ASSERT_TRUE(book.enterDay(8, store));
-  EXPECT_EQ(add(book, "a3:1|c", 10), std::nullopt);
+  EXPECT_EQ(add(book, "a3:1|c", 10), Refusal::kNone);
 }
 
 TEST_F(RecordBookTest, ReservedKeysAreForRootAndTheService) {
@@ -99,10 +99,10 @@ TEST_F(RecordBookTest, ReservedKeysAreForRootAndTheService) {
   for (const char* line : {"nuvex.a:1|c", "datausage.b:1|ms"}) {
     EXPECT_EQ(add(book, line, 10), Refusal::kReserved);
     EXPECT_EQ(add(book, line, std::nullopt), Refusal::kReserved);
-    EXPECT_EQ(add(book, line, kSelf), std::nullopt);
-    EXPECT_EQ(add(book, line, 0), std::nullopt);
+    EXPECT_EQ(add(book, line, kSelf), Refusal::kNone);
+    EXPECT_EQ(add(book, line, 0), Refusal::kNone);
   }
-  EXPECT_EQ(add(book, "nuvexa:1|c", 10), std::nullopt);
+  EXPECT_EQ(add(book, "nuvexa:1|c", 10), Refusal::kNone);
 }
 
 }  // namespace

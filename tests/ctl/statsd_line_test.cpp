@@ -29,7 +29,7 @@ TEST(StatsdLineTest, ReadsWhatClientsSend) {
   };
   for (const Case& test : cases) {
     StatsdLine line;
-    ASSERT_EQ(ParseStatsdLine(test.text, line), std::nullopt) << test.text;
+    ASSERT_EQ(ParseStatsdLine(test.text, line), Refusal::kNone) << test.text;
     EXPECT_EQ(line.key, test.text.substr(0, test.text.find(':'))) << test.text;
     EXPECT_EQ(line.rate, test.rate) << test.text;
     std::vector<double> numbers;
