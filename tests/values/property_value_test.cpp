@@ -8,7 +8,6 @@
 namespace quorlet {
 namespace {
 
-constexpr auto kMin = std::numeric_limits<std::int64_t>::min();
 constexpr auto kMax = std::numeric_limits<std::int64_t>::max();
 constexpr auto kUMax = std::numeric_limits<std::uint64_t>::max();
 constexpr double kInfinity = std::numeric_limits<double>::infinity();

@@ -94,7 +94,8 @@ class LinuxNamedService : public NamedService {
   void drop(Connection& connection) { connection.socket = Descriptor(); }
   void forgetDropped();
   std::shared_ptr<Connection> findQuietest() const;
-  bool mayHoldMore(const Connection& reading);
+  std::shared_ptr<Connection> holdUpOf(const Connection& reading) const;
+  void closeIfItKeepsBack(const std::shared_ptr<Connection>& first);
   template <typename Call>
   void guarded(Call call);
 
@@ -296,7 +297,8 @@ bool LinuxNamedService::announce(const std::shared_ptr<Connection>& connection) 
 void LinuxNamedService::readFrom(const std::shared_ptr<Connection>& connection) {
   readBuffer_.resize(kReadBytes);
   for (std::size_t taken = 0; taken < kReadBytes;) {
-    if (!mayHoldMore(*connection)) {
+    if (const auto first = holdUpOf(*connection)) {
+      closeIfItKeepsBack(first);
       isHeldUp_ = true;
       break;
     }
@@ -349,11 +351,10 @@ std::shared_ptr<Connection> LinuxNamedService::findQuietest() const {
   return quietest;
 }
 
-// Whether more may be read of the connection. Once all together hold too much, only the one that is
-// nearest to the end of its message is read, and dropped when it keeps back the rest; peers that
-// are only slow wait for it.
-bool LinuxNamedService::mayHoldMore(const Connection& reading) {
-  if (reading.frames.size() <= kReadBytes) return true;
+// The connection that must come to the end of its message before more is read of this one: once all
+// together hold too much, the one that is nearest to it. Peers that are only slow wait for it.
+std::shared_ptr<Connection> LinuxNamedService::holdUpOf(const Connection& reading) const {
+  if (reading.frames.size() <= kReadBytes) return nullptr;
   std::size_t held = 0;
   std::shared_ptr<Connection> first;
   for (const auto& connection : connections_) {
@@ -361,13 +362,15 @@ bool LinuxNamedService::mayHoldMore(const Connection& reading) {
     if (!connection->socket.isOpen()) continue;
     if (first == nullptr || connection->frames.size() > first->frames.size()) first = connection;
   }
-  if (held <= kMaxHeldBytes || first.get() == &reading) return true;
-  if (std::chrono::steady_clock::now() - first->heard >= kLongestHoldUp) {
-    log_.error("Closing a connection that keeps back the rest of a message, to save memory");
-    drop(*first);
-    std::erase(connections_, first);
-  }
-  return false;
+  return held <= kMaxHeldBytes || first.get() == &reading ? nullptr : first;
+}
+
+// What others wait for must not keep them waiting for ever.
+void LinuxNamedService::closeIfItKeepsBack(const std::shared_ptr<Connection>& first) {
+  if (std::chrono::steady_clock::now() - first->heard < kLongestHoldUp) return;
+  log_.error("Closing a connection that keeps back the rest of a message, to save memory");
+  drop(*first);
+  std::erase(connections_, first);
 }
 
 // What a handler throws must not end the service.
