@@ -34,7 +34,7 @@ namespace {
 
 using Time = std::chrono::steady_clock::time_point;
 
-constexpr std::size_t kReadBytes = 256 * 1024;
+constexpr std::size_t kReadBytes = std::size_t{256} << 10;
 // What all connections together may hold; beyond that, messages are taken in one after the other.
 constexpr std::size_t kMaxHeldBytes = std::size_t{64} * 1024 * 1024;
 // How long one that is in the middle of a message may keep the others waiting then.
