@@ -146,6 +146,7 @@ void List(Session& session, const LogsArguments& arguments) {
   }
   if (IsTerminal()) {
     std::vector<std::vector<std::string>> rows;
+    rows.reserve(logs.size());
     for (const StoredLog& log : logs) {
       rows.push_back({std::string(log.stage), Escape(log.created), std::to_string(log.size),
                       log.type.empty() ? "?" : Escape(log.type), Escape(log.name)});
@@ -176,7 +177,7 @@ std::string LogBytes(const std::string& path, std::variant<std::string, int> byt
 std::string PathOfNamedLog(const std::string& name) {
   if (!IsSafeName(name)) throw Failure("not the name of a log: " + name);
   for (const std::string_view stage : kSpoolStages) {
-    const std::string path = StageDirectory(stage) + "/" + name;
+    std::string path = StageDirectory(stage) + "/" + name;
     if (::access(path.c_str(), F_OK) == 0) return path;
     if (errno != ENOENT) FailReading(path, errno);
   }
