@@ -59,7 +59,7 @@ Files FilesIn(const std::string& directory, std::string_view prefix = "") {
   for (const std::string& name : NamesIn(directory)) {
     if (name.starts_with('.') || !name.starts_with(prefix)) continue;
     ++files.count;
-    files.bytes += SizeOf(directory + "/" + name);
+    files.bytes += SizeOf(JoinPath(directory, name));
   }
   return files;
 }

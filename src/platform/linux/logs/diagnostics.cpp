@@ -230,7 +230,7 @@ class LinuxDiagnostics : public Diagnostics {
 
     const FileLock lock(lockPath());
     if (lock.error() != 0) return ErrnoText(lock.error());
-    if (const std::string why = makeRoom(output.size()); !why.empty()) return why;
+    if (std::string why = makeRoom(output.size()); !why.empty()) return why;
     const std::string fileName = newName(name + "-" + FileNameTime(created) + "-");
     if (request.beforePublication) request.beforePublication(fileName);
     if (const int error = file.publish(fileName)) {
